@@ -12,6 +12,12 @@ bool IsKnownCode(int nModelCode) { return nModelCode >= kFirstCode && nModelCode
 
 bool IsModelObjectCode(int nModelCode) { return nModelCode >= 10 && nModelCode <= 12; }
 
+// A null record or output would crash the family; it is refused as a failed
+// transform instead of being dereferenced.
+bool HasRecordAndOutputs(const void* pModel, const double* pdfOut1, const double* pdfOut2) {
+    return pModel != nullptr && pdfOut1 != nullptr && pdfOut2 != nullptr;
+}
+
 const nova::mathmodel::IMathModel* AsModelObject(void* pModel) {
     return static_cast<const nova::mathmodel::IMathModel*>(pModel);
 }
@@ -22,8 +28,8 @@ extern "C" LUMO_API const char* LumoVersion() { return LUMO_VERSION_STRING; }
 
 int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ, double* pdfPixel,
                double* pdfLine) {
-    (void)dfZ;  // used by the families that join the dispatch later
     if (!IsKnownCode(nModelCode)) return 0;
+    if (!HasRecordAndOutputs(pModel, pdfPixel, pdfLine)) return 0;
     switch (nModelCode) {
         case LUMO_CODE_POLY:
             POLYGeo2Img(static_cast<const POLYInfo_t*>(pModel), dfX, dfY, pdfPixel, pdfLine);
@@ -43,6 +49,7 @@ int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
 int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, double* pdfZ,
                   double* pdfX, double* pdfY) {
     if (!IsKnownCode(nModelCode)) return 0;
+    if (!HasRecordAndOutputs(pModel, pdfX, pdfY) || pdfZ == nullptr) return 0;
     switch (nModelCode) {
         case LUMO_CODE_POLY:
             POLYImg2Geo(static_cast<const POLYInfo_t*>(pModel), dfPixel, dfLine, pdfX, pdfY);

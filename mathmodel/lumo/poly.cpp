@@ -95,6 +95,20 @@ int UsableTermCount(int nCoeffs) {
     return nCoeffs;
 }
 
+// Null records and outputs are reported and the call does nothing.
+bool CanEvaluate(const POLYInfo_t* psPoly, const double* pdfOut1, const double* pdfOut2) {
+    if (psPoly && psPoly->padfPixelCoeffs && psPoly->padfLineCoeffs && psPoly->padfXCoeffs &&
+        psPoly->padfYCoeffs && pdfOut1 && pdfOut2) {
+        return true;
+    }
+    IMPError(11, 0, _("Polynomial model or output pointer is null."));
+    return false;
+}
+
+void CopyCoefficients(double* padfDst, const double* padfSrc, std::size_t nBytes) {
+    if (padfDst && padfSrc && nBytes > 0) std::memcpy(padfDst, padfSrc, nBytes);
+}
+
 double* AllocateCoefficients() {
     return static_cast<double*>(HCalloc(POLY_MAX_COEFFS, sizeof(double)));
 }
@@ -127,11 +141,10 @@ void POLYCopy(POLYInfo_t* psDst, const POLYInfo_t* psSrc) {
         psDst->pszGeosys[POLY_GEOSYS_SIZE - 1] = '\0';
     }
     const std::size_t nBytes = static_cast<std::size_t>(nCopy) * sizeof(double);
-    if (nBytes == 0) return;
-    std::memcpy(psDst->padfPixelCoeffs, psSrc->padfPixelCoeffs, nBytes);
-    std::memcpy(psDst->padfLineCoeffs, psSrc->padfLineCoeffs, nBytes);
-    std::memcpy(psDst->padfXCoeffs, psSrc->padfXCoeffs, nBytes);
-    std::memcpy(psDst->padfYCoeffs, psSrc->padfYCoeffs, nBytes);
+    CopyCoefficients(psDst->padfPixelCoeffs, psSrc->padfPixelCoeffs, nBytes);
+    CopyCoefficients(psDst->padfLineCoeffs, psSrc->padfLineCoeffs, nBytes);
+    CopyCoefficients(psDst->padfXCoeffs, psSrc->padfXCoeffs, nBytes);
+    CopyCoefficients(psDst->padfYCoeffs, psSrc->padfYCoeffs, nBytes);
 }
 
 void POLYDeallocate(POLYInfo_t* psPoly) {
@@ -147,6 +160,7 @@ void POLYDeallocate(POLYInfo_t* psPoly) {
 
 void POLYGeo2Img(const POLYInfo_t* psPoly, double dfX, double dfY, double* pdfPixel,
                  double* pdfLine) {
+    if (!CanEvaluate(psPoly, pdfPixel, pdfLine)) return;
     const int nTerms = UsableTermCount(psPoly->nCoeffs);
     *pdfPixel = Evaluate(psPoly->padfPixelCoeffs, nTerms, dfX, dfY);
     *pdfLine = Evaluate(psPoly->padfLineCoeffs, nTerms, dfX, dfY);
@@ -154,6 +168,7 @@ void POLYGeo2Img(const POLYInfo_t* psPoly, double dfX, double dfY, double* pdfPi
 
 void POLYImg2Geo(const POLYInfo_t* psPoly, double dfPixel, double dfLine, double* pdfX,
                  double* pdfY) {
+    if (!CanEvaluate(psPoly, pdfX, pdfY)) return;
     const int nTerms = UsableTermCount(psPoly->nCoeffs);
     *pdfX = Evaluate(psPoly->padfXCoeffs, nTerms, dfPixel, dfLine);
     *pdfY = Evaluate(psPoly->padfYCoeffs, nTerms, dfPixel, dfLine);

@@ -1,0 +1,478 @@
+// Generic array and block evaluation of math models through their point
+// operations.
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cmath>
+#include <cstddef>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "nova/mathmodel_core.h"
+#include "nova/runtime.h"
+
+namespace nm = nova::mathmodel;
+
+namespace {
+
+constexpr float kNullF = static_cast<float>(nm::kMathModelNullValue);
+
+// Smooth analytic distortion: pixel/line/height -> X/Y, with a Newton inverse.
+// Counts point calls so tests can tell interpolation from exact evaluation.
+class SmoothModel : public nm::IMathModel {
+  public:
+    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
+    nm::MathModelType GetModelType() const override { return nm::MM_TYPE_USER; }
+    std::string GetModelName() const override { return "Smooth"; }
+    int GetNumColumns() const override { return 4000; }
+    int GetNumRows() const override { return 3000; }
+    int GetDownsampleFactor() const override { return 1; }
+    int GetMinValidHeight(double&) const override { return -1; }
+    int GetMaxValidHeight(double&) const override { return -1; }
+    bool IsHeightDependent() const override { return true; }
+    bool IsEqual(const IMathModel* poOther) const override { return poOther == this; }
+
+    int ImageToGround(int nCols, int nRows, int nStep, const float* pafA, const float* pafB,
+                      const float* pafZ, float* pafOut1, float* pafOut2, unsigned char* pabyValid,
+                      double dfO1, double dfO2, double dfS1, double dfS2, double dfTol,
+                      bool bFlag) const override {
+        return nm::ImageToGround(this, nCols, nRows, nStep, pafA, pafB, pafZ, pafOut1, pafOut2,
+                                 pabyValid, dfO1, dfO2, dfS1, dfS2, dfTol, bFlag);
+    }
+    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfIn, double* padfX,
+                      double* padfY, int* panValid, bool bFlag) const override {
+        return nm::ImageToGround(this, dfLine, dfZ, nCount, padfIn, padfX, padfY, panValid, bFlag);
+    }
+    int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
+                      bool) const override {
+        ++mnCalls;
+        if (Fails(dfPixel, dfLine)) return -1;
+        Forward(dfPixel, dfLine, dfZ, dfX, dfY);
+        if (ReturnsNaN(dfPixel)) dfX = std::nan("");
+        return 0;
+    }
+    int GroundToImage(int nCols, int nRows, int nStep, const float* pafA, const float* pafB,
+                      const float* pafZ, float* pafOut1, float* pafOut2, unsigned char* pabyValid,
+                      double dfO1, double dfO2, double dfS1, double dfS2, double dfTol,
+                      bool bFlag) const override {
+        return nm::GroundToImage(this, nCols, nRows, nStep, pafA, pafB, pafZ, pafOut1, pafOut2,
+                                 pabyValid, dfO1, dfO2, dfS1, dfS2, dfTol, bFlag);
+    }
+    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfIn, double* padfP,
+                      double* padfL, int* panValid, bool bFlag) const override {
+        return nm::GroundToImage(this, dfY, dfZ, nCount, padfIn, padfP, padfL, panValid, bFlag);
+    }
+    int GroundToImage(double dfX, double dfY, double dfZ, double& dfPixel, double& dfLine,
+                      bool) const override {
+        ++mnCalls;
+        if (!Inverse(dfX, dfY, dfZ, dfPixel, dfLine)) return -1;
+        return Fails(dfPixel, dfLine) ? -1 : 0;
+    }
+    IMathModel* Clone() const override { return new SmoothModel(*this); }
+    void SetDownsampleFactor(int) override {}
+
+    static void Forward(double u, double v, double z, double& x, double& y) {
+        x = 1000.0 + 2.0 * u + 0.3 * v + 4e-5 * u * v + 6.0 * std::sin(u / 250.0) +
+            0.004 * z * (1.0 + u / 2000.0);
+        y = 9000.0 - 2.0 * v + 0.2 * u + 2e-5 * u * u + 4.0 * std::cos(v / 300.0) - 0.003 * z;
+    }
+
+    // Newton iteration on Forward with its analytic Jacobian.
+    static bool Inverse(double x, double y, double z, double& u, double& v) {
+        u = (x - 1000.0) / 2.0;
+        v = (9000.0 - y) / 2.0;
+        for (int i = 0; i < 30; ++i) {
+            double fx = 0.0;
+            double fy = 0.0;
+            Forward(u, v, z, fx, fy);
+            const double a = 2.0 + 4e-5 * v + 6.0 / 250.0 * std::cos(u / 250.0) + 0.004 * z / 2000;
+            const double b = 0.3 + 4e-5 * u;
+            const double c = 0.2 + 4e-5 * u;
+            const double d = -2.0 - 4.0 / 300.0 * std::sin(v / 300.0);
+            const double det = a * d - b * c;
+            const double du = (d * (fx - x) - b * (fy - y)) / det;
+            const double dv = (-c * (fx - x) + a * (fy - y)) / det;
+            u -= du;
+            v -= dv;
+            if (std::fabs(du) + std::fabs(dv) < 1e-11) return true;
+        }
+        return false;
+    }
+
+    double mdfFailFromPixel = 1e30;  // point operations fail at pixels at or beyond
+    double mdfNaNFromPixel = 1e30;   // forward gives NaN X (with success) at or beyond
+    mutable std::atomic<long> mnCalls{0};
+
+    SmoothModel() = default;
+    SmoothModel(const SmoothModel& o)
+        : IMathModel(o), mdfFailFromPixel(o.mdfFailFromPixel), mdfNaNFromPixel(o.mdfNaNFromPixel) {}
+
+  private:
+    bool Fails(double dfPixel, double) const { return dfPixel >= mdfFailFromPixel; }
+    bool ReturnsNaN(double dfPixel) const { return dfPixel >= mdfNaNFromPixel; }
+};
+
+class ThrowingModel : public SmoothModel {
+  public:
+    int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
+                      bool b) const override {
+        if (dfPixel > 5) throw std::runtime_error("model broke");
+        return SmoothModel::ImageToGround(dfPixel, dfLine, dfZ, dfX, dfY, b);
+    }
+    using SmoothModel::ImageToGround;
+};
+
+// A terrain of smooth hills and a sharp step, in metres.
+std::vector<float> Terrain(int nCols, int nRows) {
+    std::vector<float> afZ(static_cast<std::size_t>(nCols) * nRows);
+    for (int r = 0; r < nRows; ++r)
+        for (int c = 0; c < nCols; ++c)
+            afZ[static_cast<std::size_t>(r) * nCols + c] = static_cast<float>(
+                300.0 + 200.0 * std::sin(c / 37.0) * std::cos(r / 53.0) + (c > 400 ? 150.0 : 0.0));
+    return afZ;
+}
+
+// Largest spacing between adjacent floats near v: the output's own precision.
+double FloatUlp(double v) {
+    const float f = static_cast<float>(std::fabs(v));
+    return std::nextafter(f, 1e30f) - f;
+}
+
+struct Block {
+    explicit Block(int c, int r)
+        : nCols(c), nRows(r), afOut1(Size(), -7.0f), afOut2(Size(), -7.0f), abyValid(Size(), 9) {}
+    std::size_t Size() const { return static_cast<std::size_t>(nCols) * nRows; }
+    int nCols;
+    int nRows;
+    std::vector<float> afOut1;
+    std::vector<float> afOut2;
+    std::vector<unsigned char> abyValid;
+};
+
+// Captures the numbered warnings of a scope.
+class WarningCapture {
+  public:
+    WarningCapture() {
+        moPrevious =
+            nova::SetErrorSink([this](const nova::ErrorReport& r) { maoReports.push_back(r); });
+    }
+    ~WarningCapture() { nova::SetErrorSink(moPrevious); }
+    std::vector<nova::ErrorReport> maoReports;
+
+  private:
+    nova::ErrorSink moPrevious;
+};
+
+}  // namespace
+
+TEST(MathModelCore, ArrayFormEqualsPointCallsAndFlagsFailures) {
+    SmoothModel oModel;
+    oModel.mdfFailFromPixel = 70.0;
+    oModel.mdfNaNFromPixel = 90.0;
+    std::vector<double> adfPixel(100);
+    for (std::size_t i = 0; i < adfPixel.size(); ++i) adfPixel[i] = static_cast<double>(i) * 1.01;
+    adfPixel[3] = std::nan("");
+    adfPixel[4] = nm::kMathModelNullValue;
+    const int n = static_cast<int>(adfPixel.size());
+    std::vector<double> adfX(n), adfY(n);
+    std::vector<int> anValid(n, 7);
+
+    // Through the interface's array slot, which forwards to the free function.
+    const nm::IMathModel& oIface = oModel;
+    EXPECT_EQ(-1, oIface.ImageToGround(123.5, 250.0, n, adfPixel.data(), adfX.data(), adfY.data(),
+                                       anValid.data(), false));
+    for (int i = 0; i < n; ++i) {
+        double dfX = 0.0;
+        double dfY = 0.0;
+        const bool bExpected = i != 3 && i != 4 && adfPixel[i] < 70.0;
+        ASSERT_EQ(bExpected ? 1 : 0, anValid[i]) << i;
+        if (bExpected) {
+            ASSERT_EQ(0, oModel.ImageToGround(adfPixel[i], 123.5, 250.0, dfX, dfY, false));
+            EXPECT_EQ(dfX, adfX[i]);
+            EXPECT_EQ(dfY, adfY[i]);
+        } else {
+            EXPECT_EQ(nm::kMathModelNullValue, adfX[i]);
+            EXPECT_EQ(nm::kMathModelNullValue, adfY[i]);
+        }
+    }
+
+    // NaN results reported as success are failures too.
+    oModel.mdfFailFromPixel = 1e30;
+    EXPECT_EQ(-1, nm::ImageToGround(&oModel, 10.0, 0.0, n, adfPixel.data(), adfX.data(),
+                                    adfY.data(), anValid.data(), false));
+    EXPECT_EQ(0, anValid[95]);
+    EXPECT_EQ(1, anValid[80]);
+
+    // Ground to image round trip along a ground row; status array optional.
+    std::vector<double> adfGX(50), adfP(50), adfL(50);
+    for (int i = 0; i < 50; ++i) adfGX[i] = 1100.0 + 7.0 * i;
+    EXPECT_EQ(0, nm::GroundToImage(&oModel, 8500.0, 120.0, 50, adfGX.data(), adfP.data(),
+                                   adfL.data(), nullptr, false));
+    for (int i = 0; i < 50; ++i) {
+        double dfX = 0.0;
+        double dfY = 0.0;
+        SmoothModel::Forward(adfP[i], adfL[i], 120.0, dfX, dfY);
+        EXPECT_NEAR(adfGX[i], dfX, 1e-8);
+        EXPECT_NEAR(8500.0, dfY, 1e-8);
+    }
+
+    // A null height fails every point; an empty row succeeds.
+    EXPECT_EQ(-1, nm::GroundToImage(&oModel, 8500.0, nm::kMathModelNullValue, 50, adfGX.data(),
+                                    adfP.data(), adfL.data(), anValid.data(), false));
+    EXPECT_EQ(0, anValid[0]);
+    EXPECT_EQ(0,
+              nm::ImageToGround(&oModel, 1.0, 0.0, 0, nullptr, nullptr, nullptr, nullptr, false));
+}
+
+TEST(MathModelCore, BlockFormIsExactWithZeroToleranceOrUnitStep) {
+    SmoothModel oModel;
+    const int nCols = 37;
+    const int nRows = 29;
+    const std::vector<float> afZ = Terrain(nCols, nRows);
+    for (const auto& oCase : {std::make_pair(8, 0.0), std::make_pair(1, 5.0)}) {
+        Block oOut(nCols, nRows);
+        EXPECT_EQ(0,
+                  oModel.ImageToGround(nCols, nRows, oCase.first, nullptr, nullptr, afZ.data(),
+                                       oOut.afOut1.data(), oOut.afOut2.data(), oOut.abyValid.data(),
+                                       10.0, 20.0, 1.5, 2.5, oCase.second, false));
+        for (int r = 0; r < nRows; ++r) {
+            for (int c = 0; c < nCols; ++c) {
+                const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+                double dfX = 0.0;
+                double dfY = 0.0;
+                SmoothModel::Forward(10.0 + 1.5 * c, 20.0 + 2.5 * r, afZ[i], dfX, dfY);
+                ASSERT_EQ(static_cast<float>(dfX), oOut.afOut1[i]) << c << "," << r;
+                ASSERT_EQ(static_cast<float>(dfY), oOut.afOut2[i]);
+                ASSERT_EQ(1, oOut.abyValid[i]);
+            }
+        }
+    }
+}
+
+TEST(MathModelCore, BlockFormStaysWithinToleranceAndSavesEvaluations) {
+    SmoothModel oModel;
+    const int nCols = 994;  // leaves a one-point-wide last grid cell
+    const int nRows = 701;
+    // Plain bilinear interpolation over 32 points errs by ~0.012 on this model:
+    // the checks have to split cells to stay within this tolerance.
+    const double dfTol = 0.004;
+    for (const bool bTerrain : {false, true}) {
+        const std::vector<float> afZ = Terrain(nCols, nRows);
+        const float* pafZ = bTerrain ? afZ.data() : nullptr;
+        Block oOut(nCols, nRows);
+        oModel.mnCalls = 0;
+        ASSERT_EQ(0, nm::ImageToGround(&oModel, nCols, nRows, 32, nullptr, nullptr, pafZ,
+                                       oOut.afOut1.data(), oOut.afOut2.data(), oOut.abyValid.data(),
+                                       0.0, 0.0, 1.0, 1.0, dfTol, false));
+        EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(oOut.Size() / 4)) << bTerrain;
+        double dfWorst = 0.0;
+        for (int r = 0; r < nRows; ++r) {
+            for (int c = 0; c < nCols; ++c) {
+                const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+                double dfX = 0.0;
+                double dfY = 0.0;
+                SmoothModel::Forward(c, r, pafZ ? pafZ[i] : 0.0, dfX, dfY);
+                ASSERT_EQ(1, oOut.abyValid[i]);
+                const double dfErr = std::max(std::fabs(oOut.afOut1[i] - dfX) - FloatUlp(dfX),
+                                              std::fabs(oOut.afOut2[i] - dfY) - FloatUlp(dfY));
+                dfWorst = std::max(dfWorst, dfErr);
+            }
+        }
+        EXPECT_LE(dfWorst, dfTol) << "terrain " << bTerrain;
+    }
+}
+
+TEST(MathModelCore, BlockRoundTripThroughExplicitInputArrays) {
+    // Image grid -> ground, then the ground positions (irregular, from the
+    // first pass) back to image: the pixel grid comes back.
+    SmoothModel oModel;
+    const int nCols = 300;
+    const int nRows = 260;
+    const std::vector<float> afZ = Terrain(nCols, nRows);
+    Block oGround(nCols, nRows);
+    ASSERT_EQ(0, nm::ImageToGround(&oModel, nCols, nRows, 16, nullptr, nullptr, afZ.data(),
+                                   oGround.afOut1.data(), oGround.afOut2.data(), nullptr, 100.0,
+                                   50.0, 1.0, 1.0, 0.01, false));
+    Block oImage(nCols, nRows);
+    oModel.mnCalls = 0;
+    ASSERT_EQ(0,
+              oModel.GroundToImage(nCols, nRows, 16, oGround.afOut1.data(), oGround.afOut2.data(),
+                                   afZ.data(), oImage.afOut1.data(), oImage.afOut2.data(),
+                                   oImage.abyValid.data(), 0, 0, 0, 0, 0.01, false));
+    EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(oImage.Size() / 4));
+    for (int r = 0; r < nRows; ++r) {
+        for (int c = 0; c < nCols; ++c) {
+            const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+            ASSERT_EQ(1, oImage.abyValid[i]);
+            // Ground X/Y as floats carry up to ~1e-3 m, i.e. ~5e-4 pixel.
+            ASSERT_NEAR(100.0 + c, oImage.afOut1[i], 0.02) << c << "," << r;
+            ASSERT_NEAR(50.0 + r, oImage.afOut2[i], 0.02) << c << "," << r;
+        }
+    }
+}
+
+TEST(MathModelCore, BlockFollowsIrregularExplicitInputs) {
+    // Pixel/line arrays off a regular grid by up to 0.4 pixel, with a few
+    // points far off: each point is mapped at its own input.
+    SmoothModel oModel;
+    const int nCols = 257;
+    const int nRows = 190;
+    std::vector<float> afPixel(static_cast<std::size_t>(nCols) * nRows);
+    std::vector<float> afLine(afPixel.size());
+    for (int r = 0; r < nRows; ++r) {
+        for (int c = 0; c < nCols; ++c) {
+            const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+            afPixel[i] = static_cast<float>(c + 0.4 * std::sin(i * 12.9898));
+            afLine[i] = static_cast<float>(r + 0.4 * std::cos(i * 78.233));
+        }
+    }
+    afPixel[40 * nCols + 70] += 60.0f;
+    afLine[100 * nCols + 200] -= 45.0f;
+    const double dfTol = 0.01;
+    Block oOut(nCols, nRows);
+    ASSERT_EQ(0, nm::ImageToGround(&oModel, nCols, nRows, 32, afPixel.data(), afLine.data(),
+                                   nullptr, oOut.afOut1.data(), oOut.afOut2.data(), nullptr, 0, 0,
+                                   0, 0, dfTol, false));
+    // The jitter is followed to first order, not by evaluating every point.
+    EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(afPixel.size() / 20));
+    for (std::size_t i = 0; i < afPixel.size(); ++i) {
+        double dfX = 0.0;
+        double dfY = 0.0;
+        SmoothModel::Forward(afPixel[i], afLine[i], 0.0, dfX, dfY);
+        ASSERT_NEAR(dfX, oOut.afOut1[i], dfTol + FloatUlp(dfX)) << i;
+        ASSERT_NEAR(dfY, oOut.afOut2[i], dfTol + FloatUlp(dfY)) << i;
+    }
+}
+
+TEST(MathModelCore, BlockFormFlagsFailedPointsExactly) {
+    SmoothModel oModel;
+    oModel.mdfFailFromPixel = 403.5;  // half-plane of failure, across grid cells
+    const int nCols = 600;
+    const int nRows = 90;
+    std::vector<float> afZ(static_cast<std::size_t>(nCols) * nRows, 100.0f);
+    afZ[5 * nCols + 17] = kNullF;  // height holes fail their point only
+    afZ[60 * nCols + 200] = std::nanf("");
+    for (const double dfTol : {0.0, 0.05}) {
+        Block oOut(nCols, nRows);
+        EXPECT_EQ(-1, nm::ImageToGround(&oModel, nCols, nRows, 64, nullptr, nullptr, afZ.data(),
+                                        oOut.afOut1.data(), oOut.afOut2.data(),
+                                        oOut.abyValid.data(), 0.0, 0.0, 1.0, 1.0, dfTol, false));
+        for (int r = 0; r < nRows; ++r) {
+            for (int c = 0; c < nCols; ++c) {
+                const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+                const bool bHole = (r == 5 && c == 17) || (r == 60 && c == 200);
+                const bool bValid = c < 403.5 && !bHole;
+                ASSERT_EQ(bValid ? 1 : 0, oOut.abyValid[i]) << c << "," << r << " tol " << dfTol;
+                if (!bValid) {
+                    ASSERT_EQ(kNullF, oOut.afOut1[i]);
+                    ASSERT_EQ(kNullF, oOut.afOut2[i]);
+                }
+            }
+        }
+    }
+
+    // Success reported with a NaN result counts as failure; no mask needed.
+    SmoothModel oNaN;
+    oNaN.mdfNaNFromPixel = 50.0;
+    Block oOut(100, 10);
+    EXPECT_EQ(-1,
+              nm::ImageToGround(&oNaN, 100, 10, 16, nullptr, nullptr, nullptr, oOut.afOut1.data(),
+                                oOut.afOut2.data(), nullptr, 0, 0, 1, 1, 0.05, false));
+    EXPECT_EQ(kNullF, oOut.afOut1[99]);
+    EXPECT_TRUE(std::isfinite(oOut.afOut1[49]) && oOut.afOut1[49] != kNullF);
+}
+
+TEST(MathModelCore, BadArgumentsAreRejectedWithoutWriting) {
+    SmoothModel oModel;
+    WarningCapture oCapture;
+    Block oOut(10, 10);
+    std::vector<float> afIn(100, 1.0f);
+    std::vector<double> adfIn(10, 1.0), adfOut(10, -3.0);
+    auto Block10 = [&](const nm::IMathModel* poModel, int nCols, int nRows, int nStep,
+                       const float* pafA, const float* pafB, float* pafOut1, double dfOrigin,
+                       double dfTol) {
+        return nm::GroundToImage(poModel, nCols, nRows, nStep, pafA, pafB, nullptr, pafOut1,
+                                 oOut.afOut2.data(), oOut.abyValid.data(), dfOrigin, 0.0, 1.0, 1.0,
+                                 dfTol, false);
+    };
+    float* pafO1 = oOut.afOut1.data();
+    EXPECT_EQ(-1, Block10(nullptr, 10, 10, 4, nullptr, nullptr, pafO1, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, -1, 10, 4, nullptr, nullptr, pafO1, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, -5, 4, nullptr, nullptr, pafO1, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 0, nullptr, nullptr, pafO1, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 4, afIn.data(), nullptr, pafO1, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 4, nullptr, nullptr, nullptr, 0.0, 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 4, nullptr, nullptr, pafO1, std::nan(""), 0.1));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 4, nullptr, nullptr, pafO1, 0.0, std::nan("")));
+    EXPECT_EQ(-1, Block10(&oModel, 10, 10, 4, afIn.data(), afIn.data(), afIn.data(), 0.0, 0.1));
+    EXPECT_EQ(-1, nm::ImageToGround(nullptr, 0.0, 0.0, 10, adfIn.data(), adfOut.data(),
+                                    adfOut.data(), nullptr, false));
+    EXPECT_EQ(-1, nm::ImageToGround(&oModel, 0.0, 0.0, -2, adfIn.data(), adfOut.data(),
+                                    adfOut.data(), nullptr, false));
+    EXPECT_EQ(-1, nm::GroundToImage(&oModel, 0.0, 0.0, 10, nullptr, adfOut.data(), adfOut.data(),
+                                    nullptr, false));
+    ASSERT_EQ(12u, oCapture.maoReports.size());
+    for (const auto& oReport : oCapture.maoReports) {
+        EXPECT_EQ(11, oReport.nCode);
+        EXPECT_FALSE(oReport.bFatal);
+    }
+    EXPECT_NE(std::string::npos, oCapture.maoReports[1].osText.find("-1 x 10"));
+    EXPECT_NE(std::string::npos, oCapture.maoReports[3].osText.find("grid step 0"));
+    EXPECT_NE(std::string::npos, oCapture.maoReports[10].osText.find("-2"));
+    EXPECT_EQ(0L, oModel.mnCalls.load());
+    for (std::size_t i = 0; i < oOut.Size(); ++i) {
+        ASSERT_EQ(-7.0f, oOut.afOut1[i]);
+        ASSERT_EQ(9, oOut.abyValid[i]);
+    }
+    for (const double v : adfOut) ASSERT_EQ(-3.0, v);
+
+    // Empty blocks are not an error and need no arrays.
+    EXPECT_EQ(0, nm::ImageToGround(&oModel, 0, 5, 4, nullptr, nullptr, nullptr, nullptr, nullptr,
+                                   nullptr, 0, 0, 1, 1, 0.1, false));
+}
+
+TEST(MathModelCore, ModelExceptionsPropagateAndConcurrentCallsAgree) {
+    ThrowingModel oThrowing;
+    Block oOut(20, 20);
+    EXPECT_THROW(
+        nm::ImageToGround(&oThrowing, 20, 20, 8, nullptr, nullptr, nullptr, oOut.afOut1.data(),
+                          oOut.afOut2.data(), nullptr, 0, 0, 1, 1, 0.1, false),
+        std::runtime_error);
+
+    // One model shared by several threads: every call owns its working storage.
+    SmoothModel oModel;
+    const int nCols = 2000;
+    const int nRows = 1500;
+    const std::vector<float> afZ = Terrain(nCols, nRows);
+    std::vector<Block> aoOut(4, Block(nCols, nRows));
+    std::vector<int> anResult(aoOut.size(), 99);
+    std::vector<std::thread> aoThreads;
+    for (std::size_t t = 0; t < aoOut.size(); ++t) {
+        aoThreads.emplace_back([&, t] {
+            anResult[t] =
+                nm::ImageToGround(&oModel, nCols, nRows, 64, nullptr, nullptr, afZ.data(),
+                                  aoOut[t].afOut1.data(), aoOut[t].afOut2.data(),
+                                  aoOut[t].abyValid.data(), -500.0, -300.0, 1.0, 1.0, 0.01, false);
+        });
+    }
+    for (auto& oThread : aoThreads) oThread.join();
+    for (std::size_t t = 0; t < aoOut.size(); ++t) {
+        EXPECT_EQ(0, anResult[t]);
+        EXPECT_EQ(aoOut[0].afOut1, aoOut[t].afOut1);
+        EXPECT_EQ(aoOut[0].afOut2, aoOut[t].afOut2);
+    }
+    // Spot checks of the large grid against exact evaluation.
+    for (int r = 0; r < nRows; r += 97) {
+        for (int c = 0; c < nCols; c += 89) {
+            const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
+            double dfX = 0.0;
+            double dfY = 0.0;
+            SmoothModel::Forward(-500.0 + c, -300.0 + r, afZ[i], dfX, dfY);
+            EXPECT_NEAR(dfX, aoOut[0].afOut1[i], 0.01 + FloatUlp(dfX));
+            EXPECT_NEAR(dfY, aoOut[0].afOut2[i], 0.01 + FloatUlp(dfY));
+        }
+    }
+}

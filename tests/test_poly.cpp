@@ -1,0 +1,201 @@
+// Polynomial model: term order, evaluation forms, copy and release.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <memory>
+#include <random>
+#include <vector>
+
+#include "lumo.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+struct PolyDeleter {
+    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
+};
+using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
+
+class WarningCounter {
+public:
+    WarningCounter() {
+        moOld = nova::SetErrorSink([this](const nova::ErrorReport& r) { anCodes.push_back(r.nCode); });
+    }
+    ~WarningCounter() { nova::SetErrorSink(moOld); }
+    std::vector<int> anCodes;
+
+private:
+    nova::ErrorSink moOld;
+};
+
+// Powers of u and v of each term, written out independently of the library.
+const int kPowers[21][2] = {{0, 0}, {1, 0}, {0, 1}, {1, 1}, {2, 0}, {0, 2}, {2, 1},
+                            {1, 2}, {3, 0}, {0, 3}, {2, 2}, {3, 1}, {1, 3}, {4, 0},
+                            {0, 4}, {3, 2}, {2, 3}, {4, 1}, {1, 4}, {5, 0}, {0, 5}};
+
+double Reference(const double* c, int n, double u, double v) {
+    long double sum = 0;
+    for (int k = 0; k < n; ++k) {
+        sum += static_cast<long double>(c[k]) * std::pow(static_cast<long double>(u), kPowers[k][0]) *
+               std::pow(static_cast<long double>(v), kPowers[k][1]);
+    }
+    return static_cast<double>(sum);
+}
+
+TEST(Poly, EveryTermCountMatchesAnIndependentSum) {
+    PolyPtr p(POLYAllocate());
+    std::mt19937 oRng(42);
+    std::uniform_real_distribution<double> oCoef(-2.0, 2.0);
+    for (int k = 0; k < 21; ++k) {
+        p->padfPixelCoeffs[k] = oCoef(oRng);
+        p->padfLineCoeffs[k] = oCoef(oRng);
+        p->padfXCoeffs[k] = oCoef(oRng);
+        p->padfYCoeffs[k] = oCoef(oRng);
+    }
+    const double u = 1.37, v = -0.81;
+    for (int n = 1; n <= 21; ++n) {
+        p->nCoeffs = n;
+        double dfPixel = 0, dfLine = 0, dfX = 0, dfY = 0;
+        POLYGeo2Img(p.get(), u, v, &dfPixel, &dfLine);
+        POLYImg2Geo(p.get(), u, v, &dfX, &dfY);
+        EXPECT_NEAR(dfPixel, Reference(p->padfPixelCoeffs, n, u, v), 1e-12) << n;
+        EXPECT_NEAR(dfLine, Reference(p->padfLineCoeffs, n, u, v), 1e-12) << n;
+        EXPECT_NEAR(dfX, Reference(p->padfXCoeffs, n, u, v), 1e-12) << n;
+        EXPECT_NEAR(dfY, Reference(p->padfYCoeffs, n, u, v), 1e-12) << n;
+    }
+}
+
+TEST(Poly, KnownTermsAndInvalidCounts) {
+    PolyPtr p(POLYAllocate());
+    WarningCounter oWarnings;
+    // A fresh record evaluates to zero, after warning 11.
+    double dfPixel = 9, dfLine = 9;
+    POLYGeo2Img(p.get(), 10.0, 20.0, &dfPixel, &dfLine);
+    EXPECT_EQ(dfPixel, 0.0);
+    EXPECT_EQ(dfLine, 0.0);
+    ASSERT_EQ(oWarnings.anCodes.size(), 1u);
+    EXPECT_EQ(oWarnings.anCodes[0], 11);
+
+    // Three terms: c0 + c1 X + c2 Y.
+    p->nCoeffs = 3;
+    const double adfC[5] = {5.0, 2.0, -3.0, 0.5, 0.25};
+    std::memcpy(p->padfPixelCoeffs, adfC, sizeof(adfC));
+    POLYGeo2Img(p.get(), 4.0, 1.0, &dfPixel, &dfLine);
+    EXPECT_DOUBLE_EQ(dfPixel, 5.0 + 8.0 - 3.0);
+    // The fourth term is X*Y, the fifth X^2.
+    p->nCoeffs = 4;
+    POLYGeo2Img(p.get(), 4.0, 1.0, &dfPixel, &dfLine);
+    EXPECT_DOUBLE_EQ(dfPixel, 10.0 + 0.5 * 4.0);
+    p->nCoeffs = 5;
+    POLYGeo2Img(p.get(), 4.0, 1.0, &dfPixel, &dfLine);
+    EXPECT_DOUBLE_EQ(dfPixel, 12.0 + 0.25 * 16.0);
+    EXPECT_EQ(oWarnings.anCodes.size(), 1u);
+
+    // Zero terms: warning and coefficient 0 alone; 22 terms: warning and the
+    // full 21-term polynomial, never a read past coefficient 20.
+    for (int k = 0; k < 21; ++k) p->padfLineCoeffs[k] = 0.1 * (k + 1);
+    p->nCoeffs = 0;
+    POLYGeo2Img(p.get(), 4.0, 1.0, &dfPixel, &dfLine);
+    EXPECT_DOUBLE_EQ(dfPixel, 5.0);
+    EXPECT_DOUBLE_EQ(dfLine, 0.1);
+    p->nCoeffs = -3;
+    POLYImg2Geo(p.get(), 4.0, 1.0, &dfPixel, &dfLine);
+    p->nCoeffs = 22;
+    POLYGeo2Img(p.get(), 1.5, 0.5, &dfPixel, &dfLine);
+    EXPECT_NEAR(dfLine, Reference(p->padfLineCoeffs, 21, 1.5, 0.5), 1e-12);
+    EXPECT_EQ(oWarnings.anCodes.size(), 4u);
+}
+
+TEST(Poly, CopyIsDeepAndGuardsItsCount) {
+    PolyPtr src(POLYAllocate());
+    PolyPtr dst(POLYAllocate());
+    src->nCoeffs = 6;
+    src->nPixels = 6000;
+    src->nLines = 5000;
+    std::strcpy(src->pszGeosys, "UTM 31 U D000");
+    ASSERT_EQ(Geosys2ProjInfo(src->psProjInfo, "UTM 31 U D000", 0.0, 0.0, 1.0, 1.0), 0);
+    for (int k = 0; k < 21; ++k) {
+        src->padfPixelCoeffs[k] = k + 1.0;
+        src->padfLineCoeffs[k] = -k - 1.0;
+        src->padfXCoeffs[k] = 100.0 + k;
+        src->padfYCoeffs[k] = 200.0 + k;
+        dst->padfXCoeffs[k] = -9.0;
+    }
+    ProjInfo_t* psDstProj = dst->psProjInfo;
+    POLYCopy(dst.get(), src.get());
+    EXPECT_EQ(dst->nCoeffs, 6);
+    EXPECT_EQ(dst->nPixels, 6000);
+    EXPECT_EQ(dst->nLines, 5000);
+    EXPECT_STREQ(dst->pszGeosys, "UTM 31 U D000");
+    EXPECT_EQ(dst->psProjInfo, psDstProj);  // own block, new contents
+    EXPECT_EQ(std::memcmp(dst->psProjInfo, src->psProjInfo, sizeof(ProjInfo_t)), 0);
+    EXPECT_EQ(dst->padfXCoeffs[5], 105.0);
+    EXPECT_EQ(dst->padfXCoeffs[6], -9.0);  // beyond nCoeffs: untouched
+    EXPECT_NE(dst->padfPixelCoeffs, src->padfPixelCoeffs);
+
+    // The copy survives its source.
+    src.reset();
+    double dfPixel = 0, dfLine = 0;
+    POLYGeo2Img(dst.get(), 1.0, 1.0, &dfPixel, &dfLine);
+    EXPECT_DOUBLE_EQ(dfPixel, 1 + 2 + 3 + 4 + 5 + 6);
+
+    // Self copy and null sides change nothing.
+    POLYCopy(dst.get(), dst.get());
+    POLYCopy(dst.get(), nullptr);
+    POLYCopy(nullptr, dst.get());
+    EXPECT_EQ(dst->nCoeffs, 6);
+
+    // A damaged count never overruns the 21-coefficient arrays.
+    PolyPtr bad(POLYAllocate());
+    bad->nCoeffs = 1000;
+    bad->padfXCoeffs[20] = 3.5;
+    POLYCopy(dst.get(), bad.get());
+    EXPECT_EQ(dst->padfXCoeffs[20], 3.5);
+    bad->nCoeffs = -5;
+    POLYCopy(dst.get(), bad.get());
+    EXPECT_EQ(dst->nCoeffs, -5);
+
+    POLYDeallocate(nullptr);
+}
+
+TEST(Poly, NullRecordsAndOutputsAreRefused) {
+    WarningCounter oWarnings;
+    PolyPtr p(POLYAllocate());
+    p->nCoeffs = 3;
+    double dfA = 5.0, dfB = 6.0;
+    POLYGeo2Img(nullptr, 1.0, 2.0, &dfA, &dfB);
+    POLYImg2Geo(p.get(), 1.0, 2.0, nullptr, &dfB);
+    EXPECT_EQ(dfA, 5.0);
+    EXPECT_EQ(dfB, 6.0);
+    EXPECT_EQ(oWarnings.anCodes, (std::vector<int>{11, 11}));
+    // The dispatch reports such a call as not carried out.
+    EXPECT_EQ(GenGeo2Img(4, nullptr, 1.0, 2.0, 0.0, &dfA, &dfB), 0);
+    EXPECT_EQ(GenImg2Geo(4, p.get(), 1.0, 2.0, 0.0, &dfA, nullptr), 0);
+    EXPECT_EQ(GenImg2GeoDem(4, p.get(), 1.0, 2.0, nullptr, &dfA, &dfB), 0);
+}
+
+TEST(Poly, GenericDispatchForCode4) {
+    PolyPtr p(POLYAllocate());
+    p->nCoeffs = 3;
+    p->padfPixelCoeffs[0] = 10;
+    p->padfPixelCoeffs[1] = 2;
+    p->padfLineCoeffs[2] = -1;
+    p->padfXCoeffs[1] = 0.5;
+    p->padfYCoeffs[0] = 7;
+    p->padfYCoeffs[2] = -1;
+    double dfPixel = 0, dfLine = 0;
+    EXPECT_EQ(GenGeo2Img(4, p.get(), 3.0, 4.0, 1e6, &dfPixel, &dfLine), 1);
+    EXPECT_DOUBLE_EQ(dfPixel, 16.0);
+    EXPECT_DOUBLE_EQ(dfLine, -4.0);
+    double dfX = 0, dfY = 0, dfZ = 123.0;
+    EXPECT_EQ(GenImg2Geo(4, p.get(), 16.0, -4.0, LUMO_NULL_VALUE, &dfX, &dfY), 1);
+    EXPECT_DOUBLE_EQ(dfX, 8.0);
+    EXPECT_DOUBLE_EQ(dfY, 11.0);
+    EXPECT_EQ(GenImg2GeoDem(4, p.get(), 2.0, 2.0, &dfZ, &dfX, &dfY), 1);
+    EXPECT_EQ(dfZ, 123.0);  // height untouched
+    EXPECT_DOUBLE_EQ(dfX, 1.0);
+}
+
+}  // namespace
