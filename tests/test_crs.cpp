@@ -1,0 +1,474 @@
+// Coordinate reference systems and transformations: geoid heights, compound
+// systems, factories, failure paths and concurrent use.
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <filesystem>
+#include <limits>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <unistd.h>
+
+#include "crs.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+using nova::ogc::CRSPtr;
+using nova::ogc::MathTransformPtr;
+using nova::ogc::cs::CS_VD_Ellipsoidal;
+using nova::ogc::cs::CS_VD_None;
+using nova::ogc::cs::CS_VD_Orthometric;
+using nova::ogc::cs::LinearUnit;
+namespace utils = nova::ogc::utils;
+
+constexpr const char* kLocalEngineering =
+    "ENGCRS[\"Local grid\",EDATUM[\"Site\"],CS[Cartesian,2],"
+    "AXIS[\"x\",east,LENGTHUNIT[\"metre\",1]],AXIS[\"y\",north,LENGTHUNIT[\"metre\",1]]]";
+
+CRSPtr CRSFromGeosys(const char* pszGeosys) {
+    ProjInfo_t sInfo{};
+    if (Geosys2ProjInfo(&sInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0) < 0) return nullptr;
+    return CRSPtr(nova::ogc::ProjectionEngine::GetProjInfoFactory(3)->CreateCRS(sInfo));
+}
+
+CRSPtr WGS84Ellipsoidal() {
+    return CRSPtr(nova::ogc::ProjectionEngine::GetCSAuthorityFactory(3)->CreateWGS84Ellipsoidal());
+}
+
+CRSPtr Compound(const CRSPtr& poHorizontal, nova::ogc::cs::DatumType eVertical) {
+    return CRSPtr(utils::CreateCompoundCS(poHorizontal.get(), eVertical));
+}
+
+MathTransformPtr Transform(const CRSPtr& poFrom, const CRSPtr& poTo) {
+    return MathTransformPtr(utils::CreateCRSTransform(poFrom.get(), poTo.get(), 0.0));
+}
+
+struct Point {
+    double dfX;
+    double dfY;
+    double dfZ;
+};
+
+Point Apply(const MathTransformPtr& poTransform, Point sIn) {
+    Point sOut{std::nan(""), std::nan(""), std::nan("")};
+    EXPECT_TRUE(
+        poTransform->TransformPoint(sIn.dfX, sIn.dfY, sIn.dfZ, sOut.dfX, sOut.dfY, sOut.dfZ))
+        << sIn.dfX << " " << sIn.dfY << " " << sIn.dfZ;
+    return sOut;
+}
+
+// Height above the ellipsoid of a point at mean sea level: the geoid
+// undulation.
+double Undulation(const MathTransformPtr& poToEllipsoidal, double dfLon, double dfLat) {
+    const Point sOut = Apply(poToEllipsoidal, {dfLon, dfLat, 0.0});
+    EXPECT_NEAR(sOut.dfX, dfLon, 1e-9);
+    EXPECT_NEAR(sOut.dfY, dfLat, 1e-9);
+    return sOut.dfZ;
+}
+
+TEST(CRS, GeoidUndulationsMatchPublishedValues) {
+    CRSPtr poLonLat = CRSFromGeosys("LONG/LAT D000");
+    ASSERT_TRUE(poLonLat);
+    CRSPtr poMeanSeaLevel = Compound(poLonLat, CS_VD_Orthometric);
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    MathTransformPtr poTransform = Transform(poMeanSeaLevel, poWgs84);
+    ASSERT_TRUE(poTransform);
+
+    // Test values distributed with the EGM96 model (NGA), computed from the
+    // full spherical-harmonic expansion: latitude, longitude, undulation.
+    const struct {
+        double dfLat, dfLon, dfN;
+    } asPublished[] = {
+        {38.6281550, 269.7791550 - 360.0, -31.628}, {-14.6212170, 305.0211140 - 360.0, -2.969},
+        {46.8743190, 102.4487290, -43.575},         {-23.6174460, 133.8747120, 15.871},
+        {38.6254730, 359.9995000 - 360.0, 50.066},  {-0.4667440, 0.0023000, 17.329},
+    };
+    for (const auto& s : asPublished) {
+        EXPECT_NEAR(Undulation(poTransform, s.dfLon, s.dfLat), s.dfN, 0.5)
+            << s.dfLat << " " << s.dfLon;
+    }
+    // Netherlands (geoid well above the ellipsoid) and the Indian Ocean geoid
+    // low; references from PROJ's cs2cs on EPSG:4326+5773 -> EPSG:4979.
+    EXPECT_NEAR(Undulation(poTransform, 5.0, 52.0), 43.418, 0.5);
+    EXPECT_NEAR(Undulation(poTransform, 78.0, -5.0), -91.830, 0.5);
+
+    // Heights add to the undulation, and the inverse takes them back.
+    MathTransformPtr poInverse = Transform(poWgs84, poMeanSeaLevel);
+    ASSERT_TRUE(poInverse);
+    double dfX = 78.0, dfY = -5.0, dfZ = 250.0;
+    ASSERT_TRUE(poTransform->TransformPoint(dfX, dfY, dfZ, dfX, dfY, dfZ));
+    EXPECT_NEAR(dfZ, 250.0 - 91.830, 0.5);
+    ASSERT_TRUE(poInverse->TransformPoint(dfX, dfY, dfZ, dfX, dfY, dfZ));
+    EXPECT_NEAR(dfX, 78.0, 1e-9);
+    EXPECT_NEAR(dfY, -5.0, 1e-9);
+    EXPECT_NEAR(dfZ, 250.0, 1e-6);
+}
+
+TEST(CRS, UtmOrthometricRoundTripThroughWgs84) {
+    CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
+    ASSERT_TRUE(poUtm);
+    CRSPtr poUtmMsl = Compound(poUtm, CS_VD_Orthometric);
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    MathTransformPtr poForward = Transform(poUtmMsl, poWgs84);
+    MathTransformPtr poBackward = Transform(poWgs84, poUtmMsl);
+    ASSERT_TRUE(poForward && poBackward);
+
+    // On the central meridian the easting is the false easting exactly.
+    const Point sCentral = Apply(poForward, {500000.0, 5760000.0, 0.0});
+    EXPECT_NEAR(sCentral.dfX, 3.0, 1e-12);
+    EXPECT_NEAR(sCentral.dfY, 51.990665, 1e-6);
+    EXPECT_NEAR(sCentral.dfZ, 44.0675, 0.5);  // cs2cs EPSG:32631+5773 -> EPSG:4979
+
+    // Independent horizontal path: the projection service's own reprojection.
+    ProjInfo_t sUtm{};
+    ProjInfo_t sLonLat{};
+    ASSERT_GE(Geosys2ProjInfo(&sUtm, "UTM 31 D000", 0.0, 0.0, 1.0, 1.0), 0);
+    ASSERT_GE(Geosys2ProjInfo(&sLonLat, "LONG/LAT D000", 0.0, 0.0, 1.0, 1.0), 0);
+    CRSPtr poLonLatMsl = Compound(CRSFromGeosys("LONG/LAT D000"), CS_VD_Orthometric);
+    MathTransformPtr poGeoid = Transform(poLonLatMsl, poWgs84);
+    ASSERT_TRUE(poGeoid);
+    for (double dfEasting = 300000.0; dfEasting <= 700000.0; dfEasting += 100000.0) {
+        for (double dfNorthing = 4000000.0; dfNorthing <= 7000000.0; dfNorthing += 750000.0) {
+            const Point sIn{dfEasting, dfNorthing, 123.25};
+            const Point sGeo = Apply(poForward, sIn);
+            double dfLon = 0.0, dfLat = 0.0;
+            ASSERT_EQ(GCTPTransform(&sUtm, dfEasting, dfNorthing, &sLonLat, &dfLon, &dfLat), 0);
+            EXPECT_NEAR(sGeo.dfX, dfLon, 1e-8);
+            EXPECT_NEAR(sGeo.dfY, dfLat, 1e-8);
+            EXPECT_NEAR(sGeo.dfZ, 123.25 + Undulation(poGeoid, dfLon, dfLat), 1e-6);
+            const Point sBack = Apply(poBackward, sGeo);
+            EXPECT_NEAR(sBack.dfX, sIn.dfX, 1e-5);
+            EXPECT_NEAR(sBack.dfY, sIn.dfY, 1e-5);
+            EXPECT_NEAR(sBack.dfZ, sIn.dfZ, 1e-6);
+        }
+    }
+
+    // Southern zones: false northing 10 000 km, central meridian 15E.
+    MathTransformPtr poSouth =
+        Transform(Compound(CRSFromGeosys("UTM 33 C D000"), CS_VD_Orthometric), poWgs84);
+    ASSERT_TRUE(poSouth);
+    const Point sSouth = Apply(poSouth, {500000.0, 9000000.0, 0.0});
+    EXPECT_NEAR(sSouth.dfX, 15.0, 1e-12);
+    EXPECT_NEAR(sSouth.dfY, -9.0, 0.1);
+    EXPECT_NEAR(sSouth.dfZ, Undulation(poGeoid, sSouth.dfX, sSouth.dfY), 1e-6);
+
+    // A system on another ellipsoid, without datum shift: the geoid is still
+    // applied.
+    CRSPtr poOther = CRSFromGeosys("UTM 31 E000");
+    ASSERT_TRUE(poOther);
+    EXPECT_EQ(poOther->GetName(), "UTM 31 E000");
+    MathTransformPtr poFromOther = Transform(Compound(poOther, CS_VD_Orthometric), poWgs84);
+    ASSERT_TRUE(poFromOther);
+    const Point sOther = Apply(poFromOther, {500000.0, 5760000.0, 0.0});
+    EXPECT_NEAR(sOther.dfX, 3.0, 1e-9);
+    EXPECT_NEAR(sOther.dfZ, Undulation(poGeoid, sOther.dfX, sOther.dfY), 1e-6);
+
+    // Ellipsoidal heights pass through unchanged.
+    MathTransformPtr poEllipsoidal = Transform(Compound(poUtm, CS_VD_Ellipsoidal), poWgs84);
+    ASSERT_TRUE(poEllipsoidal);
+    const Point sEll = Apply(poEllipsoidal, {500000.0, 5760000.0, 77.5});
+    EXPECT_NEAR(sEll.dfX, 3.0, 1e-12);
+    EXPECT_NEAR(sEll.dfY, sCentral.dfY, 1e-12);
+    EXPECT_DOUBLE_EQ(sEll.dfZ, 77.5);
+}
+
+TEST(CRS, HeightUnitsOfCompoundSystems) {
+    CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
+    ASSERT_TRUE(poUtm);
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    const Point sIn{500000.0, 5760000.0, 100.0};
+
+    MathTransformPtr poMetre = Transform(Compound(poUtm, CS_VD_Orthometric), poWgs84);
+    CRSPtr poFeetMsl(utils::CreateCompoundCS(poUtm.get(), CS_VD_Orthometric, LinearUnit::Foot()));
+    MathTransformPtr poFeet = Transform(poFeetMsl, poWgs84);
+    ASSERT_TRUE(poMetre && poFeet);
+    EXPECT_NE(poFeetMsl->GetName().find("foot"), std::string::npos) << poFeetMsl->GetName();
+    const double dfUndulation = Apply(poMetre, {sIn.dfX, sIn.dfY, 0.0}).dfZ;
+    const Point sFeet = Apply(poFeet, sIn);
+    EXPECT_NEAR(sFeet.dfX, 3.0, 1e-12);
+    EXPECT_NEAR(sFeet.dfZ, dfUndulation + 30.48, 1e-6);
+
+    // Only the height axis changes unit: eastings and northings stay metres.
+    CRSPtr poSurveyFeet(
+        utils::CreateCompoundCS(poUtm.get(), CS_VD_Ellipsoidal, LinearUnit::USSurveyFoot()));
+    MathTransformPtr poSurvey = Transform(poSurveyFeet, poWgs84);
+    ASSERT_TRUE(poSurvey);
+    const Point sSurvey = Apply(poSurvey, sIn);
+    EXPECT_NEAR(sSurvey.dfX, 3.0, 1e-12);
+    EXPECT_NEAR(sSurvey.dfY, 51.990665, 1e-6);
+    EXPECT_NEAR(sSurvey.dfZ, 100.0 * 1200.0 / 3937.0, 1e-9);
+
+    // Metres given explicitly are the default.
+    CRSPtr poMetreMsl(utils::CreateCompoundCS(poUtm.get(), CS_VD_Orthometric, LinearUnit::Metre()));
+    EXPECT_EQ(poMetreMsl->ExportToWkt(), Compound(poUtm, CS_VD_Orthometric)->ExportToWkt());
+
+    for (double dfBad : {0.0, -1.0, std::nan(""), std::numeric_limits<double>::infinity()}) {
+        EXPECT_THROW(LinearUnit("rod", dfBad), nova::ParameterException) << dfBad;
+    }
+    EXPECT_THROW(LinearUnit("", 1.0), nova::ParameterException);
+}
+
+TEST(CRS, KindsOfSystems) {
+    CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
+    CRSPtr poLonLat = CRSFromGeosys("LONG/LAT D000");
+    ASSERT_TRUE(poUtm && poLonLat);
+    EXPECT_TRUE(poUtm->IsProjected());
+    EXPECT_FALSE(poUtm->IsGeographic());
+    EXPECT_FALSE(poUtm->IsCompound());
+    EXPECT_EQ(poUtm->GetVerticalDatumType(), CS_VD_None);
+    EXPECT_NE(poUtm->GetName().find("UTM zone 31N"), std::string::npos) << poUtm->GetName();
+    EXPECT_TRUE(poLonLat->IsGeographic());
+    EXPECT_FALSE(poLonLat->IsProjected());
+    EXPECT_NE(poLonLat->ExportToProj4().find("+proj=longlat"), std::string::npos);
+
+    CRSPtr poMsl = Compound(poUtm, CS_VD_Orthometric);
+    EXPECT_TRUE(poMsl->IsCompound());
+    EXPECT_TRUE(poMsl->IsProjected());
+    EXPECT_EQ(poMsl->GetVerticalDatumType(), CS_VD_Orthometric);
+    EXPECT_NE(poMsl->ExportToWkt().find("COMPOUNDCRS"), std::string::npos);
+    EXPECT_NE(poMsl->ExportToWkt().find("EGM96 height"), std::string::npos);
+
+    CRSPtr poEll = Compound(poLonLat, CS_VD_Ellipsoidal);
+    EXPECT_TRUE(poEll->IsCompound());
+    EXPECT_TRUE(poEll->IsGeographic());
+    EXPECT_EQ(poEll->GetVerticalDatumType(), CS_VD_Ellipsoidal);
+
+    // A system that already has heights contributes its horizontal part.
+    CRSPtr poRebuilt = Compound(poMsl, CS_VD_Ellipsoidal);
+    EXPECT_TRUE(poRebuilt->IsProjected());
+    EXPECT_EQ(poRebuilt->GetVerticalDatumType(), CS_VD_Ellipsoidal);
+    EXPECT_EQ(poRebuilt->GetName(), poUtm->GetName());
+
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    EXPECT_TRUE(poWgs84->IsGeographic());
+    EXPECT_FALSE(poWgs84->IsCompound());
+    EXPECT_EQ(poWgs84->GetVerticalDatumType(), CS_VD_Ellipsoidal);
+    EXPECT_NE(poWgs84->ExportToWkt().find("4979"), std::string::npos);
+
+    // Definitions read back to the same system.
+    CRSPtr poCopy(utils::CreateCRSFromDefinition(poMsl->GetDefinition()));
+    EXPECT_EQ(poCopy->ExportToWkt(), poMsl->ExportToWkt());
+    EXPECT_TRUE(poCopy->IsCompound());
+    EXPECT_EQ(poCopy->GetVerticalDatumType(), CS_VD_Orthometric);
+    CRSPtr poFromWkt(utils::CreateCRSFromDefinition(poUtm->ExportToWkt()));
+    EXPECT_TRUE(poFromWkt->IsProjected());
+    CRSPtr poByNumber(nova::ogc::ProjectionEngine::GetCSAuthorityFactory(3)->CreateCRS("32631"));
+    EXPECT_EQ(poByNumber->ExportToWkt(), poUtm->ExportToWkt());
+}
+
+TEST(CRS, CloneAndRelease) {
+    CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
+    ASSERT_TRUE(poUtm);
+    nova::ogc::cs::ICRS* poRaw = utils::CreateCompoundCS(poUtm.get(), CS_VD_Orthometric);
+    // The horizontal system stays with its owner.
+    EXPECT_TRUE(poUtm->IsProjected());
+    CRSPtr poClone(poRaw->Clone());
+    ASSERT_NE(poClone.get(), poRaw);
+    EXPECT_EQ(poClone->GetName(), poRaw->GetName());
+    EXPECT_EQ(poClone->ExportToWkt(), poRaw->ExportToWkt());
+    EXPECT_EQ(poClone->GetDefinition(), poRaw->GetDefinition());
+    EXPECT_EQ(poClone->IsCompound(), poRaw->IsCompound());
+    EXPECT_EQ(poClone->GetVerticalDatumType(), poRaw->GetVerticalDatumType());
+    poRaw->Release();
+
+    // The clone lives on after the original is gone, and so does a
+    // transformation after both its systems are released.
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    MathTransformPtr poTransform = Transform(poClone, poWgs84);
+    ASSERT_TRUE(poTransform);
+    poClone.reset();
+    poWgs84.reset();
+    EXPECT_NEAR(Apply(poTransform, {500000.0, 5760000.0, 0.0}).dfZ, 44.0675, 0.5);
+}
+
+TEST(CRS, NullResults) {
+    const auto* poFactory = nova::ogc::ProjectionEngine::GetProjInfoFactory(3);
+    ASSERT_NE(poFactory, nullptr);
+    EXPECT_EQ(nova::ogc::ProjectionEngine::GetProjInfoFactory(1), nullptr);
+    EXPECT_EQ(nova::ogc::ProjectionEngine::GetCSAuthorityFactory(0), nullptr);
+    EXPECT_EQ(nova::ogc::ProjectionEngine::GetCSAuthorityFactory(4), nullptr);
+
+    ProjInfo_t sInfo{};
+    InitProjInfo(&sInfo, 1);  // PIXEL
+    EXPECT_EQ(poFactory->CreateCRS(sInfo), nullptr);
+    EXPECT_EQ(utils::ProjInfoToCRS(sInfo), nullptr);
+    InitProjInfo(&sInfo, 0);  // empty
+    EXPECT_EQ(utils::ProjInfoToCRS(sInfo), nullptr);
+    ASSERT_EQ(ProjStringToProjInfo("METRE", &sInfo), 0);
+    EXPECT_EQ(utils::ProjInfoToCRS(sInfo), nullptr);
+
+    // A local engineering grid has no relation to the earth.
+    CRSPtr poLocal(utils::CreateCRSFromDefinition(kLocalEngineering));
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    EXPECT_FALSE(poLocal->IsGeographic() || poLocal->IsProjected() || poLocal->IsCompound());
+    EXPECT_EQ(utils::CreateCRSTransform(poLocal.get(), poWgs84.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), poLocal.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(nullptr, poWgs84.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), nullptr, 0.0), nullptr);
+}
+
+// Expects a nova::ParameterException naming the parameter and quoting the
+// offending value.
+template <typename F>
+void ExpectParameterError(F fnCall, const std::string& osName, const std::string& osValue) {
+    try {
+        fnCall();
+        ADD_FAILURE() << "no exception for " << osValue;
+    } catch (const nova::ParameterException& e) {
+        EXPECT_EQ(e.GetParameterName(), osName);
+        EXPECT_NE(std::string(e.what()).find(osValue), std::string::npos) << e.what();
+    }
+}
+
+TEST(CRS, BadInputIsReported) {
+    const auto* poAuthority = nova::ogc::ProjectionEngine::GetCSAuthorityFactory(3);
+    for (const char* pszCode : {"EPSG:99999999", "garbage", "EPSG:", ":4326", "EPSG:6326", ""}) {
+        ExpectParameterError([&] { poAuthority->CreateCRS(pszCode); }, "osCode", pszCode);
+    }
+    for (const char* pszText : {"+proj=utm +zone=31", "no such thing", ""}) {
+        ExpectParameterError([&] { utils::CreateCRSFromDefinition(pszText); }, "osDefinition",
+                             pszText);
+    }
+
+    CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
+    CRSPtr poLocal(utils::CreateCRSFromDefinition(kLocalEngineering));
+    ExpectParameterError([&] { utils::CreateCompoundCS(nullptr, CS_VD_Orthometric); },
+                         "poHorizontal", "");
+    ExpectParameterError([&] { utils::CreateCompoundCS(poLocal.get(), CS_VD_Orthometric); },
+                         "poHorizontal", "Local grid");
+    ExpectParameterError(
+        [&] { utils::CreateCompoundCS(poUtm.get(), nova::ogc::cs::CS_VD_AltitudeBarometric); },
+        "eVertical", "2003");
+    ExpectParameterError(
+        [&] { utils::CreateCompoundCS(poUtm.get(), static_cast<nova::ogc::cs::DatumType>(7)); },
+        "eVertical", "7");
+    ExpectParameterError([&] { utils::CreateCRSTransform(poUtm.get(), poUtm.get(), -1.0); },
+                         "dfAccuracy", "-1");
+
+    // Points a transformation cannot take: failure, outputs untouched.
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    MathTransformPtr poGeoid =
+        Transform(Compound(CRSFromGeosys("LONG/LAT D000"), CS_VD_Orthometric), poWgs84);
+    MathTransformPtr poFromUtm = Transform(Compound(poUtm, CS_VD_Ellipsoidal), poWgs84);
+    ASSERT_TRUE(poGeoid && poFromUtm);
+    const double dfNaN = std::nan("");
+    const double dfInf = std::numeric_limits<double>::infinity();
+    const Point asBad[] = {
+        {dfNaN, 10.0, 0.0}, {10.0, dfInf, 0.0}, {10.0, 10.0, dfNaN}, {10.0, 95.0, 0.0}};
+    for (const Point& s : asBad) {
+        double dfX = -7.0, dfY = -8.0, dfZ = -9.0;
+        EXPECT_FALSE(poGeoid->TransformPoint(s.dfX, s.dfY, s.dfZ, dfX, dfY, dfZ)) << s.dfY;
+        EXPECT_EQ(dfX, -7.0);
+        EXPECT_EQ(dfY, -8.0);
+        EXPECT_EQ(dfZ, -9.0);
+    }
+    double dfX = -7.0, dfY = -8.0, dfZ = -9.0;
+    EXPECT_FALSE(poFromUtm->TransformPoint(1e30, 1e30, 0.0, dfX, dfY, dfZ));
+    EXPECT_EQ(dfX, -7.0);
+}
+
+// With the geoid model absent, a transformation between geoid and
+// ellipsoidal heights is refused instead of copying heights unchanged.
+TEST(CRS, MissingGeoidModelGivesNoTransform) {
+    const std::filesystem::path oDatabase = "/usr/share/proj/proj.db";
+    if (!std::filesystem::exists(oDatabase)) GTEST_SKIP() << "no " << oDatabase;
+    const char* pszSavedData = std::getenv("PROJ_DATA");
+    const std::string osSaved = pszSavedData != nullptr ? pszSavedData : "";
+    const std::filesystem::path oDir =
+        std::filesystem::temp_directory_path() / ("lumo_crs_nogeoid_" + std::to_string(getpid()));
+    std::filesystem::create_directories(oDir);
+    std::filesystem::create_symlink(oDatabase, oDir / "proj.db");
+    setenv("PROJ_DATA", oDir.c_str(), 1);
+
+    bool bOrthometric = true;
+    bool bEllipsoidal = false;
+    // A new thread makes a new PROJ context, which reads the search path.
+    std::thread oWorker([&] {
+        CRSPtr poLonLat(utils::CreateCRSFromDefinition("EPSG:4326"));
+        CRSPtr poWgs84 = WGS84Ellipsoidal();
+        bOrthometric = static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Orthometric), poWgs84));
+        bEllipsoidal = static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Ellipsoidal), poWgs84));
+    });
+    oWorker.join();
+
+    if (pszSavedData != nullptr) {
+        setenv("PROJ_DATA", osSaved.c_str(), 1);
+    } else {
+        unsetenv("PROJ_DATA");
+    }
+    std::filesystem::remove_all(oDir);
+    EXPECT_FALSE(bOrthometric);
+    EXPECT_TRUE(bEllipsoidal);
+}
+
+TEST(CRS, ConcurrentTransforms) {
+    CRSPtr poShared = Compound(CRSFromGeosys("UTM 31 D000"), CS_VD_Orthometric);
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    ASSERT_TRUE(poShared && poWgs84);
+    constexpr int kThreads = 4;
+    constexpr int kPoints = 400;
+    auto fnPoint = [](int i) {
+        return Point{400000.0 + 500.0 * i, 5000000.0 + 3000.0 * i, 10.0 * (i % 17)};
+    };
+    std::vector<Point> asExpected;
+    {
+        MathTransformPtr poReference = Transform(poShared, poWgs84);
+        ASSERT_TRUE(poReference);
+        for (int i = 0; i < kPoints; ++i) asExpected.push_back(Apply(poReference, fnPoint(i)));
+    }
+
+    // Each thread makes its own transformation from the one shared system.
+    std::vector<int> anMismatches(kThreads, -1);
+    std::vector<std::thread> aoThreads;
+    aoThreads.reserve(kThreads);
+    for (int t = 0; t < kThreads; ++t) {
+        aoThreads.emplace_back([&, t] {
+            MathTransformPtr poOwn(utils::CreateCRSTransform(poShared.get(), poWgs84.get(), 0.0));
+            if (!poOwn) return;
+            int nBad = 0;
+            for (int i = 0; i < kPoints; ++i) {
+                Point s = fnPoint(i);
+                if (!poOwn->TransformPoint(s.dfX, s.dfY, s.dfZ, s.dfX, s.dfY, s.dfZ) ||
+                    s.dfX != asExpected[i].dfX || s.dfY != asExpected[i].dfY ||
+                    s.dfZ != asExpected[i].dfZ) {
+                    ++nBad;
+                }
+            }
+            anMismatches[t] = nBad;
+        });
+    }
+    for (auto& o : aoThreads) o.join();
+    for (int t = 0; t < kThreads; ++t) EXPECT_EQ(anMismatches[t], 0) << "thread " << t;
+
+    // One transformation shared by all threads.
+    MathTransformPtr poOneTransform = Transform(poShared, poWgs84);
+    ASSERT_TRUE(poOneTransform);
+    aoThreads.clear();
+    std::vector<int> anSharedMismatches(kThreads, -1);
+    for (int t = 0; t < kThreads; ++t) {
+        aoThreads.emplace_back([&, t] {
+            int nBad = 0;
+            // Each thread starts elsewhere, so that calls interleave.
+            for (int k = 0; k < kPoints; ++k) {
+                const int i = (k + t * kPoints / kThreads) % kPoints;
+                Point s = fnPoint(i);
+                if (!poOneTransform->TransformPoint(s.dfX, s.dfY, s.dfZ, s.dfX, s.dfY, s.dfZ) ||
+                    s.dfX != asExpected[i].dfX || s.dfY != asExpected[i].dfY ||
+                    s.dfZ != asExpected[i].dfZ) {
+                    ++nBad;
+                }
+            }
+            anSharedMismatches[t] = nBad;
+        });
+    }
+    for (auto& o : aoThreads) o.join();
+    for (int t = 0; t < kThreads; ++t) EXPECT_EQ(anSharedMismatches[t], 0) << "thread " << t;
+}
+
+}  // namespace

@@ -1,0 +1,648 @@
+// Projection descriptions: grammar, records, parameter texts, ellipsoids and
+// reprojection against published and independently computed coordinates.
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <random>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "../host/src/proj_definition.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+constexpr double kPi = 3.14159265358979323846;
+constexpr double kFtUS = 1200.0 / 3937.0;
+
+// Bit-for-bit equality of two objects (records must stay untouched on
+// failure, parameters must survive exactly).
+bool SameBytes(const void* pA, const void* pB, std::size_t nBytes) {
+    const auto* pabyA = static_cast<const unsigned char*>(pA);
+    const auto* pabyB = static_cast<const unsigned char*>(pB);
+    for (std::size_t i = 0; i < nBytes; ++i) {
+        if (pabyA[i] != pabyB[i]) return false;
+    }
+    return true;
+}
+
+// Address of a temporary description, valid for the full expression.
+const ProjInfo_t* Ptr(const ProjInfo_t& sInfo) {
+    return &sInfo;
+}
+
+ProjInfo_t Make(const char* pszText) {
+    ProjInfo_t sInfo;
+    InitProjInfo(&sInfo, 0);
+    EXPECT_EQ(Geosys2ProjInfo(&sInfo, pszText, 0.0, 0.0, 1.0, 1.0), 0) << pszText;
+    return sInfo;
+}
+
+// Collects numbered warnings while alive.
+class WarningCapture {
+  public:
+    WarningCapture() {
+        moPrevious = nova::SetErrorSink(
+            [this](const nova::ErrorReport& sReport) { maoReports.push_back(sReport); });
+    }
+    ~WarningCapture() { nova::SetErrorSink(moPrevious); }
+    std::vector<nova::ErrorReport> maoReports;
+
+  private:
+    nova::ErrorSink moPrevious;
+};
+
+// Meridian arc length from the equator, by Simpson integration (independent
+// of any projection library).
+double MeridianArc(double dfA, double dfB, double dfLatDeg) {
+    const double dfE2 = (dfA * dfA - dfB * dfB) / (dfA * dfA);
+    const double dfPhi = dfLatDeg * kPi / 180.0;
+    const int nSteps = 20000;
+    const double dfH = dfPhi / nSteps;
+    double dfSum = 0.0;
+    for (int i = 0; i <= nSteps; ++i) {
+        const double s = std::sin(i * dfH);
+        const double f = dfA * (1 - dfE2) / std::pow(1 - dfE2 * s * s, 1.5);
+        dfSum += f * (i == 0 || i == nSteps ? 1 : (i % 2 ? 4 : 2));
+    }
+    return dfSum * dfH / 3.0;
+}
+
+// Geocentric translation between two ellipsoids, computed directly.
+void HelmertShift(double dfLon, double dfLat, double dfA1, double dfB1, double dfTx, double dfTy,
+                  double dfTz, double dfA2, double dfB2, double* pdfLon, double* pdfLat) {
+    const double e1 = (dfA1 * dfA1 - dfB1 * dfB1) / (dfA1 * dfA1);
+    const double phi = dfLat * kPi / 180.0;
+    const double lam = dfLon * kPi / 180.0;
+    const double n = dfA1 / std::sqrt(1 - e1 * std::sin(phi) * std::sin(phi));
+    const double x = n * std::cos(phi) * std::cos(lam) + dfTx;
+    const double y = n * std::cos(phi) * std::sin(lam) + dfTy;
+    const double z = n * (1 - e1) * std::sin(phi) + dfTz;
+    const double e2 = (dfA2 * dfA2 - dfB2 * dfB2) / (dfA2 * dfA2);
+    const double p = std::hypot(x, y);
+    double lat = std::atan2(z, p * (1 - e2));
+    for (int i = 0; i < 20; ++i) {
+        const double nn = dfA2 / std::sqrt(1 - e2 * std::sin(lat) * std::sin(lat));
+        const double h = p / std::cos(lat) - nn;
+        lat = std::atan2(z, p * (1 - e2 * nn / (nn + h)));
+    }
+    *pdfLon = std::atan2(y, x) * 180.0 / kPi;
+    *pdfLat = lat * 180.0 / kPi;
+}
+
+constexpr double kWgsA = 6378137.0;
+constexpr double kWgsB = 6356752.314245179;
+constexpr double kMetresPerDegree = 111319.49;  // at the equator, to turn degrees into metres
+
+}  // namespace
+
+TEST(ProjectionGrammar, NormalisesKnownTextsAndReturnsKinds) {
+    struct Case {
+        const char* pszIn;
+        int nKind;
+        const char* pszOut;
+    };
+    const Case aCases[] = {
+        {"LONG/LAT D000", NOVA_PROJ_GEOGRAPHIC, "LONG/LAT D000"},
+        {"LON D0", NOVA_PROJ_GEOGRAPHIC, "LON D000"},
+        {"  long\t  e8 ", NOVA_PROJ_GEOGRAPHIC, "LONG E008"},
+        {"long/lat", NOVA_PROJ_GEOGRAPHIC, "LONG/LAT"},
+        {"PIXEL", NOVA_PROJ_PIXEL, "PIXEL"},
+        {"meter", NOVA_PROJ_METRE, "METRE"},
+        {"METRE", NOVA_PROJ_METRE, "METRE"},
+        {"UTM 31 U D000", NOVA_PROJ_UTM, "UTM 31 U D000"},
+        {"utm 05 c e3", NOVA_PROJ_UTM, "UTM 5 C E003"},
+        {"UTM 1", NOVA_PROJ_UTM, "UTM 1"},
+        {"UTM 60 X D011", NOVA_PROJ_UTM, "UTM 60 X D011"},
+        {"UTM 33 S D001", NOVA_PROJ_UTM, "UTM 33 S D001"},
+        {"tm d3", NOVA_PROJ_TM, "TM D003"},
+        {"LCC", NOVA_PROJ_LCC, "LCC"},
+        {"PS E019", NOVA_PROJ_PS, "PS E019"},
+        {"MER D7", NOVA_PROJ_MER, "MER D007"},
+    };
+    for (const Case& c : aCases) {
+        char szOut[20] = "garbage";
+        EXPECT_EQ(DecodeGeosys(c.pszIn, szOut), c.nKind) << c.pszIn;
+        EXPECT_STREQ(szOut, c.pszOut) << c.pszIn;
+        EXPECT_EQ(DecodeGeosys(c.pszIn, nullptr), c.nKind);
+        // Normalising again changes nothing; in place works.
+        char szInPlace[20];
+        std::strcpy(szInPlace, c.pszIn);
+        EXPECT_EQ(DecodeGeosys(szInPlace, szInPlace), c.nKind);
+        EXPECT_STREQ(szInPlace, c.pszOut);
+    }
+    // The library's own prefix tests keep working on normalised texts.
+    char szText[20] = "lon d0";
+    DecodeGeosys(szText, szText);
+    EXPECT_EQ(std::strncmp(szText, "LON", 3), 0);
+}
+
+TEST(ProjectionGrammar, RejectsMalformedTextsWithoutOverflow) {
+    const char* apszBad[] = {"",           "   ",
+                             "UTM",        "UTM 0",
+                             "UTM 61",     "UTM -3",
+                             "UTM 31 I",   "UTM 31 O",
+                             "UTM 31 UU",  "UTM 31 U D000 X",
+                             "FOO",        "LONG D999",
+                             "LONG E20",   "LONG D0000",
+                             "LONG D",     "PIXEL D000",
+                             "METRE E012", "LONG/LAT D000 D000",
+                             "UTM 1000",   "LON D0x"};
+    WarningCapture oCapture;
+    for (const char* pszBad : apszBad) {
+        char szOut[20] = "untouched";
+        EXPECT_EQ(DecodeGeosys(pszBad, szOut), NOVA_PROJ_UNKNOWN) << pszBad;
+        EXPECT_STREQ(szOut, "") << pszBad;
+        ProjInfo_t sInfo = Make("UTM 31 U D000");
+        const ProjInfo_t sBefore = sInfo;
+        EXPECT_LT(Geosys2ProjInfo(&sInfo, pszBad, 0.0, 0.0, 1.0, 1.0), 0) << pszBad;
+        EXPECT_TRUE(SameBytes(&sInfo, &sBefore, sizeof(sInfo))) << "record changed: " << pszBad;
+    }
+    EXPECT_EQ(DecodeGeosys(nullptr, nullptr), NOVA_PROJ_UNKNOWN);
+    ProjInfo_t sInfo;
+    EXPECT_LT(Geosys2ProjInfo(&sInfo, nullptr, 0, 0, 1, 1), 0);
+    EXPECT_LT(Geosys2ProjInfo(nullptr, "LON D0", 0, 0, 1, 1), 0);
+    EXPECT_LT(Geosys2ProjInfo(&sInfo, "LON D0", NAN, 0, 1, 1), 0);
+
+    // Unknown earth models are reported as such, other faults as GCP units.
+    bool bEarth = false;
+    bool bUnit = false;
+    for (const auto& r : oCapture.maoReports) {
+        EXPECT_EQ(r.nCode, 32);
+        EXPECT_FALSE(r.bFatal);
+        bEarth |= r.osText.find("Earth model") != std::string::npos &&
+                  r.osText.find("LONG D999") != std::string::npos;
+        bUnit |= r.osText.find("GCP Unit") != std::string::npos;
+    }
+    EXPECT_TRUE(bEarth);
+    EXPECT_TRUE(bUnit);
+
+    // Very long texts, valid prefix or not, are refused.
+    std::string osLong = "UTM 31 U D000" + std::string(100000, ' ') + "X";
+    char szOut[20];
+    EXPECT_EQ(DecodeGeosys(osLong.c_str(), szOut), NOVA_PROJ_UNKNOWN);
+    std::string osHuge(100000, 'A');
+    EXPECT_EQ(DecodeGeosys(osHuge.c_str(), szOut), NOVA_PROJ_UNKNOWN);
+    EXPECT_LT(Geosys2ProjInfo(&sInfo, osHuge.c_str(), 0, 0, 1, 1), 0);
+    for (const auto& r : oCapture.maoReports) EXPECT_LT(r.osText.size(), 400u);
+}
+
+TEST(ProjectionRecord, FillsFieldsFromText) {
+    ProjInfo_t sInfo;
+    InitProjInfo(&sInfo, 1);
+    EXPECT_STREQ(sInfo.szProj, "PIXEL");
+    InitProjInfo(&sInfo, 0);
+    EXPECT_STREQ(sInfo.szProj, "");
+    EXPECT_EQ(sInfo.nSpheroid, -1);
+
+    ASSERT_EQ(Geosys2ProjInfo(&sInfo, "utm 33 s d1", 10.0, 20.0, 30.0, -40.0), 0);
+    EXPECT_STREQ(sInfo.szProj, "UTM 33 S D001");
+    EXPECT_EQ(sInfo.nZone, 33);  // band S lies in the northern hemisphere
+    EXPECT_EQ(sInfo.nProjKind, NOVA_PROJ_UTM);
+    EXPECT_EQ(sInfo.nDatum, 1);
+    EXPECT_EQ(sInfo.nSpheroid, 0);
+    EXPECT_EQ(sInfo.nEarthModelKind, NOVA_EARTH_DATUM);
+    EXPECT_EQ(sInfo.dfXOffset, 10.0);
+    EXPECT_EQ(sInfo.dfYScale, -40.0);
+    EXPECT_EQ(Make("UTM 33 M D000").nZone, -33);
+    EXPECT_EQ(Make("UTM 33 C").nZone, -33);
+    EXPECT_EQ(Make("UTM 33 N").nZone, 33);
+    EXPECT_EQ(Make("LONG E008").nEarthModelKind, NOVA_EARTH_ELLIPSOID);
+    EXPECT_EQ(Make("LONG/LAT").nEarthModelKind, NOVA_EARTH_DEFAULT);
+    EXPECT_EQ(Make("LONG/LAT").nSpheroid, 12);
+
+    EXPECT_EQ(ProjStringToProjInfo("PIXEL", &sInfo), 0);
+    EXPECT_EQ(sInfo.nProjKind, NOVA_PROJ_PIXEL);
+    EXPECT_EQ(ProjStringToProjInfo("NOPE", &sInfo), -1);
+    EXPECT_EQ(ProjStringToProjInfo("PIXEL", nullptr), -1);
+
+    EXPECT_EQ(RequiresProjInfo(NOVA_PROJ_TM), 1);
+    EXPECT_EQ(RequiresProjInfo(NOVA_PROJ_MER), 1);
+    EXPECT_EQ(RequiresProjInfo(NOVA_PROJ_UTM), 0);
+    EXPECT_EQ(RequiresProjInfo(NOVA_PROJ_GEOGRAPHIC), 0);
+    EXPECT_EQ(RequiresProjInfo(99), 0);
+    for (const char* p : {"UTM 31 D000", "TM", "LCC D001", "PS", "MER", "METRE"}) {
+        EXPECT_EQ(IsConformal(p), 1) << p;
+    }
+    for (const char* p : {"LONG/LAT D000", "LON", "PIXEL", "", "XYZ"}) EXPECT_EQ(IsConformal(p), 0);
+    EXPECT_EQ(IsConformal(nullptr), 0);
+}
+
+TEST(ProjectionEllipsoids, CodesBothWaysAndDatumTable) {
+    const double adfExpected[20][2] = {
+        {6378206.4, 6356583.8},       {6378249.145, 6356514.86955}, {6377397.155, 6356078.96284},
+        {6378157.5, 6356772.2},       {6378388.0, 6356911.94613},   {6378135.0, 6356750.519915},
+        {6377276.3452, 6356075.4133}, {6378145.0, 6356759.769356},  {6378137.0, 6356752.31414},
+        {6377563.396, 6356256.91},    {6377304.063, 6356103.039},   {6377340.189, 6356034.448},
+        {6378137.0, 6356752.314245},  {6378155.0, 6356773.3205},    {6378160.0, 6356774.719},
+        {6378245.0, 6356863.0188},    {6378270.0, 6356794.343479},  {6378166.0, 6356784.283666},
+        {6378150.0, 6356768.337303},  {6370997.0, 6370997.0}};
+    for (int i = 0; i < 20; ++i) {
+        char szCode[8];
+        std::snprintf(szCode, sizeof(szCode), "E%03d", i);
+        int nIndex = -5;
+        double a = 0, b = 0;
+        ASSERT_TRUE(GetEllipsoidData(szCode, &nIndex, &a, &b)) << szCode;
+        EXPECT_EQ(nIndex, i);
+        EXPECT_EQ(a, adfExpected[i][0]);
+        EXPECT_EQ(b, adfExpected[i][1]);
+        EXPECT_EQ(EllipsoidInfoList::GetEllipsoidCode(a, b), szCode);
+        EXPECT_EQ(EllipsoidInfoList::GetEllipsoidCode(a + 0.0009, b), szCode);
+        EXPECT_EQ(EllipsoidInfoList::GetEllipsoidCode(NAN, b), "");
+        EXPECT_EQ(EllipsoidInfoList::GetEllipsoidCode(a + 0.002, b), "");
+    }
+    // The datum table: numbers, EPSG equivalents and ellipsoids.
+    struct DatumCase {
+        const char* pszCode;
+        int nSpheroid;
+        const char* pszDefinition;
+    };
+    for (const DatumCase& c : {DatumCase{"D000", 12, "EPSG:4326"},
+                               {"D001", 0, "EPSG:4267"},
+                               {"D002", 8, "EPSG:4269"},
+                               {"D003", 4, "EPSG:4230"},
+                               {"D005", 9, "EPSG:4277"},
+                               {"D007", 15, "EPSG:4284"}}) {
+        int nIndex = -1;
+        double a = 0, b = 0;
+        ASSERT_TRUE(GetEllipsoidData(c.pszCode, &nIndex, &a, &b)) << c.pszCode;
+        EXPECT_EQ(nIndex, c.nSpheroid) << c.pszCode;
+        const ProjInfo_t sInfo = Make((std::string("LONG ") + c.pszCode).c_str());
+        EXPECT_EQ(nova::detail::ProjInfoToProjDefinition(sInfo), c.pszDefinition);
+    }
+    int nIndex = -1;
+    double a = 0, b = 0;
+    EXPECT_TRUE(GetEllipsoidData("D0", &nIndex, &a, &b));
+    EXPECT_EQ(nIndex, 12);
+    EXPECT_TRUE(GetEllipsoidData("UTM 31 U D001", &nIndex, &a, &b));
+    EXPECT_EQ(nIndex, 0);
+    EXPECT_TRUE(GetEllipsoidData("LONG/LAT", &nIndex, nullptr, nullptr));
+    EXPECT_EQ(nIndex, 12);
+    EXPECT_FALSE(GetEllipsoidData("D999", &nIndex, &a, &b));
+    EXPECT_FALSE(GetEllipsoidData("E20", &nIndex, &a, &b));
+    EXPECT_FALSE(GetEllipsoidData("X1", &nIndex, &a, &b));
+    EXPECT_FALSE(GetEllipsoidData(nullptr, &nIndex, &a, &b));
+
+    // Earth-model codes of descriptions, usable behind "LONG %s".
+    char szModel[16];
+    EXPECT_EQ(GetEarthModel(Ptr(Make("UTM 31 U D003")), szModel), 0);
+    EXPECT_STREQ(szModel, "D003");
+    EXPECT_EQ(GetEarthModel(Ptr(Make("LON E8")), szModel), 0);
+    EXPECT_STREQ(szModel, "E008");
+    EXPECT_EQ(GetEarthModel(Ptr(Make("METRE")), szModel), 0);
+    EXPECT_STREQ(szModel, "D000");
+    ProjInfo_t sCustom = Make("TM");
+    sCustom.nEarthModelKind = NOVA_EARTH_SPHEROID_PARMS;
+    sCustom.nSpheroid = 5;
+    EXPECT_EQ(GetEarthModel(&sCustom, szModel), 0);
+    EXPECT_STREQ(szModel, "E005");
+    sCustom.adfProjParms[0] = 6400000.0;
+    sCustom.adfProjParms[1] = 6390000.0;
+    EXPECT_EQ(GetEarthModel(&sCustom, szModel), -1);
+    EXPECT_STREQ(szModel, "");
+    EXPECT_EQ(GetEarthModel(nullptr, szModel), -1);
+}
+
+TEST(ProjectionParms, TextRoundTripsExactlyWithinBound) {
+    ProjInfo_t sInfo = Make("TM D005");
+    sInfo.adfProjParms[2] = 0.9996012717;
+    sInfo.adfProjParms[4] = -2000000.0;
+    sInfo.adfProjParms[5] = 49000000.0;
+    sInfo.adfProjParms[6] = 400000.0;
+    sInfo.adfProjParms[7] = -100000.0;
+    char* pszText = ProjInfo2Parms(&sInfo);
+    ASSERT_NE(pszText, nullptr);
+    EXPECT_STREQ(pszText, "GCTP 9 1 2:0.9996012717 4:-2000000 5:49000000 6:400000 7:-100000");
+    ProjInfo_t sCopy = Make("TM D005");
+    EXPECT_EQ(ProjParms2Info(pszText, &sCopy), 0);
+    EXPECT_TRUE(SameBytes(&sCopy, &sInfo, sizeof(sInfo)));
+    std::free(pszText);
+
+    // Arbitrary bit patterns (huge, tiny, subnormal, negative zero) survive
+    // exactly and the text stays within 255 characters.
+    std::mt19937_64 oRandom(42);
+    for (int nTrial = 0; nTrial < 2000; ++nTrial) {
+        ProjInfo_t sSource = Make("LCC");
+        for (double& dfValue : sSource.adfProjParms) {
+            do {
+                const std::uint64_t nBits = oRandom();
+                std::memcpy(&dfValue, &nBits, 8);
+            } while (!std::isfinite(dfValue));
+            if (oRandom() % 4 == 0) dfValue = 0.0;
+            if (oRandom() % 16 == 0) dfValue = -0.0;
+            if (oRandom() % 4 == 0) dfValue = static_cast<double>(oRandom() % 100000000) / 7.0;
+        }
+        sSource.nEarthModelKind = NOVA_EARTH_SPHEROID_PARMS;
+        sSource.nSpheroid = static_cast<int>(oRandom() % 20);
+        char* pszParms = ProjInfo2Parms(&sSource);
+        ASSERT_LE(std::strlen(pszParms), 255u);
+        ProjInfo_t sTarget = Make("LCC");
+        ASSERT_EQ(ProjParms2Info(pszParms, &sTarget), 0) << pszParms;
+        EXPECT_TRUE(SameBytes(sTarget.adfProjParms, sSource.adfProjParms, sizeof(double) * 15))
+            << pszParms;
+        EXPECT_EQ(sTarget.nSpheroid, sSource.nSpheroid);
+        EXPECT_EQ(sTarget.nEarthModelKind, NOVA_EARTH_SPHEROID_PARMS);
+        std::free(pszParms);
+    }
+
+    // Malformed texts fail and leave the record as it was.
+    const ProjInfo_t sBefore = sInfo;
+    const std::string osTooLong = "GCTP 12 0 0:1" + std::string(300, ' ');
+    for (const char* pszBad :
+         {"", "GCTP", "GCTP 12", "GCTP 20 0", "GCTP 12 4", "GCTP 12 0 15:1", "GCTP 12 0 1:2 1:3",
+          "GCTP 12 0 1:nan", "GCTP 12 0 1:inf", "GCTP 12 0 1:", "GCTP 12 0 1:2x", "XGCTP 12 0",
+          "GCTP 12 0 #AAAA", "GCTP 12 0 1:1e999", osTooLong.c_str()}) {
+        EXPECT_EQ(ProjParms2Info(pszBad, &sInfo), -1) << pszBad;
+        EXPECT_TRUE(SameBytes(&sInfo, &sBefore, sizeof(sInfo))) << pszBad;
+    }
+    EXPECT_EQ(ProjParms2Info(nullptr, &sInfo), -1);
+    EXPECT_EQ(ProjParms2Info("GCTP 12 0", nullptr), -1);
+    // A null description still gives a valid text.
+    char* pszEmpty = ProjInfo2Parms(nullptr);
+    EXPECT_STREQ(pszEmpty, "GCTP -1 0");
+    std::free(pszEmpty);
+}
+
+TEST(ProjectionAngles, PackedDmsAndUtmZones) {
+    double dfDeg = 0.0;
+    ASSERT_EQ(PackedDMSToDegrees(45030015.5, &dfDeg), 0);
+    EXPECT_NEAR(dfDeg, 45.0 + 30.0 / 60.0 + 15.5 / 3600.0, 1e-12);
+    ASSERT_EQ(PackedDMSToDegrees(-99000000.0, &dfDeg), 0);
+    EXPECT_EQ(dfDeg, -99.0);
+    EXPECT_EQ(PackedDMSToDegrees(45060000.0, &dfDeg), -1);  // 60 minutes
+    EXPECT_EQ(PackedDMSToDegrees(45000060.0, &dfDeg), -1);  // 60 seconds
+    EXPECT_EQ(PackedDMSToDegrees(NAN, &dfDeg), -1);
+    EXPECT_EQ(DegreesToPackedDMS(-3.5), -3030000.0);
+    EXPECT_EQ(DegreesToPackedDMS(59.99999999999), 60000000.0);  // carries into degrees
+    for (double d : {0.0, 12.345678, -77.777, 179.999999, 89.5}) {
+        ASSERT_EQ(PackedDMSToDegrees(DegreesToPackedDMS(d), &dfDeg), 0);
+        EXPECT_NEAR(dfDeg, d, 1e-10);
+    }
+
+    struct ZoneCase {
+        double dfLon, dfLat;
+        int nZone;
+        char cRow;
+    };
+    for (const ZoneCase& c : {ZoneCase{3, 50, 31, 'U'},
+                              {-75, 40, 18, 'T'},
+                              {180, 0, 60, 'N'},
+                              {-180, -0.5, 1, 'M'},
+                              {540, 10, 60, 'P'},
+                              {5, 60, 32, 'V'},
+                              {10, 78, 33, 'X'},
+                              {0, -85, 31, 'Z'},
+                              {0, 84, 31, 'X'},
+                              {-0.0001, -80, 30, 'C'}}) {
+        int nZone = 0;
+        char cRow = '?';
+        EXPECT_EQ(UTMZone(c.dfLon, c.dfLat, &nZone, &cRow), 0);
+        EXPECT_EQ(nZone, c.nZone) << c.dfLon << " " << c.dfLat;
+        EXPECT_EQ(cRow, c.cRow) << c.dfLon << " " << c.dfLat;
+    }
+    int nZone = 7;
+    EXPECT_EQ(UTMZone(NAN, 10, &nZone, nullptr), -1);
+    EXPECT_EQ(nZone, 0);
+    EXPECT_EQ(UTMZone(10, 90.5, &nZone, nullptr), -1);
+    EXPECT_EQ(UTMZone(INFINITY, 0, nullptr, nullptr), -1);
+}
+
+namespace {
+
+ProjInfo_t WithParms(const char* pszText, std::initializer_list<std::pair<int, double>> aParms) {
+    ProjInfo_t sInfo = Make(pszText);
+    for (const auto& p : aParms) sInfo.adfProjParms[p.first] = p.second;
+    return sInfo;
+}
+
+void ExpectForward(const ProjInfo_t& sGeo, double dfLon, double dfLat, const ProjInfo_t& sProj,
+                   double dfE, double dfN, double dfTol) {
+    double x = 0, y = 0;
+    ASSERT_EQ(GCTPTransform(&sGeo, dfLon, dfLat, &sProj, &x, &y), 0) << sProj.szProj;
+    EXPECT_NEAR(x, dfE, dfTol) << sProj.szProj;
+    EXPECT_NEAR(y, dfN, dfTol) << sProj.szProj;
+    // And back to within 1 mm.
+    double dfLon2 = 0, dfLat2 = 0;
+    ASSERT_EQ(GCTPTransform(&sProj, x, y, &sGeo, &dfLon2, &dfLat2), 0);
+    EXPECT_NEAR((dfLon2 - dfLon) * kMetresPerDegree * std::cos(dfLat * kPi / 180), 0, 1e-3);
+    EXPECT_NEAR((dfLat2 - dfLat) * kMetresPerDegree, 0, 1e-3);
+}
+
+}  // namespace
+
+TEST(ProjectionTransform, PublishedExamplesAndIndependentValues) {
+    // EPSG worked examples (published to 1 cm, or 0.01 US survey foot).
+    ExpectForward(
+        Make("LONG D005"), 0.5, 50.5,
+        WithParms(
+            "TM D005",
+            {{2, 0.9996012717}, {4, -2000000.0}, {5, 49000000.0}, {6, 400000.0}, {7, -100000.0}}),
+        577274.98, 69740.49, 0.006);
+    ExpectForward(Make("LONG D001"), -96.0, 28.5,
+                  WithParms("LCC D001", {{2, 28023000.0},
+                                         {3, 30017000.0},
+                                         {4, -99000000.0},
+                                         {5, 27050000.0},
+                                         {6, 2000000.0 * kFtUS}}),
+                  2963503.91 * kFtUS, 254759.80 * kFtUS, 0.006 * kFtUS + 0.001);
+    ExpectForward(Make("LONG D007"), 53.0, 53.0,
+                  WithParms("MER D007", {{4, 51000000.0}, {5, 42000000.0}}), 165704.29, 5171848.07,
+                  0.006);
+    ExpectForward(Make("LONG/LAT D000"), 120.0, -75.0,
+                  WithParms("PS D000", {{4, 70000000.0}, {5, -71000000.0}, {6, 6e6}, {7, 6e6}}),
+                  7255380.79, 7053389.56, 0.006);
+
+    // UTM on the central meridian: easting 500 km, northing 0.9996 times the
+    // meridian arc (integrated here), false northing 10000 km in the south.
+    const double dfArc50 = 0.9996 * MeridianArc(kWgsA, kWgsB, 50.0);
+    ExpectForward(Make("LONG/LAT D000"), 3.0, 50.0, Make("UTM 31 U D000"), 500000.0, dfArc50, 1e-3);
+    ExpectForward(Make("LONG/LAT D000"), 3.0, -50.0, Make("UTM 31 F D000"), 500000.0, 1e7 - dfArc50,
+                  1e-3);
+    ExpectForward(Make("LONG D001"), -75.0, 40.0, Make("UTM 18 T D001"), 500000.0,
+                  0.9996 * MeridianArc(6378206.4, 6356583.8, 40.0), 1e-3);
+    ExpectForward(Make("LON E015"), 27.0, 60.0, Make("UTM 35 E015"), 500000.0,
+                  0.9996 * MeridianArc(6378245.0, 6356863.0188, 60.0), 1e-3);
+    // GCTP's own earth model: spheroid code and parameters.
+    ProjInfo_t sKind3 = Make("UTM 18");
+    sKind3.nEarthModelKind = NOVA_EARTH_SPHEROID_PARMS;
+    sKind3.nSpheroid = 0;
+    ExpectForward(Make("LONG E000"), -75.0, 40.0, sKind3, 500000.0,
+                  0.9996 * MeridianArc(6378206.4, 6356583.8, 40.0), 1e-3);
+    sKind3.adfProjParms[0] = 6378137.0;
+    sKind3.adfProjParms[1] = 0.0066943799901413165;  // WGS 84 e^2
+    ExpectForward(Make("LONG E012"), -75.0, 40.0, sKind3, 500000.0,
+                  0.9996 * MeridianArc(kWgsA, kWgsB, 40.0), 1e-3);
+    sKind3.adfProjParms[1] = -1.0;
+    double x = 0, y = 0;
+    // An unusable earth model fails even against itself.
+    EXPECT_NE(GCTPTransform(&sKind3, 500000, 0, &sKind3, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(Ptr(Make("LONG E012")), -75, 40, &sKind3, &x, &y), 0);
+}
+
+TEST(ProjectionTransform, RoundTripsOverGrids) {
+    const ProjInfo_t sGeo = Make("LONG/LAT D000");
+    const ProjInfo_t aProjected[] = {
+        Make("UTM 31 U D000"), Make("UTM 31 E003"),
+        WithParms("TM E012", {{2, 0.9999}, {4, 5030000.0}, {6, 3e5}, {7, -5e6}}),
+        WithParms("LCC D000", {{2, 45000000.0},
+                               {3, 49000000.0},
+                               {4, 3000000.0},
+                               {5, 46030000.0},
+                               {6, 7e5},
+                               {7, 6.6e6}}),
+        WithParms("MER E012", {{4, 10000000.0}, {5, 20000000.0}})};
+    for (const ProjInfo_t& sProj : aProjected) {
+        for (double dfLat = 40.0; dfLat <= 56.0; dfLat += 4.0) {
+            for (double dfLon = -1.0; dfLon <= 9.0; dfLon += 2.5) {
+                double x = 0, y = 0, lon = 0, lat = 0;
+                ASSERT_EQ(GCTPTransform(&sGeo, dfLon, dfLat, &sProj, &x, &y), 0) << sProj.szProj;
+                ASSERT_EQ(GCTPTransform(&sProj, x, y, &sGeo, &lon, &lat), 0);
+                EXPECT_NEAR(lon, dfLon, 1e-8) << sProj.szProj;
+                EXPECT_NEAR(lat, dfLat, 1e-8) << sProj.szProj;
+                double x2 = 0, y2 = 0;
+                ASSERT_EQ(GCTPTransform(&sGeo, lon, lat, &sProj, &x2, &y2), 0);
+                EXPECT_NEAR(x2, x, 1e-3);
+                EXPECT_NEAR(y2, y, 1e-3);
+            }
+        }
+    }
+    // Projected to projected across zones, and the text interface.
+    double x = 0, y = 0, x2 = 0, y2 = 0;
+    char szFrom[] = "UTM 31 U D000";
+    char szTo[] = "UTM 32 U D000";
+    char szGeo[] = "LONG/LAT D000";
+    ASSERT_EQ(GCTPSimpleTransform(szFrom, 700000, 5500000, szTo, &x, &y), 0);
+    double lon = 0, lat = 0;
+    ASSERT_EQ(GCTPSimpleTransform(szFrom, 700000, 5500000, szGeo, &lon, &lat), 0);
+    ASSERT_EQ(GCTPSimpleTransform(szGeo, lon, lat, szTo, &x2, &y2), 0);
+    EXPECT_NEAR(x, x2, 1e-3);
+    EXPECT_NEAR(y, y2, 1e-3);
+}
+
+TEST(ProjectionTransform, DatumShiftsMatchDirectHelmert) {
+    // Offline, PROJ uses EPSG's geocentric translations chosen by area: NAD27
+    // to WGS 84 (4) in Pennsylvania, (6) west of the Mississippi, and ED50 to
+    // WGS 84 (2) in Bavaria. PROJ picks by bounding box, so points near
+    // another country's box may get that country's translation.
+    struct ShiftCase {
+        const char* pszDatum;
+        double dfLon, dfLat, dfA, dfB, dfTx, dfTy, dfTz;
+    };
+    const ShiftCase aCases[] = {
+        {"LONG D001", -75.0, 40.0, 6378206.4, 6356583.8, -8, 160, 176},
+        {"LONG D001", -100.0, 35.0, 6378206.4, 6356583.8, -8, 159, 175},
+        {"LONG D003", 11.0, 48.0, 6378388.0, 6356911.946127947, -87, -96, -120},
+    };
+    const ProjInfo_t sWgs = Make("LONG/LAT D000");
+    for (const ShiftCase& c : aCases) {
+        const ProjInfo_t sFrom = Make(c.pszDatum);
+        double lon = 0, lat = 0, dfLonRef = 0, dfLatRef = 0;
+        ASSERT_EQ(GCTPTransform(&sFrom, c.dfLon, c.dfLat, &sWgs, &lon, &lat), 0);
+        HelmertShift(c.dfLon, c.dfLat, c.dfA, c.dfB, c.dfTx, c.dfTy, c.dfTz, kWgsA, kWgsB,
+                     &dfLonRef, &dfLatRef);
+        const double dfCos = std::cos(c.dfLat * kPi / 180);
+        EXPECT_NEAR((lon - dfLonRef) * kMetresPerDegree * dfCos, 0, 1e-3) << c.pszDatum;
+        EXPECT_NEAR((lat - dfLatRef) * kMetresPerDegree, 0, 1e-3) << c.pszDatum;
+        EXPECT_GT(std::fabs(lat - c.dfLat) + std::fabs(lon - c.dfLon), 1e-5);  // shifted
+        double lon2 = 0, lat2 = 0;
+        ASSERT_EQ(GCTPTransform(&sWgs, lon, lat, &sFrom, &lon2, &lat2), 0);
+        EXPECT_NEAR((lon2 - c.dfLon) * kMetresPerDegree * dfCos, 0, 1e-3);
+        EXPECT_NEAR((lat2 - c.dfLat) * kMetresPerDegree, 0, 1e-3);
+    }
+    // A projected datum description shifts the same way.
+    double e = 0, n = 0, lon = 0, lat = 0;
+    ASSERT_EQ(GCTPTransform(Ptr(Make("UTM 18 T D001")), 500000.0,
+                            0.9996 * MeridianArc(6378206.4, 6356583.8, 40.0), &sWgs, &lon, &lat),
+              0);
+    double dfLonRef = 0, dfLatRef = 0;
+    HelmertShift(-75, 40, 6378206.4, 6356583.8, -8, 160, 176, kWgsA, kWgsB, &dfLonRef, &dfLatRef);
+    EXPECT_NEAR((lat - dfLatRef) * kMetresPerDegree, 0, 2e-3);
+    EXPECT_NEAR((lon - dfLonRef) * kMetresPerDegree * 0.766, 0, 2e-3);
+    (void)e;
+    (void)n;
+}
+
+TEST(ProjectionTransform, FailuresAreReportedNotCrashed) {
+    const ProjInfo_t sGeo = Make("LONG/LAT D000");
+    const ProjInfo_t sUtm = Make("UTM 31 U D000");
+    double x = 123.0, y = 456.0;
+    EXPECT_NE(GCTPTransform(nullptr, 1, 1, &sUtm, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 1, 1, nullptr, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 1, 1, &sUtm, nullptr, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, NAN, 50, &sUtm, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, INFINITY, &sUtm, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, 95, &sUtm, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, -90.5, &sUtm, &x, &y), 0);
+    EXPECT_EQ(x, 123.0);  // outputs untouched on failure
+    EXPECT_EQ(y, 456.0);
+
+    // Planes relate only to themselves.
+    ProjInfo_t sPixel;
+    InitProjInfo(&sPixel, 1);
+    const ProjInfo_t sMetre = Make("METRE");
+    EXPECT_NE(GCTPTransform(&sPixel, 1, 1, &sUtm, &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 1, 1, &sMetre, &x, &y), 0);
+    EXPECT_EQ(GCTPTransform(&sPixel, 1, 2, &sPixel, &x, &y), 0);
+    EXPECT_EQ(x, 1.0);
+    EXPECT_EQ(GCTPTransform(&sMetre, 5, 6, &sMetre, &x, &y), 0);
+    EXPECT_EQ(y, 6.0);
+
+    // Projections without usable parameters, texts written over the record.
+    x = y = 7.0;
+    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(Make("TM D000")), &x, &y), 0);  // scale factor 0
+    EXPECT_NE(
+        GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("TM", {{2, 1.0}, {5, 91000000.0}})), &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("PS", {{5, 0.0}})), &x, &y), 0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("LCC", {{2, 30e6}, {3, -30e6}})), &x, &y),
+              0);
+    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("TM", {{2, 1.0}, {4, 3070000.0}})), &x, &y),
+              0);  // 70 minutes
+    ProjInfo_t sGarbage = sUtm;
+    std::memset(sGarbage.szProj, 'A', sizeof(sGarbage.szProj));  // not terminated
+    EXPECT_NE(GCTPTransform(&sGarbage, 500000, 5e6, &sGeo, &x, &y), 0);
+    std::strcpy(sGarbage.szProj, "UTM 99");
+    EXPECT_NE(GCTPTransform(&sGarbage, 500000, 5e6, &sGeo, &x, &y), 0);
+    EXPECT_EQ(x, 7.0);
+    EXPECT_EQ(nova::detail::ProjInfoToProjDefinition(sGarbage), "");
+    EXPECT_EQ(nova::detail::ProjInfoToProjDefinition(sPixel), "");
+
+    char szBad[] = "NOT A SYSTEM";
+    char szGeo[] = "LONG/LAT D000";
+    EXPECT_NE(GCTPSimpleTransform(szBad, 1, 1, szGeo, &x, &y), 0);
+    EXPECT_NE(GCTPSimpleTransform(szGeo, 1, 1, nullptr, &x, &y), 0);
+}
+
+TEST(ProjectionTransform, CacheAndThreadsGiveSameResults) {
+    // More pairs than the cache holds, cycled, on several threads at once.
+    std::vector<ProjInfo_t> aoZones;
+    for (int nZone = 28; nZone <= 40; ++nZone) {
+        aoZones.push_back(Make(("UTM " + std::to_string(nZone) + " D000").c_str()));
+    }
+    const ProjInfo_t sGeo = Make("LONG/LAT D000");
+    auto Compute = [&](std::vector<double>* padfOut) {
+        for (int nPass = 0; nPass < 3; ++nPass) {
+            padfOut->clear();
+            for (const ProjInfo_t& sZone : aoZones) {
+                double x = 0, y = 0;
+                if (GCTPTransform(&sGeo, 10.0, 45.0, &sZone, &x, &y) != 0) x = y = -1;
+                padfOut->push_back(x);
+                padfOut->push_back(y);
+            }
+        }
+    };
+    std::vector<double> adfReference;
+    Compute(&adfReference);
+    std::vector<std::vector<double>> aadfResults(4);
+    std::vector<std::thread> aoThreads;
+    aoThreads.reserve(aadfResults.size());
+    for (auto& adf : aadfResults) aoThreads.emplace_back(Compute, &adf);
+    for (auto& t : aoThreads) t.join();
+    for (const auto& adf : aadfResults) EXPECT_EQ(adf, adfReference);
+    EXPECT_NE(adfReference[0], -1.0);
+}

@@ -1,0 +1,549 @@
+// Polynomial regression over control points and the pivoted QR solver.
+#include <gtest/gtest.h>
+
+// The tests are not linked with Eigen's target; its headers sit under eigen3/.
+#include <cmath>
+#include <cstring>
+#include <Eigen/Dense>
+#include <functional>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "regression.h"
+#include "runtime.h"
+
+namespace {
+
+constexpr int kPowers[GCP_MAX_TERMS][2] = {{0, 0}, {1, 0}, {0, 1}, {1, 1}, {2, 0}, {0, 2}, {2, 1},
+                                           {1, 2}, {3, 0}, {0, 3}, {2, 2}, {3, 1}, {1, 3}, {4, 0},
+                                           {0, 4}, {3, 2}, {2, 3}, {4, 1}, {1, 4}, {5, 0}, {0, 5}};
+
+int Terms(int order) {
+    return (order + 1) * (order + 2) / 2;
+}
+
+double Poly(const double* c, int nTerms, double u, double v) {
+    double sum = 0.0;
+    for (int k = 0; k < nTerms; ++k)
+        sum += c[k] * std::pow(u, kPowers[k][0]) * std::pow(v, kPowers[k][1]);
+    return sum;
+}
+
+struct Gcps {
+    std::vector<double> x1, y1, x2, y2;
+    int n() const { return static_cast<int>(x1.size()); }
+};
+
+// Points on a jittered grid over [x0, x0 + w] x [y0, y0 + w], mapped by f.
+Gcps MakeGcps(int side, double x0, double y0, double w,
+              const std::function<void(double, double, double&, double&)>& f) {
+    Gcps g;
+    std::mt19937 rng(7);
+    std::uniform_real_distribution<double> jitter(-0.3, 0.3);
+    for (int i = 0; i < side; ++i)
+        for (int j = 0; j < side; ++j) {
+            const double x = x0 + w * (i + 0.5 + jitter(rng)) / side;
+            const double y = y0 + w * (j + 0.5 + jitter(rng)) / side;
+            double X = 0.0, Y = 0.0;
+            f(x, y, X, Y);
+            g.x1.push_back(x);
+            g.y1.push_back(y);
+            g.x2.push_back(X);
+            g.y2.push_back(Y);
+        }
+    return g;
+}
+
+GEOInfo_t Fit(Gcps& g, int order) {
+    GEOInfo_t info;
+    std::memset(&info, 0x5a, sizeof info);  // callers hand over uninitialised blocks
+    int options[1] = {order};
+    EXPECT_EQ(GCPRegression(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+                            options, nullptr, nullptr),
+              0);
+    return info;
+}
+
+bool AllFinite(const GEOInfo_t& g) {
+    for (int k = 0; k < GCP_MAX_TERMS; ++k)
+        if (!std::isfinite(g.adfXCoeffs[k]) || !std::isfinite(g.adfYCoeffs[k]) ||
+            !std::isfinite(g.adfNormXCoeffs[k]) || !std::isfinite(g.adfNormYCoeffs[k]))
+            return false;
+    for (const double a : g.adfAffine)
+        if (!std::isfinite(a)) return false;
+    return true;
+}
+
+// Runs f and returns the code and text of the fatal numbered error it raises.
+std::pair<int, std::string> FatalOf(const std::function<void()>& f) {
+    try {
+        f();
+    } catch (const nova::NumberedError& e) {
+        return {e.GetCode(), e.what()};
+    }
+    return {0, ""};
+}
+
+}  // namespace
+
+TEST(GCPRegression, ExactForEveryOrderWithPixelSizedInputs) {
+    for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
+        const int nTerms = Terms(order);
+        double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
+        for (int k = 0; k < nTerms; ++k) {
+            // Coefficients shrink with the degree so that every term matters over 0..1000.
+            const double scale = std::pow(1000.0, -(kPowers[k][0] + kPowers[k][1]));
+            cx[k] = (1.5 + 0.25 * k) * scale * 100.0;
+            cy[k] = (-0.75 + 0.125 * k) * scale * 100.0;
+        }
+        Gcps g = MakeGcps(8, 0.0, 0.0, 1000.0, [&](double x, double y, double& X, double& Y) {
+            X = Poly(cx, nTerms, x, y);
+            Y = Poly(cy, nTerms, x, y);
+        });
+        const GEOInfo_t info = Fit(g, order);
+        ASSERT_EQ(info.nOrder, order);
+        ASSERT_EQ(info.nTerms, nTerms);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
+        for (int k = 0; k < nTerms; ++k) {
+            const double tol = 1e-9 * std::pow(1000.0, -(kPowers[k][0] + kPowers[k][1])) * 100;
+            EXPECT_NEAR(info.adfXCoeffs[k], cx[k], tol) << "order " << order << " term " << k;
+            EXPECT_NEAR(info.adfYCoeffs[k], cy[k], tol) << "order " << order << " term " << k;
+        }
+        for (int k = nTerms; k < GCP_MAX_TERMS; ++k) EXPECT_EQ(info.adfXCoeffs[k], 0.0);
+        double X = 0.0, Y = 0.0;
+        ASSERT_EQ(GCPTransform(&info, 123.0, 876.0, &X, &Y), 0);
+        EXPECT_NEAR(X, Poly(cx, nTerms, 123.0, 876.0), 1e-8);
+        EXPECT_NEAR(Y, Poly(cy, nTerms, 123.0, 876.0), 1e-8);
+        if (order == 1)
+            for (int k = 0; k < 3; ++k) {
+                EXPECT_NEAR(info.adfAffine[k], cx[k], 1e-9);
+                EXPECT_NEAR(info.adfAffine[3 + k], cy[k], 1e-9);
+            }
+    }
+}
+
+TEST(GCPRegression, ExactForEveryOrderWithUtmSizedInputs) {
+    // A smooth mapping from UTM metres to pixels, a polynomial in the offsets
+    // from a scene corner; the fit must reproduce it far below a pixel.
+    for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
+        const int nTerms = Terms(order);
+        double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
+        for (int k = 0; k < nTerms; ++k) {
+            cx[k] = (k == 1 ? 2000.0 : 37.0 / (k + 1));
+            cy[k] = (k == 2 ? -2000.0 : 23.0 / (k + 2));
+        }
+        auto truth = [&](double x, double y, double& X, double& Y) {
+            const double u = (x - 487000.0) / 30000.0, v = (y - 5120000.0) / 30000.0;
+            X = Poly(cx, nTerms, u, v);
+            Y = Poly(cy, nTerms, u, v);
+        };
+        Gcps g = MakeGcps(9, 487000.0, 5120000.0, 30000.0, truth);
+        const GEOInfo_t info = Fit(g, order);
+        ASSERT_EQ(info.nOrder, order);
+        for (double x : {489123.0, 500000.0, 516500.0})
+            for (double y : {5121000.0, 5135000.0, 5149000.0}) {
+                double X = 0.0, Y = 0.0, eX = 0.0, eY = 0.0;
+                ASSERT_EQ(GCPTransform(&info, x, y, &X, &Y), 0);
+                truth(x, y, eX, eY);
+                EXPECT_NEAR(X, eX, 1e-7) << "order " << order;
+                EXPECT_NEAR(Y, eY, 1e-7) << "order " << order;
+            }
+        // The affine companion of an affine truth is exact in raw coordinates too.
+        if (order == 1) {
+            EXPECT_NEAR(info.adfAffine[1], cx[1] / 30000.0, 1e-12);
+            EXPECT_NEAR(
+                info.adfAffine[0] + info.adfAffine[1] * 500000.0 + info.adfAffine[2] * 5130000.0,
+                info.adfXCoeffs[0] + info.adfXCoeffs[1] * 500000.0 + info.adfXCoeffs[2] * 5130000.0,
+                1e-7);
+        }
+    }
+}
+
+TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
+    nova::ResetWarningCount();
+    nova::ErrorSink previous = nova::SetErrorSink([](const nova::ErrorReport&) {});
+
+    // One point: a shift.
+    {
+        Gcps g{{100.0}, {200.0}, {110.0}, {220.0}};
+        const GEOInfo_t info = Fit(g, 3);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
+        EXPECT_EQ(info.nOrder, 1);
+        double X = 0.0, Y = 0.0;
+        GCPTransform(&info, 105.0, 195.0, &X, &Y);
+        EXPECT_NEAR(X, 115.0, 1e-9);
+        EXPECT_NEAR(Y, 215.0, 1e-9);
+        EXPECT_NEAR(info.adfAffine[0], 10.0, 1e-9);
+        EXPECT_NEAR(info.adfAffine[1], 1.0, 1e-12);
+        EXPECT_NEAR(info.adfAffine[5], 1.0, 1e-12);
+        EXPECT_TRUE(AllFinite(info));
+    }
+    // Two points: rotation by 90 degrees, scale 2 and a shift, reproduced exactly.
+    {
+        Gcps g{{0.0, 10.0}, {0.0, 0.0}, {5.0, 5.0}, {7.0, 27.0}};
+        const GEOInfo_t info = Fit(g, 2);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
+        EXPECT_NEAR(info.adfXCoeffs[0], 5.0, 1e-9);
+        EXPECT_NEAR(info.adfXCoeffs[1], 0.0, 1e-12);
+        EXPECT_NEAR(info.adfXCoeffs[2], -2.0, 1e-12);
+        EXPECT_NEAR(info.adfYCoeffs[0], 7.0, 1e-9);
+        EXPECT_NEAR(info.adfYCoeffs[1], 2.0, 1e-12);
+        EXPECT_NEAR(info.adfYCoeffs[2], 0.0, 1e-12);
+        EXPECT_TRUE(AllFinite(info));
+    }
+    // Collinear points, UTM-sized: a similarity that reproduces the line.
+    {
+        Gcps g;
+        for (int i = 0; i < 6; ++i) {
+            const double t = 1000.0 * i;
+            g.x1.push_back(500000.0 + 0.6 * t);
+            g.y1.push_back(4000000.0 + 0.8 * t);
+            g.x2.push_back(10.0 + t / 30.0);
+            g.y2.push_back(20.0);
+        }
+        const GEOInfo_t info = Fit(g, 2);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
+        EXPECT_TRUE(AllFinite(info));
+        double rmsX = -1.0, rmsY = -1.0;
+        GCPRootMeanSq(const_cast<GEOInfo_t*>(&info), g.x1.data(), g.y1.data(), g.x2.data(),
+                      g.y2.data(), g.n(), &rmsX, &rmsY);
+        EXPECT_LT(rmsX, 1e-8);
+        EXPECT_LT(rmsY, 1e-8);
+    }
+    // Coincident inputs: the mean shift.
+    {
+        Gcps g{{3.0, 3.0, 3.0}, {4.0, 4.0, 4.0}, {10.0, 12.0, 14.0}, {1.0, 1.0, 4.0}};
+        const GEOInfo_t info = Fit(g, 1);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
+        double X = 0.0, Y = 0.0;
+        GCPTransform(&info, 3.0, 4.0, &X, &Y);
+        EXPECT_NEAR(X, 12.0, 1e-12);
+        EXPECT_NEAR(Y, 2.0, 1e-12);
+    }
+    // Fewer points than the order needs: 8 points determine order 2, not 3;
+    // 4 points determine only the affine map.
+    for (const auto& [side, order, expected] : {std::tuple{3, 3, 2}, std::tuple{2, 2, 1}}) {
+        Gcps g = MakeGcps(side, 0.0, 0.0, 100.0, [](double x, double y, double& X, double& Y) {
+            X = 1.0 + 2.0 * x - y;
+            Y = 3.0 - x + 0.5 * y;
+        });
+        if (side == 3) {  // drop one of the nine points
+            g.x1.pop_back();
+            g.y1.pop_back();
+            g.x2.pop_back();
+            g.y2.pop_back();
+        }
+        int fitted = order;
+        GEOInfo_t info;
+        GCPRegression2(&info, "PIXEL", g.x1.data(), g.y1.data(), "METRE", g.x2.data(), g.y2.data(),
+                       g.n(), &fitted, 0, nullptr, nullptr);
+        EXPECT_EQ(fitted, expected);
+        EXPECT_EQ(info.nOrder, expected);
+        EXPECT_TRUE(AllFinite(info));
+        EXPECT_NEAR(info.adfXCoeffs[1], 2.0, 1e-9);
+    }
+    // Points on a circle do not determine a second-order fit (x² + y² is constant).
+    {
+        Gcps g;
+        for (int i = 0; i < 12; ++i) {
+            const double a = 2.0 * M_PI * i / 12;
+            g.x1.push_back(std::cos(a));
+            g.y1.push_back(std::sin(a));
+            g.x2.push_back(3.0 * std::cos(a) + 1.0);
+            g.y2.push_back(std::sin(a) - 2.0);
+        }
+        const GEOInfo_t info = Fit(g, 2);
+        EXPECT_EQ(info.nOrder, 1);
+        EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
+        EXPECT_NEAR(info.adfXCoeffs[1], 3.0, 1e-9);
+    }
+    EXPECT_EQ(nova::GetWarningCount(), 7u);  // one warning per lowered fit
+    nova::SetErrorSink(previous);
+}
+
+TEST(GCPRegression, ManyPointsLeaveTheWorkArraysAlone) {
+    Gcps g = MakeGcps(60, 0.0, 0.0, 5000.0, [](double x, double y, double& X, double& Y) {
+        X = 0.5 * x + 1e-5 * x * y;
+        Y = -0.25 * y + 2e-5 * x * x;
+    });
+    ASSERT_GT(g.n(), 1024);
+    const double canary = -12345.678;
+    std::vector<double> work1(1024 + 8, canary), work2(1024 + 8, canary);
+    GEOInfo_t info;
+    int options[1] = {2};
+    ASSERT_EQ(GCPRegression(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+                            options, work1.data(), work2.data()),
+              0);
+    for (int i = 1024; i < 1024 + 8; ++i) {
+        EXPECT_EQ(work1[i], canary);
+        EXPECT_EQ(work2[i], canary);
+    }
+    EXPECT_NEAR(info.adfXCoeffs[3], 1e-5, 1e-15);
+    EXPECT_NEAR(info.adfYCoeffs[4], 2e-5, 1e-15);
+}
+
+TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
+    // Noisy data: compare with a least-squares fit by normal equations in raw
+    // coordinates and residuals summed here.
+    std::mt19937 rng(11);
+    std::normal_distribution<double> noise(0.0, 0.5);
+    Gcps g = MakeGcps(7, 0.0, 0.0, 200.0, [&](double x, double y, double& X, double& Y) {
+        X = 4.0 + 0.9 * x + 0.1 * y + 1e-3 * x * y + noise(rng);
+        Y = -2.0 + 1.1 * y - 2e-3 * y * y + noise(rng);
+    });
+    int order = 2;
+    double outRmsX = 0.0, outRmsY = 0.0;
+    GEOInfo_t info;
+    GCPRegression2(&info, "LON", g.x1.data(), g.y1.data(), "PIXEL", g.x2.data(), g.y2.data(), g.n(),
+                   &order, 0, &outRmsX, &outRmsY);
+    EXPECT_STREQ(info.szFromUnit, "LON");
+    EXPECT_STREQ(info.szToUnit, "PIXEL");
+    EXPECT_EQ(order, 2);
+
+    Eigen::MatrixXd design(g.n(), 6);
+    Eigen::VectorXd bx(g.n()), by(g.n());
+    for (int i = 0; i < g.n(); ++i) {
+        const double x = g.x1[i], y = g.y1[i];
+        design.row(i) << 1.0, x, y, x * y, x * x, y * y;
+        bx[i] = g.x2[i];
+        by[i] = g.y2[i];
+    }
+    const Eigen::MatrixXd normal = design.transpose() * design;
+    const Eigen::VectorXd ax = normal.ldlt().solve(design.transpose() * bx);
+    const Eigen::VectorXd ay = normal.ldlt().solve(design.transpose() * by);
+    for (int k = 0; k < 6; ++k) {
+        EXPECT_NEAR(info.adfXCoeffs[k], ax[k], 1e-9 * (1.0 + std::abs(ax[k])));
+        EXPECT_NEAR(info.adfYCoeffs[k], ay[k], 1e-9 * (1.0 + std::abs(ay[k])));
+    }
+    const double expectX = std::sqrt((design * ax - bx).squaredNorm() / g.n());
+    const double expectY = std::sqrt((design * ay - by).squaredNorm() / g.n());
+    double rmsX = 0.0, rmsY = 0.0;
+    ASSERT_EQ(GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(), &rmsX,
+                            &rmsY),
+              0);
+    EXPECT_NEAR(rmsX, expectX, 1e-9);
+    EXPECT_NEAR(rmsY, expectY, 1e-9);
+    EXPECT_GT(rmsX, 0.1);
+    EXPECT_DOUBLE_EQ(outRmsX, rmsX);
+    EXPECT_DOUBLE_EQ(outRmsY, rmsY);
+    ASSERT_EQ(
+        GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), 0, &rmsX, &rmsY),
+        0);
+    EXPECT_EQ(rmsX, 0.0);
+    EXPECT_EQ(rmsY, 0.0);
+}
+
+TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
+    Gcps g = MakeGcps(4, 0.0, 0.0, 10.0, [](double x, double y, double& X, double& Y) {
+        X = x + 1.0;
+        Y = y - 1.0;
+    });
+    GEOInfo_t info = Fit(g, 1);
+    const GEOInfo_t before = info;
+    auto regress = [&](int n, int order, double* x1) {
+        int options[1] = {order};
+        GCPRegression(&info, x1, g.y1.data(), g.x2.data(), g.y2.data(), n, options, nullptr,
+                      nullptr);
+    };
+    auto expectFatal = [&](const std::function<void()>& f, const std::string& fragment) {
+        const auto [code, text] = FatalOf(f);
+        EXPECT_EQ(code, 100) << fragment;
+        EXPECT_NE(text.find(fragment), std::string::npos) << text;
+        // Bit for bit: the failed call must not have written the record.
+        // NOLINTNEXTLINE(bugprone-suspicious-memory-comparison)
+        EXPECT_EQ(std::memcmp(&info, &before, sizeof info), 0) << fragment;
+    };
+    expectFatal([&] { regress(g.n(), 0, g.x1.data()); }, "order 0");
+    expectFatal([&] { regress(g.n(), 6, g.x1.data()); }, "order 6");
+    expectFatal([&] { regress(0, 1, g.x1.data()); }, "points 0");
+    expectFatal([&] { regress(-3, 1, g.x1.data()); }, "points -3");
+    expectFatal([&] { regress(g.n(), 1, nullptr); }, "null");
+    g.x1[2] = std::nan("");
+    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "point 3");
+    g.x1[2] = 1.0;
+    g.y2[1] = INFINITY;
+    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "y2 = inf");
+    g.y2[1] = 0.0;
+    // Outputs near the largest double over a small input range: the raw
+    // coefficients overflow.
+    const Gcps saved = g;
+    for (int i = 0; i < g.n(); ++i) {
+        g.x2[i] = g.x1[i] * 1e307;
+        g.x1[i] *= 1e-10;
+    }
+    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "non-finite coefficients");
+    g = saved;
+    expectFatal(
+        [&] {
+            int order = 7;
+            GCPRegression2(&info, "A", g.x1.data(), g.y1.data(), "B", g.x2.data(), g.y2.data(),
+                           g.n(), &order, 0, nullptr, nullptr);
+        },
+        "order 7");
+    expectFatal(
+        [&] {
+            GCPRegression(nullptr, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+                          nullptr, nullptr, nullptr);
+        },
+        "null");
+
+    // Evaluation of an empty record or a non-finite point fails without NaN.
+    GEOInfo_t empty{};
+    double X = 5.0, Y = 5.0;
+    EXPECT_EQ(GCPTransform(&empty, 1.0, 2.0, &X, &Y), -1);
+    EXPECT_EQ(X, 0.0);
+    EXPECT_EQ(Y, 0.0);
+    EXPECT_EQ(GCPTransform(&info, std::nan(""), 2.0, &X, &Y), -1);
+    EXPECT_EQ(X, 0.0);
+    EXPECT_EQ(GCPTransform(nullptr, 1.0, 2.0, &X, &Y), -1);
+    double rx = 0.0, ry = 0.0;
+    EXPECT_EQ(FatalOf([&] {
+                  GCPRootMeanSq(&empty, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), 4, &rx,
+                                &ry);
+              }).first,
+              100);
+    EXPECT_EQ(FatalOf([&] {
+                  GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), -1, &rx,
+                                &ry);
+              }).first,
+              100);
+    EXPECT_EQ(FatalOf([&] {
+                  GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), 4,
+                                nullptr, &ry);
+              }).first,
+              100);
+    EXPECT_EQ(FatalOf([&] {
+                  GCPRootMeanSq(&info, nullptr, g.y1.data(), g.x2.data(), g.y2.data(), 4, &rx, &ry);
+              }).first,
+              100);
+}
+
+namespace {
+
+struct QrCase {
+    int n, lda;
+    std::vector<double> a;  // column-major, leading dimension lda
+    std::vector<int> jpvt;
+    std::vector<double> qraux, x, rsd;
+    int rank = -1, ind = -1;
+
+    QrCase(const Eigen::MatrixXd& m, int extra)
+        : n(static_cast<int>(m.rows())),
+          lda(n + extra),
+          a(static_cast<size_t>(lda) * n, 0.0),
+          jpvt(n),
+          qraux(n),
+          x(n),
+          rsd(n) {
+        for (int j = 0; j < n; ++j)
+            for (int i = 0; i < n; ++i) a[static_cast<size_t>(j) * lda + i] = m(i, j);
+    }
+    void Solve(Eigen::VectorXd& b, int task, double tol = 1e-12) {
+        dqrlsc(a.data(), lda, n, tol, &rank, b.data(), x.data(), rsd.data(), jpvt.data(),
+               qraux.data(), nullptr, task, &ind);
+    }
+    Eigen::VectorXd X() const { return Eigen::Map<const Eigen::VectorXd>(x.data(), n); }
+    double R(int i, int j) const { return a[static_cast<size_t>(j) * lda + i]; }
+};
+
+}  // namespace
+
+TEST(Dqrlsc, SolvesFullRankAndReusesTheFactorisation) {
+    std::mt19937 rng(3);
+    std::uniform_real_distribution<double> d(-1.0, 1.0);
+    const int n = 70;  // more than two panels
+    Eigen::MatrixXd m(n, n);
+    for (int j = 0; j < n; ++j)
+        for (int i = 0; i < n; ++i) m(i, j) = d(rng);
+    m.col(5) *= 10.0;  // the largest column is the first pivot
+    Eigen::VectorXd b1(n), b2(n);
+    for (int i = 0; i < n; ++i) {
+        b1[i] = d(rng);
+        b2[i] = d(rng);
+    }
+    QrCase qr(m, 3);
+    qr.Solve(b1, -1);
+    ASSERT_EQ(qr.ind, DQRLSC_OK);
+    EXPECT_EQ(qr.rank, n);
+    EXPECT_EQ(qr.jpvt[0], 5);
+    EXPECT_NEAR(std::abs(qr.R(0, 0)), m.col(5).norm(), 1e-12);
+    const Eigen::VectorXd expect1 = m.partialPivLu().solve(b1);
+    EXPECT_LT((qr.X() - expect1).norm(), 1e-9 * expect1.norm());
+    EXPECT_LT(Eigen::Map<Eigen::VectorXd>(qr.rsd.data(), n).norm(), 1e-10);
+    // |det| is the product of R's diagonal.
+    double logDet = 0.0;
+    for (int k = 0; k < n; ++k) logDet += std::log(std::abs(qr.R(k, k)));
+    EXPECT_NEAR(logDet, std::log(std::abs(m.determinant())), 1e-9);
+
+    qr.Solve(b2, 2);
+    ASSERT_EQ(qr.ind, DQRLSC_OK);
+    QrCase fresh(m, 0);
+    fresh.Solve(b2, -1);
+    EXPECT_LT((qr.X() - fresh.X()).norm(), 1e-12 * fresh.X().norm());
+}
+
+TEST(Dqrlsc, RevealsRankAndGivesTheBasicSolution) {
+    std::mt19937 rng(5);
+    std::uniform_real_distribution<double> d(-1.0, 1.0);
+    const int n = 45;
+    Eigen::MatrixXd m(n, n);
+    for (int j = 0; j < n; ++j)
+        for (int i = 0; i < n; ++i) m(i, j) = d(rng);
+    m.col(10) = 2.0 * m.col(3);              // dependent column
+    m.col(40) = m.col(1) - 0.5 * m.col(20);  // another
+    m.col(44) = m.col(40);                   // and a duplicate
+    Eigen::VectorXd b(n);
+    for (int i = 0; i < n; ++i) b[i] = d(rng);
+    QrCase qr(m, 1);
+    qr.Solve(b, -1);
+    ASSERT_EQ(qr.ind, DQRLSC_OK);
+    EXPECT_EQ(qr.rank, n - 3);
+    // The dropped columns get zeros; the residual is orthogonal to A's columns
+    // (least squares) and is b - A x.
+    int zeros = 0;
+    for (int k = qr.rank; k < n; ++k) zeros += qr.x[qr.jpvt[k]] == 0.0;
+    EXPECT_EQ(zeros, 3);
+    const Eigen::VectorXd residual = b - m * qr.X();
+    EXPECT_LT((Eigen::Map<Eigen::VectorXd>(qr.rsd.data(), n) - residual).norm(), 1e-10);
+    EXPECT_LT((m.transpose() * residual).norm(), 1e-9);
+    EXPECT_GT(residual.norm(), 1e-3);
+    // A looser tolerance drops further columns.
+    QrCase loose(m, 0);
+    loose.Solve(b, -1, 0.5);
+    EXPECT_LT(loose.rank, n - 3);
+    EXPECT_GE(loose.rank, 1);
+}
+
+TEST(Dqrlsc, ReportsEveryFailure) {
+    Eigen::MatrixXd m = Eigen::MatrixXd::Identity(4, 4);
+    Eigen::VectorXd b = Eigen::VectorXd::Ones(4);
+    auto indOf = [&](QrCase& qr, int lda, int n, double tol, int task, double* bp) {
+        dqrlsc(qr.a.data(), lda, n, tol, &qr.rank, bp, qr.x.data(), qr.rsd.data(), qr.jpvt.data(),
+               qr.qraux.data(), nullptr, task, &qr.ind);
+        return qr.ind;
+    };
+    QrCase qr(m, 0);
+    EXPECT_EQ(indOf(qr, 4, 0, 1e-12, -1, b.data()), DQRLSC_BAD_ARGUMENT);
+    EXPECT_EQ(indOf(qr, 3, 4, 1e-12, -1, b.data()), DQRLSC_BAD_ARGUMENT);
+    EXPECT_EQ(indOf(qr, 4, 4, -1.0, -1, b.data()), DQRLSC_BAD_ARGUMENT);
+    EXPECT_EQ(indOf(qr, 4, 4, std::nan(""), -1, b.data()), DQRLSC_BAD_ARGUMENT);
+    EXPECT_EQ(indOf(qr, 4, 4, 1e-12, 1, b.data()), DQRLSC_BAD_ARGUMENT);
+    EXPECT_EQ(indOf(qr, 4, 4, 1e-12, -1, nullptr), DQRLSC_BAD_ARGUMENT);
+    // Task 2 before any factorisation: the pivots are not a permutation.
+    std::fill(qr.jpvt.begin(), qr.jpvt.end(), 0);
+    EXPECT_EQ(indOf(qr, 4, 4, 1e-12, 2, b.data()), DQRLSC_NO_FACTOR);
+    b[2] = INFINITY;
+    EXPECT_EQ(indOf(qr, 4, 4, 1e-12, -1, b.data()), DQRLSC_NOT_FINITE);
+    b[2] = 1.0;
+    qr.a[5] = std::nan("");
+    EXPECT_EQ(indOf(qr, 4, 4, 1e-12, -1, b.data()), DQRLSC_NOT_FINITE);
+    EXPECT_TRUE(std::isnan(qr.a[5]));  // nothing factorised
+    QrCase zero(Eigen::MatrixXd::Zero(4, 4), 0);
+    EXPECT_EQ(indOf(zero, 4, 4, 1e-12, -1, b.data()), DQRLSC_RANK_ZERO);
+    EXPECT_EQ(zero.rank, 0);
+    // A valid call after all that still works.
+    QrCase ok(m, 0);
+    EXPECT_EQ(indOf(ok, 4, 4, 1e-12, -1, b.data()), DQRLSC_OK);
+    EXPECT_NEAR(ok.x[3], 1.0, 1e-15);
+}

@@ -1,0 +1,71 @@
+#include "cli.h"
+
+#include <array>
+#include <iostream>
+
+#include <CLI/CLI.hpp>
+
+#include "commands.h"
+#include "lumo.h"
+#include "nova/runtime.h"
+
+namespace lumo::cli {
+namespace {
+
+#ifndef LUMO_VERSION_STRING
+#define LUMO_VERSION_STRING "unknown"
+#endif
+
+// Every subcommand; a new family adds its Add...Command here.
+constexpr std::array<AddCommandFn, 3> kCommands = {
+    &AddDemoCommand,
+    &AddTransformCommand,
+    &AddPolyCommand,
+};
+
+std::string VersionText() {
+    std::string text = std::string("lumo ") + LUMO_VERSION_STRING;
+    // The library is loaded separately; say so when it differs from the tool.
+    const char* library = LumoVersion();
+    if (library != nullptr && std::string(library) != LUMO_VERSION_STRING) {
+        text += std::string(" (library ") + library + ")";
+    }
+    return text;
+}
+
+}  // namespace
+
+int RunLumo(int argc, char** argv, std::ostream& out, std::ostream& err) {
+    CommandContext context{out, err};
+    CLI::App app("Geometric math models for remote-sensing imagery", "lumo");
+    app.require_subcommand(0, 1);
+    bool showVersion = false;
+    app.add_flag("--version", showVersion, "print the version and exit");
+    for (AddCommandFn add : kCommands) add(app, context);
+    try {
+        app.parse(argc, argv);
+        if (showVersion) {
+            out << VersionText() << '\n';
+            return 0;
+        }
+        if (app.get_subcommands().empty()) {
+            out << app.help();
+            return 1;
+        }
+    } catch (const CLI::ParseError& e) {
+        return app.exit(e, out, err);
+    } catch (const nova::Exception& e) {
+        err << "lumo: " << e.what() << '\n';
+        return 1;
+    } catch (const std::exception& e) {
+        err << "lumo: " << e.what() << '\n';
+        return 1;
+    }
+    return context.nExitCode;
+}
+
+int RunLumo(int argc, char** argv) {
+    return RunLumo(argc, argv, std::cout, std::cerr);
+}
+
+}  // namespace lumo::cli

@@ -1,0 +1,238 @@
+#include "points_io.h"
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <charconv>
+#include <cmath>
+#include <fstream>
+#include <istream>
+#include <optional>
+#include <ostream>
+
+#include "cli_error.h"
+
+namespace lumo::cli {
+namespace {
+
+constexpr std::array<PointColumn, 6> kAllColumns = {PointColumn::Id,   PointColumn::Pixel,
+                                                    PointColumn::Line, PointColumn::X,
+                                                    PointColumn::Y,    PointColumn::Z};
+
+std::string Trim(const std::string& text) {
+    const auto first = text.find_first_not_of(" \t\r");
+    if (first == std::string::npos) return "";
+    const auto last = text.find_last_not_of(" \t\r");
+    return text.substr(first, last - first + 1);
+}
+
+std::string Lower(std::string text) {
+    std::transform(text.begin(), text.end(), text.begin(),
+                   [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
+    return text;
+}
+
+std::vector<std::string> SplitFields(const std::string& line) {
+    std::vector<std::string> fields;
+    std::size_t start = 0;
+    while (true) {
+        const auto comma = line.find(',', start);
+        fields.push_back(Trim(line.substr(start, comma - start)));
+        if (comma == std::string::npos) break;
+        start = comma + 1;
+    }
+    return fields;
+}
+
+bool IsSkippable(const std::string& line) {
+    const std::string text = Trim(line);
+    return text.empty() || text[0] == '#';
+}
+
+std::vector<PointColumn> RequiredColumns(PointKind kind) {
+    switch (kind) {
+        case PointKind::Ground:
+            return {PointColumn::X, PointColumn::Y};
+        case PointKind::Image:
+            return {PointColumn::Pixel, PointColumn::Line};
+        case PointKind::ControlPoint:
+            return {PointColumn::Pixel, PointColumn::Line, PointColumn::X, PointColumn::Y};
+    }
+    return {};
+}
+
+// Field index of each recognised column, or nothing when absent.
+struct ColumnMap {
+    std::array<std::optional<std::size_t>, kAllColumns.size()> aoIndex;
+    std::size_t nFields = 0;
+    std::vector<std::string> aosNames;
+
+    std::optional<std::size_t>& operator[](PointColumn c) {
+        return aoIndex[static_cast<std::size_t>(c)];
+    }
+};
+
+ColumnMap ParseHeader(const std::string& line, const std::string& where) {
+    ColumnMap map;
+    map.aosNames = SplitFields(line);
+    map.nFields = map.aosNames.size();
+    for (std::size_t i = 0; i < map.nFields; ++i) {
+        const std::string name = Lower(map.aosNames[i]);
+        for (PointColumn c : kAllColumns) {
+            if (name != PointColumnName(c)) continue;
+            if (map[c]) {
+                LUMO_CLI_FAIL(where + ": column " + Quoted(name) + " appears twice in the header");
+            }
+            map[c] = i;
+        }
+    }
+    return map;
+}
+
+void RequireColumns(ColumnMap& map, PointKind kind, const std::string& where) {
+    for (PointColumn c : RequiredColumns(kind)) {
+        if (map[c]) continue;
+        std::string message =
+            where + ": missing column " + Quoted(PointColumnName(c)) + " (header has: ";
+        for (std::size_t i = 0; i < map.aosNames.size(); ++i) {
+            if (i) message += ", ";
+            message += map.aosNames[i];
+        }
+        message += ")";
+        LUMO_CLI_FAIL(message);
+    }
+}
+
+double ParseNumber(const std::string& field, const std::string& where, std::size_t column,
+                   const std::string& name) {
+    const char* begin = field.data();
+    const char* end = begin + field.size();
+    if (begin != end && *begin == '+') ++begin;
+    double value = 0.0;
+    const auto result = std::from_chars(begin, end, value);
+    const bool whole = result.ec == std::errc() && result.ptr == end && begin != end;
+    if (!whole || !std::isfinite(value)) {
+        LUMO_CLI_FAIL(where + ": column " + std::to_string(column + 1) + " (" + Quoted(name) +
+                      "): " + Quoted(field) + " is not a finite number");
+    }
+    return value;
+}
+
+PointRecord ParseRow(const std::vector<std::string>& fields, ColumnMap& map,
+                     const std::string& where) {
+    PointRecord point;
+    const auto number = [&](PointColumn c, double* target) {
+        if (!map[c]) return;
+        const std::size_t i = *map[c];
+        *target = ParseNumber(fields[i], where, i, map.aosNames[i]);
+    };
+    number(PointColumn::Pixel, &point.dfPixel);
+    number(PointColumn::Line, &point.dfLine);
+    number(PointColumn::X, &point.dfX);
+    number(PointColumn::Y, &point.dfY);
+    number(PointColumn::Z, &point.dfZ);
+    if (map[PointColumn::Id]) point.osId = fields[*map[PointColumn::Id]];
+    return point;
+}
+
+double ColumnValue(const PointRecord& p, PointColumn c) {
+    switch (c) {
+        case PointColumn::Pixel:
+            return p.dfPixel;
+        case PointColumn::Line:
+            return p.dfLine;
+        case PointColumn::X:
+            return p.dfX;
+        case PointColumn::Y:
+            return p.dfY;
+        case PointColumn::Z:
+        case PointColumn::Id:
+            break;
+    }
+    return p.dfZ;
+}
+
+}  // namespace
+
+const char* PointColumnName(PointColumn column) {
+    switch (column) {
+        case PointColumn::Id:
+            return "id";
+        case PointColumn::Pixel:
+            return "pixel";
+        case PointColumn::Line:
+            return "line";
+        case PointColumn::X:
+            return "x";
+        case PointColumn::Y:
+            return "y";
+        case PointColumn::Z:
+            return "z";
+    }
+    return "";
+}
+
+PointSet ReadPoints(std::istream& in, const std::string& source, PointKind kind) {
+    PointSet set;
+    set.osSource = source;
+    std::string line;
+    int lineNumber = 0;
+    std::optional<ColumnMap> header;
+    while (std::getline(in, line)) {
+        ++lineNumber;
+        if (IsSkippable(line)) continue;
+        const std::string where = source + ":" + std::to_string(lineNumber);
+        if (!header) {
+            header = ParseHeader(line, where);
+            RequireColumns(*header, kind, where);
+            set.bHasId = (*header)[PointColumn::Id].has_value();
+            set.bHasZ = (*header)[PointColumn::Z].has_value();
+            continue;
+        }
+        const std::vector<std::string> fields = SplitFields(line);
+        if (fields.size() != header->nFields) {
+            LUMO_CLI_FAIL(where + ": expected " + std::to_string(header->nFields) +
+                          " fields as in the header, found " + std::to_string(fields.size()));
+        }
+        set.asPoints.push_back(ParseRow(fields, *header, where));
+        set.asPoints.back().nSourceLine = lineNumber;
+    }
+    if (in.bad()) LUMO_CLI_FAIL(source + ": read error");
+    if (!header) {
+        LUMO_CLI_FAIL(source + ": empty file, expected a header line naming the columns");
+    }
+    return set;
+}
+
+PointSet ReadPointsFile(const std::string& path, PointKind kind) {
+    std::ifstream in(path);
+    if (!in) LUMO_CLI_FAIL(path + ": cannot open point file");
+    return ReadPoints(in, path, kind);
+}
+
+std::string FormatDouble(double value) {
+    std::array<char, 32> buffer{};
+    const auto result = std::to_chars(buffer.data(), buffer.data() + buffer.size(), value);
+    return std::string(buffer.data(), result.ptr);
+}
+
+void WritePoints(std::ostream& out, const PointSet& points,
+                 const std::vector<PointColumn>& columns) {
+    for (std::size_t i = 0; i < columns.size(); ++i) {
+        out << (i ? "," : "") << PointColumnName(columns[i]);
+    }
+    out << '\n';
+    for (const PointRecord& p : points.asPoints) {
+        for (std::size_t i = 0; i < columns.size(); ++i) {
+            if (i) out << ',';
+            if (columns[i] == PointColumn::Id) {
+                out << p.osId;
+            } else {
+                out << FormatDouble(ColumnValue(p, columns[i]));
+            }
+        }
+        out << '\n';
+    }
+}
+
+}  // namespace lumo::cli

@@ -1,0 +1,53 @@
+// `lumo transform MODEL --to-image|--to-ground POINTS [-o OUT]` for any model
+// family the model-file reader knows.
+#include <memory>
+
+#include <CLI/CLI.hpp>
+
+#include "commands.h"
+#include "transform.h"
+
+namespace lumo::cli {
+
+void AddTransformArguments(CLI::App& command, TransformOptions& options) {
+    command.add_option("model", options.osModel, "model file (JSON)")->required();
+    auto* toImage = command.add_option("--to-image", options.osToImage,
+                                       "ground points (CSV with x,y[,z]) to map to the image");
+    auto* toGround = command.add_option("--to-ground", options.osToGround,
+                                        "image points (CSV with pixel,line[,z]) to map to ground");
+    toImage->excludes(toGround);
+    command.add_option("-o,--output", options.osOutput,
+                       "output CSV file (standard output when not given)");
+}
+
+void RunTransformOptions(const TransformOptions& options, const LoadedModel& model,
+                         CommandContext& context) {
+    if (!options.osToImage.empty()) {
+        TransformPointFile(model, Direction::ToImage, options.osToImage, options.osOutput,
+                           context.out);
+    } else {
+        TransformPointFile(model, Direction::ToGround, options.osToGround, options.osOutput,
+                           context.out);
+    }
+}
+
+// The direction is checked before the model is read so that a usage error
+// is reported as such.
+void RequireDirection(const TransformOptions& options) {
+    if (options.osToImage.empty() && options.osToGround.empty()) {
+        throw CLI::ValidationError("one of --to-image POINTS or --to-ground POINTS is required");
+    }
+}
+
+void AddTransformCommand(CLI::App& app, CommandContext& context) {
+    auto options = std::make_shared<TransformOptions>();
+    CLI::App* command =
+        app.add_subcommand("transform", "Map points through a model file of any known family");
+    AddTransformArguments(*command, *options);
+    command->callback([options, &context] {
+        RequireDirection(*options);
+        RunTransformOptions(*options, ReadModelFile(options->osModel), context);
+    });
+}
+
+}  // namespace lumo::cli
