@@ -12,7 +12,7 @@ using nova::mathmodel::IMathModel;
 
 // A model object that records its point calls and fails on request.
 class RecordingModel : public IMathModel {
-public:
+  public:
     mutable int mnImageToGround = 0;
     mutable int mnGroundToImage = 0;
     mutable double mdfLastZ = 0.0;
@@ -31,8 +31,7 @@ public:
     bool IsHeightDependent() const override { return true; }
     bool IsEqual(const IMathModel* p) const override { return p == this; }
     int ImageToGround(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double,
-                      bool) const override {
+                      unsigned char*, double, double, double, double, double, bool) const override {
         return -1;
     }
     int ImageToGround(double, double, int, const double*, double*, double*, int*,
@@ -48,8 +47,7 @@ public:
         return mnResult;
     }
     int GroundToImage(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double,
-                      bool) const override {
+                      unsigned char*, double, double, double, double, double, bool) const override {
         return -1;
     }
     int GroundToImage(double, double, int, const double*, double*, double*, int*,

@@ -19,14 +19,15 @@ struct PolyDeleter {
 using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
 
 class WarningCounter {
-public:
+  public:
     WarningCounter() {
-        moOld = nova::SetErrorSink([this](const nova::ErrorReport& r) { anCodes.push_back(r.nCode); });
+        moOld =
+            nova::SetErrorSink([this](const nova::ErrorReport& r) { anCodes.push_back(r.nCode); });
     }
     ~WarningCounter() { nova::SetErrorSink(moOld); }
     std::vector<int> anCodes;
 
-private:
+  private:
     nova::ErrorSink moOld;
 };
 
@@ -38,7 +39,8 @@ const int kPowers[21][2] = {{0, 0}, {1, 0}, {0, 1}, {1, 1}, {2, 0}, {0, 2}, {2, 
 double Reference(const double* c, int n, double u, double v) {
     long double sum = 0;
     for (int k = 0; k < n; ++k) {
-        sum += static_cast<long double>(c[k]) * std::pow(static_cast<long double>(u), kPowers[k][0]) *
+        sum += static_cast<long double>(c[k]) *
+               std::pow(static_cast<long double>(u), kPowers[k][0]) *
                std::pow(static_cast<long double>(v), kPowers[k][1]);
     }
     return static_cast<double>(sum);

@@ -18,14 +18,14 @@ namespace {
 
 // Captures warnings for the lifetime of the object.
 class WarningCapture {
-public:
+  public:
     WarningCapture() {
         moOld = nova::SetErrorSink([this](const nova::ErrorReport& r) { maReports.push_back(r); });
     }
     ~WarningCapture() { nova::SetErrorSink(moOld); }
     std::vector<nova::ErrorReport> maReports;
 
-private:
+  private:
     nova::ErrorSink moOld;
 };
 

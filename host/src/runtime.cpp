@@ -92,7 +92,9 @@ void Report(int nCode, int bFatal, const std::string& osDetail) {
     }
 }
 
-std::string SafeText(const char* pszText) { return pszText ? std::string(pszText) : std::string(); }
+std::string SafeText(const char* pszText) {
+    return pszText ? std::string(pszText) : std::string();
+}
 
 std::string VFormat(const char* pszFormat, va_list args) {
     if (!pszFormat) return std::string();
@@ -161,26 +163,33 @@ void* HRealloc(void* block, std::uint64_t size) {
     return pBlock;
 }
 
-void nova::FreeDeleter::operator()(void* p) const noexcept { std::free(p); }
+void nova::FreeDeleter::operator()(void* p) const noexcept {
+    std::free(p);
+}
 
 // ---------------------------------------------------------------------------
 // Numbered errors
 // ---------------------------------------------------------------------------
 
-void IMPError(int code, int fatal, const char* text) { Report(code, fatal, SafeText(text)); }
+void IMPError(int code, int fatal, const char* text) {
+    Report(code, fatal, SafeText(text));
+}
 
 void IMPErrChar(int code, int fatal, const char* label, const char* value) {
     Report(code, fatal, SafeText(label) + " = \"" + SafeText(value) + "\"");
 }
 
 void IMPErrReal(int code, int fatal, const char* label, double value, int number) {
-    Report(code, fatal,
-           nova::FormatString("%s = %.17g (%d)", label ? label : "", value, number));
+    Report(code, fatal, nova::FormatString("%s = %.17g (%d)", label ? label : "", value, number));
 }
 
-void IMPErrMsg(int code, int fatal) { Report(code, fatal, std::string()); }
+void IMPErrMsg(int code, int fatal) {
+    Report(code, fatal, std::string());
+}
 
-const char* _(const char* text) { return text; }
+const char* _(const char* text) {
+    return text;
+}
 
 const char* MkName(const char* format, ...) {
     constexpr std::size_t kRing = 16;
@@ -223,7 +232,9 @@ double ScanDouble(const char* field, int width) {
 // Vectors and matrices
 // ---------------------------------------------------------------------------
 
-double VecLength(const double* v) { return std::sqrt(v[0] * v[0] + v[1] * v[1] + v[2] * v[2]); }
+double VecLength(const double* v) {
+    return std::sqrt(v[0] * v[0] + v[1] * v[1] + v[2] * v[2]);
+}
 
 void VecNormalize(double* v) {
     const double dfLen = VecLength(v);
@@ -258,7 +269,8 @@ void CrossProduct(const double* a, const double* b, double* out) {
 
 void MV3_Mult(const double* m, const double* v, double* out) {
     double adfResult[3];
-    for (int i = 0; i < 3; ++i) adfResult[i] = m[3 * i] * v[0] + m[3 * i + 1] * v[1] + m[3 * i + 2] * v[2];
+    for (int i = 0; i < 3; ++i)
+        adfResult[i] = m[3 * i] * v[0] + m[3 * i + 1] * v[1] + m[3 * i + 2] * v[2];
     std::memcpy(out, adfResult, sizeof(adfResult));
 }
 
@@ -343,9 +355,15 @@ const char* ErrorCatalogueText(int code) {
     return "Unknown error";
 }
 
-std::uint64_t GetWarningCount() { return gnWarnings.load(); }
-void ResetWarningCount() { gnWarnings = 0; }
-ErrorReport GetLastErrorReport() { return tsLastReport; }
+std::uint64_t GetWarningCount() {
+    return gnWarnings.load();
+}
+void ResetWarningCount() {
+    gnWarnings = 0;
+}
+ErrorReport GetLastErrorReport() {
+    return tsLastReport;
+}
 
 // ---------------------------------------------------------------------------
 // Debug log

@@ -35,9 +35,7 @@ double EvaluateComplete(const double* c, int nCoeffs, double u, double v) {
             return c[0] +
                    ((((c[17] * u + c[11]) * u + c[6]) * u + c[3]) * u + c[2] +
                     (((c[15] * u + c[10]) * u + c[7]) * u + c[5] +
-                     (((c[16] * u + c[12]) * u + c[9]) +
-                      (c[18] * u + c[14] + c[20] * v) * v) *
-                         v) *
+                     (((c[16] * u + c[12]) * u + c[9]) + (c[18] * u + c[14] + c[20] * v) * v) * v) *
                         v) *
                        v +
                    ((((c[19] * u + c[13]) * u + c[8]) * u + c[4]) * u + c[1]) * u;
@@ -49,27 +47,48 @@ double Term(int k, double u, double v) {
     const double u2 = u * u;
     const double v2 = v * v;
     switch (k) {
-        case 0: return 1.0;
-        case 1: return u;
-        case 2: return v;
-        case 3: return u * v;
-        case 4: return u2;
-        case 5: return v2;
-        case 6: return u2 * v;
-        case 7: return u * v2;
-        case 8: return u2 * u;
-        case 9: return v2 * v;
-        case 10: return u2 * v2;
-        case 11: return u2 * u * v;
-        case 12: return u * v2 * v;
-        case 13: return u2 * u2;
-        case 14: return v2 * v2;
-        case 15: return u2 * u * v2;
-        case 16: return u2 * v2 * v;
-        case 17: return u2 * u2 * v;
-        case 18: return u * v2 * v2;
-        case 19: return u2 * u2 * u;
-        default: return v2 * v2 * v;  // 20
+        case 0:
+            return 1.0;
+        case 1:
+            return u;
+        case 2:
+            return v;
+        case 3:
+            return u * v;
+        case 4:
+            return u2;
+        case 5:
+            return v2;
+        case 6:
+            return u2 * v;
+        case 7:
+            return u * v2;
+        case 8:
+            return u2 * u;
+        case 9:
+            return v2 * v;
+        case 10:
+            return u2 * v2;
+        case 11:
+            return u2 * u * v;
+        case 12:
+            return u * v2 * v;
+        case 13:
+            return u2 * u2;
+        case 14:
+            return v2 * v2;
+        case 15:
+            return u2 * u * v2;
+        case 16:
+            return u2 * v2 * v;
+        case 17:
+            return u2 * u2 * v;
+        case 18:
+            return u * v2 * v2;
+        case 19:
+            return u2 * u2 * u;
+        default:
+            return v2 * v2 * v;  // 20
     }
 }
 

@@ -74,7 +74,7 @@ std::string FormatString(const char* format, ...) NOVA_PRINTF_FORMAT(1, 2);
 // Exceptions
 // ---------------------------------------------------------------------------
 class Exception : public std::exception {
-public:
+  public:
     Exception(std::string message, std::string file, std::string function, int line);
     const char* what() const noexcept override { return mosMessage.c_str(); }
     const std::string& GetMessage() const { return mosMessage; }
@@ -82,7 +82,7 @@ public:
     const std::string& GetFunction() const { return mosFunction; }
     int GetLine() const { return mnLine; }
 
-private:
+  private:
     std::string mosMessage;
     std::string mosFile;
     std::string mosFunction;
@@ -90,12 +90,12 @@ private:
 };
 
 class DataException : public Exception {
-public:
+  public:
     using Exception::Exception;
 };
 
 class ParameterException : public DataException {
-public:
+  public:
     ParameterException(std::string name, int type, std::string text1, std::string text2,
                        std::string message, std::string file, std::string function, int line);
     const std::string& GetParameterName() const { return mosName; }
@@ -103,7 +103,7 @@ public:
     const std::string& GetText1() const { return mosText1; }
     const std::string& GetText2() const { return mosText2; }
 
-private:
+  private:
     std::string mosName;
     int mnType;
     std::string mosText1;
@@ -112,21 +112,21 @@ private:
 
 // Thrown by a fatal numbered error report; carries the number and the full text.
 class NumberedError : public Exception {
-public:
+  public:
     NumberedError(int code, std::string message);
     int GetCode() const { return mnCode; }
 
-private:
+  private:
     int mnCode;
 };
 
 // Thrown when an allocation cannot be satisfied.
 class OutOfMemoryException : public Exception {
-public:
+  public:
     explicit OutOfMemoryException(std::uint64_t requested);
     std::uint64_t GetRequestedSize() const { return mnRequested; }
 
-private:
+  private:
     std::uint64_t mnRequested;
 };
 
@@ -163,7 +163,7 @@ struct DebugRecord {
 };
 
 class Debugger {
-public:
+  public:
     using Sink = std::function<void(const DebugRecord&)>;
 
     // Current debug level; 0 turns logging off. Callers test it before they
@@ -184,7 +184,7 @@ public:
 namespace threading {
 
 class Mutex {
-public:
+  public:
     Mutex() = default;
     Mutex(const Mutex&) = delete;
     Mutex& operator=(const Mutex&) = delete;
@@ -195,7 +195,7 @@ public:
     void lock() { Lock(); }
     void unlock() { Unlock(); }
 
-private:
+  private:
     std::mutex moMutex;
 };
 
