@@ -7,6 +7,7 @@ PACKAGES=(
   clang clang-format clang-tidy libclang-rt-dev
   libproj-dev proj-data proj-bin
   libeigen3-dev nlohmann-json3-dev libcli11-dev
+  libopenblas-dev liblapack-dev liblapacke-dev
   libgtest-dev libgmock-dev googletest libbenchmark-dev
 )
 

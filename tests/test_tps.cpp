@@ -1,0 +1,476 @@
+// Thin plate spline: edge cases of the fit, exact interpolation, comparison
+// with an independent solve, failures, copies, concurrency and the model
+// record with its dispatch code.
+#include <gtest/gtest.h>
+
+#include <Eigen/Dense>
+#include <algorithm>
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <random>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "lumo.h"
+#include "projection.h"
+#include "regression.h"
+#include "runtime.h"
+
+namespace {
+
+struct Points {
+    std::vector<double> x, y, X, Y;
+    void Add(double px, double py, double pX, double pY) {
+        x.push_back(px);
+        y.push_back(py);
+        X.push_back(pX);
+        Y.push_back(pY);
+    }
+    int Size() const { return static_cast<int>(x.size()); }
+};
+
+// Well-spread points on a jittered grid over [x0, x0 + extent]² with a smooth
+// non-affine map to an output plane.
+Points SmoothPoints(int n, double x0, double extent, unsigned seed) {
+    std::mt19937 rng(seed);
+    std::uniform_real_distribution<double> jitter(-0.3, 0.3);
+    const int side = static_cast<int>(std::ceil(std::sqrt(n)));
+    Points p;
+    for (int k = 0; k < n; ++k) {
+        const double u = (k % side + 0.5 + jitter(rng)) / side;
+        const double v = (k / side + 0.5 + jitter(rng)) / side;
+        p.Add(x0 + u * extent, x0 + v * extent, 1000.0 + 4000.0 * u + 300.0 * std::sin(3.0 * v),
+              -200.0 + 3500.0 * v + 150.0 * u * u);
+    }
+    return p;
+}
+
+void Fit(TPSInfo_t& t, Points& p) {
+    TPSCalculate(&t, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data());
+}
+
+// Code and message of the fatal error that f raises; 0 when none.
+template <typename F>
+std::pair<int, std::string> FatalOf(F f) {
+    try {
+        f();
+    } catch (const nova::NumberedError& e) {
+        return {e.GetCode(), e.GetMessage()};
+    }
+    return {0, ""};
+}
+
+// The spline evaluated term by term with the scalar formula.
+void ScalarTransform(const TPSInfo_t& t, double x, double y, double* X, double* Y) {
+    double sx = t.padfCoefX[1] * x + t.padfCoefX[0] + t.padfCoefX[2] * y;
+    double sy = t.padfCoefY[1] * x + t.padfCoefY[0] + t.padfCoefY[2] * y;
+    for (int i = 0; i < t.nCPs; ++i) {
+        const double r2 =
+            (y - t.padfCPY[i]) * (y - t.padfCPY[i]) + (x - t.padfCPX[i]) * (x - t.padfCPX[i]);
+        if (r2 > 0.0) {
+            sx += r2 * std::log(r2) * t.padfCoefX[3 + i];
+            sy += r2 * std::log(r2) * t.padfCoefY[3 + i];
+        }
+    }
+    *X = sx;
+    *Y = sy;
+}
+
+}  // namespace
+
+TEST(TpsFit, FewPointsGiveIdentityShiftAndAffineMaps) {
+    TPSInfo_t t(0);
+    double X = 0.0, Y = 0.0;
+    // Never fitted: the identity.
+    TPSTransform(&t, 3.0, -4.0, &X, &Y);
+    EXPECT_EQ(X, 3.0);
+    EXPECT_EQ(Y, -4.0);
+    TPSCalculate(&t, 0, nullptr, nullptr, nullptr, nullptr);
+    TPSTransform(&t, 3.0, -4.0, &X, &Y);
+    EXPECT_EQ(X, 3.0);
+    EXPECT_EQ(Y, -4.0);
+
+    // One point: a shift.
+    Points one;
+    one.Add(0.0, 0.0, 10.0, 20.0);
+    Fit(t, one);
+    TPSTransform(&t, 5.0, 5.0, &X, &Y);
+    EXPECT_DOUBLE_EQ(X, 15.0);
+    EXPECT_DOUBLE_EQ(Y, 25.0);
+    EXPECT_EQ(t.nCPs, 0);
+    EXPECT_EQ(t.nRank, 1);
+    EXPECT_EQ(t.adfAffine[0], 10.0);
+    EXPECT_EQ(t.adfAffine[3], 20.0);
+
+    // Three points: the host regression's affine map, no radial part.
+    Points three;
+    auto affineX = [](double x, double y) { return 2.0 + 3.0 * x - 1.0 * y; };
+    auto affineY = [](double x, double y) { return -1.0 + 0.5 * x + 4.0 * y; };
+    for (const auto& q : {std::pair<double, double>{0, 0}, {10, 0}, {0, 10}})
+        three.Add(q.first, q.second, affineX(q.first, q.second), affineY(q.first, q.second));
+    Fit(t, three);
+    EXPECT_EQ(t.nCPs, 0);
+    EXPECT_EQ(t.nRank, 3);
+    TPSTransform(&t, 7.0, -3.0, &X, &Y);
+    EXPECT_NEAR(X, affineX(7.0, -3.0), 1e-12);
+    EXPECT_NEAR(Y, affineY(7.0, -3.0), 1e-12);
+    GEOInfo_t reg{};
+    int order = 1;
+    GCPRegression2(&reg, "PIXEL", three.x.data(), three.y.data(), "METRE", three.X.data(),
+                   three.Y.data(), 3, &order, 0, nullptr, nullptr);
+    for (int k = 0; k < 6; ++k) EXPECT_EQ(t.adfAffine[k], reg.adfAffine[k]);
+
+    // Two points: still no radial part, both points reproduced.
+    Points two;
+    two.Add(0.0, 0.0, 100.0, 50.0);
+    two.Add(10.0, 5.0, 110.0, 58.0);
+    Fit(t, two);
+    EXPECT_EQ(t.nCPs, 0);
+    EXPECT_EQ(t.nRank, 2);
+    for (int i = 0; i < 2; ++i) {
+        TPSTransform(&t, two.x[i], two.y[i], &X, &Y);
+        EXPECT_NEAR(X, two.X[i], 1e-9);
+        EXPECT_NEAR(Y, two.Y[i], 1e-9);
+    }
+}
+
+TEST(TpsFit, InterpolatesExactlyAndMatchesAnIndependentSolve) {
+    // Map-sized coordinates: the spline's normalisation must carry them.
+    Points p = SmoothPoints(60, 500000.0, 20000.0, 7);
+    TPSInfo_t t(p.Size());
+    Fit(t, p);
+    EXPECT_EQ(t.nCPs, 60);
+    EXPECT_EQ(t.nRank, 63);
+    EXPECT_GT(t.dfCondition, 1.0);
+    for (int i = 0; i < p.Size(); ++i) {
+        double X = 0.0, Y = 0.0;
+        TPSTransform(&t, p.x[i], p.y[i], &X, &Y);
+        EXPECT_NEAR(X, p.X[i], 1e-8 * 4000.0);
+        EXPECT_NEAR(Y, p.Y[i], 1e-8 * 3500.0);
+        EXPECT_EQ(t.padfCPX[i], p.x[i]);  // points stored unnormalised
+    }
+
+    // Independent solve of the same spline in coordinates local to the
+    // first point (a shift leaves the spline unchanged), by LU.
+    const int n = p.Size(), m = n + 3;
+    Eigen::MatrixXd a = Eigen::MatrixXd::Zero(m, m);
+    Eigen::VectorXd bx = Eigen::VectorXd::Zero(m), by = Eigen::VectorXd::Zero(m);
+    const double ox = p.x[0], oy = p.y[0];
+    auto kernel = [](double r2) { return r2 > 0.0 ? r2 * std::log(r2) : 0.0; };
+    for (int i = 0; i < n; ++i) {
+        a(3 + i, 0) = a(0, 3 + i) = 1.0;
+        a(3 + i, 1) = a(1, 3 + i) = p.x[i] - ox;
+        a(3 + i, 2) = a(2, 3 + i) = p.y[i] - oy;
+        for (int j = 0; j < n; ++j)
+            a(3 + i, 3 + j) = kernel(std::pow(p.x[i] - p.x[j], 2) + std::pow(p.y[i] - p.y[j], 2));
+        bx[3 + i] = p.X[i];
+        by[3 + i] = p.Y[i];
+    }
+    const Eigen::PartialPivLU<Eigen::MatrixXd> lu(a);
+    const Eigen::VectorXd cx = lu.solve(bx), cy = lu.solve(by);
+    std::mt19937 rng(11);
+    std::uniform_real_distribution<double> d(0.0, 20000.0);
+    for (int k = 0; k < 50; ++k) {
+        const double x = 500000.0 + d(rng), y = 500000.0 + d(rng);
+        double ex = cx[0] + cx[1] * (x - ox) + cx[2] * (y - oy);
+        double ey = cy[0] + cy[1] * (x - ox) + cy[2] * (y - oy);
+        for (int i = 0; i < n; ++i) {
+            const double u = kernel(std::pow(x - p.x[i], 2) + std::pow(y - p.y[i], 2));
+            ex += u * cx[3 + i];
+            ey += u * cy[3 + i];
+        }
+        double X = 0.0, Y = 0.0;
+        TPSTransform(&t, x, y, &X, &Y);
+        EXPECT_NEAR(X, ex, 1e-7 * 4000.0);
+        EXPECT_NEAR(Y, ey, 1e-7 * 3500.0);
+        // The vectorised sum agrees with the scalar formula.
+        double sX = 0.0, sY = 0.0;
+        ScalarTransform(t, x, y, &sX, &sY);
+        EXPECT_NEAR(X, sX, 1e-12 * std::abs(sX));
+        EXPECT_NEAR(Y, sY, 1e-12 * std::abs(sY));
+    }
+    // Weights are orthogonal to the affine part.
+    double sw = 0.0, swx = 0.0, swAbs = 0.0;
+    for (int i = 0; i < n; ++i) {
+        sw += t.padfCoefX[3 + i];
+        swx += t.padfCoefX[3 + i] * (p.x[i] - ox);
+        swAbs += std::abs(t.padfCoefX[3 + i]);
+    }
+    EXPECT_LT(std::abs(sw), 1e-10 * swAbs);
+    EXPECT_LT(std::abs(swx), 1e-10 * swAbs * 20000.0);
+}
+
+TEST(TpsFit, SizesTooSmallArraysAndKeepsLargerOnes) {
+    Points p = SmoothPoints(25, 0.0, 100.0, 3);
+    TPSInfo_t small(2);
+    Fit(small, p);
+    EXPECT_EQ(small.nAllocCPs, 25);
+    EXPECT_EQ(small.nCPs, 25);
+    double X = 0.0, Y = 0.0;
+    TPSTransform(&small, p.x[24], p.y[24], &X, &Y);
+    EXPECT_NEAR(X, p.X[24], 1e-7);
+    TPSInfo_t large(40);
+    Fit(large, p);
+    EXPECT_EQ(large.nAllocCPs, 40);
+    EXPECT_EQ(large.nCPs, 25);
+
+    TPSInfo_t t(3);
+    t.SetNumCPs(0);
+    EXPECT_EQ(t.nAllocCPs, 0);
+    EXPECT_EQ(t.padfCPX, nullptr);
+    t.SetNumCPs(5);
+    EXPECT_EQ(t.nAllocCPs, 5);
+    ASSERT_NE(t.padfCoefY, nullptr);
+    t.padfCoefY[7] = 1.0;  // n + 3 coefficients
+}
+
+TEST(TpsFit, FailuresRaiseErrorHundredAndKeepTheSpline) {
+    Points p = SmoothPoints(10, 0.0, 100.0, 5);
+    TPSInfo_t t(0);
+    Fit(t, p);
+    double X0 = 0.0, Y0 = 0.0;
+    TPSTransform(&t, 33.0, 44.0, &X0, &Y0);
+
+    Points sameIn;
+    for (int i = 0; i < 5; ++i) sameIn.Add(1.0, 2.0, i, 2.0 * i);
+    auto e = FatalOf([&] { Fit(t, sameIn); });
+    EXPECT_EQ(e.first, 100);
+    EXPECT_NE(e.second.find("All GCP coordinates are equal. Please check your GCPs."),
+              std::string::npos);
+    Points sameOut;
+    for (int i = 0; i < 5; ++i) sameOut.Add(i, i * i, 7.0, 8.0);
+    EXPECT_EQ(FatalOf([&] { Fit(t, sameOut); }).first, 100);
+    Points twoSame;
+    twoSame.Add(1.0, 1.0, 5.0, 5.0);
+    twoSame.Add(1.0, 1.0, 6.0, 7.0);
+    EXPECT_EQ(FatalOf([&] { Fit(t, twoSame); }).first, 100);
+
+    Points bad = p;
+    bad.Y[4] = std::nan("");
+    e = FatalOf([&] { Fit(t, bad); });
+    EXPECT_EQ(e.first, 100);
+    EXPECT_NE(e.second.find("Control point 5"), std::string::npos);
+    EXPECT_NE(e.second.find("nan"), std::string::npos);
+    EXPECT_EQ(
+        FatalOf([&] { TPSCalculate(&t, 4, nullptr, p.y.data(), p.X.data(), p.Y.data()); }).first,
+        100);
+    EXPECT_EQ(FatalOf([&] {
+                  TPSCalculate(nullptr, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data());
+              }).first,
+              100);
+
+    // The spline of the last good fit is intact.
+    double X = 0.0, Y = 0.0;
+    TPSTransform(&t, 33.0, 44.0, &X, &Y);
+    EXPECT_EQ(X, X0);
+    EXPECT_EQ(Y, Y0);
+    EXPECT_EQ(t.nCPs, 10);
+}
+
+TEST(TpsFit, CoincidentControlPointsLowerTheRank) {
+    Points p = SmoothPoints(8, 0.0, 100.0, 9);
+    p.Add(p.x[2], p.y[2], p.X[2], p.Y[2]);  // a repeated point
+    TPSInfo_t t(0);
+    Fit(t, p);
+    EXPECT_EQ(t.nCPs, 9);
+    EXPECT_EQ(t.nRank, 11);  // n + 3 - 1
+    EXPECT_GT(t.dfCondition, 0.0);
+    for (int i = 0; i < p.Size(); ++i) {
+        double X = 0.0, Y = 0.0;
+        TPSTransform(&t, p.x[i], p.y[i], &X, &Y);
+        EXPECT_NEAR(X, p.X[i], 1e-6);
+        EXPECT_NEAR(Y, p.Y[i], 1e-6);
+    }
+}
+
+TEST(TpsFit, LargeSetsKeepRankAndInterpolation) {
+    // Enough points for the solver's block-pivoted path, with repeats.
+    Points p = SmoothPoints(400, 0.0, 5000.0, 13);
+    for (int i : {10, 200, 350}) {
+        p.Add(p.x[i], p.y[i], p.X[i], p.Y[i]);
+    }
+    TPSInfo_t t(0);
+    Fit(t, p);
+    EXPECT_EQ(t.nCPs, 403);
+    EXPECT_EQ(t.nRank, 403);  // n + 3 less the three repeats
+    double worst = 0.0;
+    for (int i = 0; i < p.Size(); ++i) {
+        double X = 0.0, Y = 0.0;
+        TPSTransform(&t, p.x[i], p.y[i], &X, &Y);
+        worst = std::max({worst, std::abs(X - p.X[i]), std::abs(Y - p.Y[i])});
+    }
+    EXPECT_LT(worst, 1e-8 * 4000.0);
+}
+
+TEST(TpsResiduals, KnownOffsetsAndEmptySets) {
+    TPSInfo_t t(0);
+    double mx = 9, my = 9, rx = 9, ry = 9;
+    TPSRMSError(&t, 0, nullptr, nullptr, nullptr, nullptr, &mx, &my, &rx, &ry);
+    EXPECT_EQ(mx, 0.0);
+    EXPECT_EQ(my, 0.0);
+    EXPECT_EQ(rx, 0.0);
+    EXPECT_EQ(ry, 0.0);
+
+    Points one;
+    one.Add(0.0, 0.0, 10.0, 20.0);  // shift by (10, 20)
+    Fit(t, one);
+    // Given outputs off by +1, -1, +3 in X and 2, 2, 2 in Y.
+    std::vector<double> x{1, 2, 3}, y{0, 0, 0}, X{10, 13, 10}, Y{18, 18, 18};
+    TPSRMSError(&t, 3, x.data(), y.data(), X.data(), Y.data(), &mx, &my, &rx, &ry);
+    EXPECT_DOUBLE_EQ(mx, (1.0 - 1.0 + 3.0) / 3.0);
+    EXPECT_DOUBLE_EQ(my, 2.0);
+    EXPECT_DOUBLE_EQ(rx, std::sqrt((1.0 + 1.0 + 9.0) / 3.0));
+    EXPECT_DOUBLE_EQ(ry, 2.0);
+    EXPECT_EQ(FatalOf([&] {
+                  TPSRMSError(&t, 3, x.data(), y.data(), X.data(), Y.data(), nullptr, &my, &rx,
+                              &ry);
+              }).first,
+              100);
+}
+
+TEST(TpsSpline, CopiesAreDeepAndEqual) {
+    Points p = SmoothPoints(12, 0.0, 50.0, 1);
+    TPSInfo_t* psA = new TPSInfo_t(0);
+    Fit(*psA, p);
+    TPSInfo_t b(*psA);
+    TPSInfo_t c(3);
+    c = *psA;
+    c = c;  // self-assignment keeps it
+    EXPECT_NE(b.padfCoefX, psA->padfCoefX);
+    EXPECT_EQ(c.nRank, psA->nRank);
+    EXPECT_EQ(c.dfCondition, psA->dfCondition);
+    double ax = 0, ay = 0;
+    TPSTransform(psA, 20.0, 30.0, &ax, &ay);
+    delete psA;  // the copies own their arrays
+    double bx = 0, by = 0, cx = 0, cy = 0;
+    TPSTransform(&b, 20.0, 30.0, &bx, &by);
+    TPSTransform(&c, 20.0, 30.0, &cx, &cy);
+    EXPECT_EQ(bx, ax);
+    EXPECT_EQ(by, ay);
+    EXPECT_EQ(cx, ax);
+    EXPECT_EQ(cy, ay);
+}
+
+TEST(TpsConcurrency, FitsAndEvaluationsOnSeveralThreads) {
+    constexpr int kThreads = 4;
+    std::vector<Points> sets;
+    std::vector<std::unique_ptr<TPSInfo_t>> serial;
+    for (int k = 0; k < kThreads; ++k) {
+        sets.push_back(SmoothPoints(150 + 40 * k, 0.0, 1000.0, 100 + k));
+        serial.emplace_back(new TPSInfo_t(0));
+        Fit(*serial.back(), sets.back());
+    }
+    std::vector<std::unique_ptr<TPSInfo_t>> parallel(kThreads);
+    std::vector<double> rmsX(kThreads, -1.0);
+    std::vector<std::thread> threads;
+    for (int k = 0; k < kThreads; ++k) {
+        threads.emplace_back([&, k] {
+            parallel[k].reset(new TPSInfo_t(0));
+            Fit(*parallel[k], sets[k]);
+            double mx, my, ry;
+            TPSRMSError(parallel[k].get(), sets[k].Size(), sets[k].x.data(), sets[k].y.data(),
+                        sets[k].X.data(), sets[k].Y.data(), &mx, &my, &rmsX[k], &ry);
+        });
+    }
+    for (auto& th : threads) th.join();
+    for (int k = 0; k < kThreads; ++k) {
+        ASSERT_EQ(parallel[k]->nCPs, serial[k]->nCPs);
+        EXPECT_EQ(parallel[k]->nRank, serial[k]->nRank);
+        for (int i = 0; i < serial[k]->nCPs + 3; ++i)
+            EXPECT_EQ(parallel[k]->padfCoefX[i], serial[k]->padfCoefX[i]);
+        EXPECT_LT(rmsX[k], 1e-6);
+    }
+
+    // One spline evaluated from several threads gives the serial results.
+    const TPSInfo_t& shared = *serial[0];
+    std::vector<double> expect(200);
+    for (int i = 0; i < 100; ++i)
+        TPSTransform(serial[0].get(), 5.0 * i, 1000.0 - 7.0 * i, &expect[2 * i],
+                     &expect[2 * i + 1]);
+    std::vector<int> mismatches(kThreads, 0);
+    threads.clear();
+    for (int k = 0; k < kThreads; ++k) {
+        threads.emplace_back([&, k] {
+            for (int rep = 0; rep < 20; ++rep)
+                for (int i = 0; i < 100; ++i) {
+                    double X, Y;
+                    TPSTransform(const_cast<TPSInfo_t*>(&shared), 5.0 * i, 1000.0 - 7.0 * i, &X,
+                                 &Y);
+                    mismatches[k] += X != expect[2 * i] || Y != expect[2 * i + 1];
+                }
+        });
+    }
+    for (auto& th : threads) th.join();
+    for (int k = 0; k < kThreads; ++k) EXPECT_EQ(mismatches[k], 0);
+}
+
+namespace {
+
+struct ModelDeleter {
+    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
+};
+using ModelPtr = std::unique_ptr<TPSMInfo_t, ModelDeleter>;
+
+}  // namespace
+
+TEST(TpsModel, AllocateCopyReleaseAndDispatchCodeFive) {
+    ModelPtr model(TPSAllocate(nullptr));
+    ASSERT_NE(model->psGeoToImage, nullptr);
+    ASSERT_NE(model->psImageToGeo, nullptr);
+    EXPECT_EQ(model->psGeoToImage->nType, TRN_TPS);
+    EXPECT_EQ(model->psImageToGeo->bCalculated, 0);
+    EXPECT_EQ(model->nPixels, 0);
+    ASSERT_NE(model->psProjInfo, nullptr);
+
+    // Before a fit the dispatch succeeds with zeros, as the family reports.
+    double px = 5, ln = 5;
+    EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), 1.0, 2.0, 0.0, &px, &ln), 1);
+    EXPECT_EQ(px, 0.0);
+    EXPECT_EQ(ln, 0.0);
+
+    Points p = SmoothPoints(30, 0.0, 1000.0, 21);  // ground -> image
+    TRNCalculate(model->psGeoToImage, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data(),
+                 nullptr);
+    TRNCalculate(model->psImageToGeo, p.Size(), p.X.data(), p.Y.data(), p.x.data(), p.y.data(),
+                 nullptr);
+    model->nPixels = 4000;
+    model->nLines = 3500;
+    std::strcpy(model->pszGeosys, "UTM 11 D000");
+
+    EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), p.x[3], p.y[3], 123.0, &px, &ln), 1);
+    EXPECT_NEAR(px, p.X[3], 1e-6);
+    EXPECT_NEAR(ln, p.Y[3], 1e-6);
+    double gx = 0, gy = 0, z = 77.0;
+    EXPECT_EQ(GenImg2GeoDem(LUMO_CODE_TPS, model.get(), p.X[3], p.Y[3], &z, &gx, &gy), 1);
+    EXPECT_NEAR(gx, p.x[3], 1e-6);
+    EXPECT_NEAR(gy, p.y[3], 1e-6);
+    EXPECT_EQ(z, 77.0);
+    EXPECT_EQ(GenImg2Geo(LUMO_CODE_TPS, model.get(), p.X[3], p.Y[3], LUMO_NULL_VALUE, &gx, &gy), 1);
+
+    // A copy into a record that TPSAllocate filled in place.
+    auto* psRaw = static_cast<TPSMInfo_t*>(HCalloc(1, sizeof(TPSMInfo_t)));
+    psRaw->nPixels = 9;
+    ModelPtr copy(TPSAllocate(psRaw));
+    ASSERT_EQ(copy.get(), psRaw);
+    EXPECT_EQ(copy->nPixels, 9);
+    TPSCopy(copy.get(), model.get());
+    TPSCopy(copy.get(), nullptr);
+    TPSCopy(nullptr, model.get());
+    EXPECT_EQ(copy->nPixels, 4000);
+    EXPECT_EQ(copy->nLines, 3500);
+    EXPECT_STREQ(copy->pszGeosys, "UTM 11 D000");
+    EXPECT_EQ(copy->psGeoToImage->bCalculated, 1);
+    EXPECT_NE(copy->psGeoToImage->pModel, model->psGeoToImage->pModel);
+    double expectPx = 0, expectLn = 0;
+    TPSGeo2Img(model.get(), 250.0, 600.0, &expectPx, &expectLn);
+    model.reset();  // the copy stands alone
+    TPSGeo2Img(copy.get(), 250.0, 600.0, &px, &ln);
+    EXPECT_EQ(px, expectPx);
+    EXPECT_EQ(ln, expectLn);
+    TPSImg2Geo(copy.get(), p.X[0], p.Y[0], &gx, &gy);
+    EXPECT_NEAR(gx, p.x[0], 1e-6);
+    TPSDeallocate(nullptr);
+}
