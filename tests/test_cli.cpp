@@ -295,6 +295,10 @@ TEST_F(CliTest, PointFileErrorsNamePlace) {
 TEST_F(CliTest, DemoRoundTripsAreSmall) {
     ASSERT_FALSE(lumo::cli::FamilyDemos().empty());
     for (const auto& demo : lumo::cli::FamilyDemos()) {
+        // The rigorous row measures a fitted model against simulated truth,
+        // and its two directions are approximate inverses: its bounds are
+        // those of test_srit_cli.
+        if (std::string(demo.pszFamily) == "srit") continue;
         const auto r = lumo::cli::RunFamilyDemo(demo, kExamples);
         EXPECT_GE(r.nGcps, 10u) << demo.pszFamily;
         EXPECT_EQ(r.sImageRoundTrip.nCount, r.nGcps + 81);
@@ -369,7 +373,7 @@ TEST_F(CliTest, CommandFailuresAreReportedAndKeepOutput) {
         {{"poly", kModel, "--to-image", farPoints, "-o", out}, "(id \"Far\"): the image position"},
         {{"poly", (mDir / "none.json").string(), "--to-image", kGcps, "-o", out}, "none.json"},
         {{"poly", tps, "--to-image", kGcps, "-o", out}, "not a polynomial model"},
-        {{"transform", tps, "--to-image", kGcps, "-o", out}, "unknown model family \"tps\""},
+        {{"transform", tps, "--to-image", kGcps, "-o", out}, "field \"tps.geoToImage\" is missing"},
         {{"poly", kModel, "--to-image", kGcps, "--to-ground", kGcps}, "excludes"},
         {{"poly", kModel}, "--to-image POINTS or --to-ground POINTS"},
         {{"transform"}, "model is required"},

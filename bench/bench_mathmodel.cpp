@@ -1,0 +1,151 @@
+// Point transforms through the math model object against the family
+// functions they wrap: the object's cost is the difference per point.
+#include <benchmark/benchmark.h>
+
+#include <cmath>
+#include <cstring>
+#include <memory>
+#include <random>
+#include <vector>
+
+#include "lumo.h"
+#include "nova/projection.h"
+
+namespace {
+
+constexpr std::size_t kPoints = 4096;
+constexpr const char* kGeosys = "UTM 31 U D000";
+
+struct PolyDeleter {
+    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
+};
+struct TpsDeleter {
+    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
+};
+
+struct Points {
+    std::vector<double> x, y;
+};
+
+Points GroundPoints(std::size_t n, unsigned seed) {
+    std::mt19937 rng(seed);
+    std::uniform_real_distribution<double> east(440000.0, 500000.0), north(5660000.0, 5720000.0);
+    Points p;
+    for (std::size_t i = 0; i < n; ++i) {
+        p.x.push_back(east(rng));
+        p.y.push_back(north(rng));
+    }
+    return p;
+}
+
+// A third-order polynomial over a UTM 31 scene (the bundled example's size).
+std::unique_ptr<POLYInfo_t, PolyDeleter> MakePoly() {
+    std::unique_ptr<POLYInfo_t, PolyDeleter> p(POLYAllocate());
+    p->nCoeffs = 10;
+    p->nPixels = p->nLines = 6000;
+    const double pixel[10] = {-44000.0, 0.1, 1e-3, 1e-12, 1e-12, 1e-12, 0, 0, 0, 0};
+    const double line[10] = {572000.0, 1e-3, -0.1, 1e-12, 1e-12, 1e-12, 0, 0, 0, 0};
+    std::memcpy(p->padfPixelCoeffs, pixel, sizeof pixel);
+    std::memcpy(p->padfLineCoeffs, line, sizeof line);
+    std::strcpy(p->pszGeosys, kGeosys);
+    Geosys2ProjInfo(p->psProjInfo, kGeosys, 0.0, 0.0, 1.0, 1.0);
+    return p;
+}
+
+// A spline through `n` control points spread over the same scene.
+std::unique_ptr<TPSMInfo_t, TpsDeleter> MakeTps(int n) {
+    std::unique_ptr<TPSMInfo_t, TpsDeleter> t(TPSAllocate(nullptr));
+    Points g = GroundPoints(static_cast<std::size_t>(n), 11);
+    std::vector<double> pixel, line;
+    for (int i = 0; i < n; ++i) {
+        pixel.push_back((g.x[i] - 440000.0) / 10.0 + 0.3 * std::sin(g.y[i] * 1e-3));
+        line.push_back((5720000.0 - g.y[i]) / 10.0 + 0.3 * std::cos(g.x[i] * 1e-3));
+    }
+    TRNCalculate(t->psGeoToImage, n, g.x.data(), g.y.data(), pixel.data(), line.data(), nullptr);
+    TRNCalculate(t->psImageToGeo, n, pixel.data(), line.data(), g.x.data(), g.y.data(), nullptr);
+    t->nPixels = t->nLines = 6000;
+    std::strcpy(t->pszGeosys, kGeosys);
+    Geosys2ProjInfo(t->psProjInfo, kGeosys, 0.0, 0.0, 1.0, 1.0);
+    return t;
+}
+
+void BM_PolyFamily(benchmark::State& state) {
+    auto poly = MakePoly();
+    const Points g = GroundPoints(kPoints, 1);
+    std::size_t i = 0;
+    for (auto _ : state) {
+        double pixel, line;
+        POLYGeo2Img(poly.get(), g.x[i], g.y[i], &pixel, &line);
+        benchmark::DoNotOptimize(pixel);
+        benchmark::DoNotOptimize(line);
+        i = (i + 1) % kPoints;
+    }
+}
+BENCHMARK(BM_PolyFamily);
+
+// Through the host interface, as host code sees the object.
+void BM_PolyObject(benchmark::State& state) {
+    auto poly = MakePoly();
+    const std::unique_ptr<nova::mathmodel::IMathModel> model(
+        new nova::mathmodel::LumoMathModel(LUMO_CODE_POLY, poly.get()));
+    const Points g = GroundPoints(kPoints, 1);
+    std::size_t i = 0;
+    for (auto _ : state) {
+        double pixel, line;
+        benchmark::DoNotOptimize(model->GroundToImage(g.x[i], g.y[i], 0.0, pixel, line, false));
+        benchmark::DoNotOptimize(pixel);
+        benchmark::DoNotOptimize(line);
+        i = (i + 1) % kPoints;
+    }
+}
+BENCHMARK(BM_PolyObject);
+
+void BM_TpsFamily(benchmark::State& state) {
+    auto tps = MakeTps(static_cast<int>(state.range(0)));
+    const Points g = GroundPoints(kPoints, 2);
+    std::size_t i = 0;
+    for (auto _ : state) {
+        double pixel, line;
+        TPSGeo2Img(tps.get(), g.x[i], g.y[i], &pixel, &line);
+        benchmark::DoNotOptimize(pixel);
+        benchmark::DoNotOptimize(line);
+        i = (i + 1) % kPoints;
+    }
+}
+BENCHMARK(BM_TpsFamily)->Arg(15)->Arg(100);
+
+void BM_TpsObject(benchmark::State& state) {
+    auto tps = MakeTps(static_cast<int>(state.range(0)));
+    const std::unique_ptr<nova::mathmodel::IMathModel> model(
+        new nova::mathmodel::LumoMathModel(LUMO_CODE_TPS, tps.get()));
+    const Points g = GroundPoints(kPoints, 2);
+    std::size_t i = 0;
+    for (auto _ : state) {
+        double pixel, line;
+        benchmark::DoNotOptimize(model->GroundToImage(g.x[i], g.y[i], 0.0, pixel, line, false));
+        benchmark::DoNotOptimize(pixel);
+        benchmark::DoNotOptimize(line);
+        i = (i + 1) % kPoints;
+    }
+}
+BENCHMARK(BM_TpsObject)->Arg(15)->Arg(100);
+
+void BM_PolyObjectImageToGround(benchmark::State& state) {
+    auto poly = MakePoly();
+    poly->padfXCoeffs[1] = 10.0;
+    poly->padfYCoeffs[2] = -10.0;
+    const std::unique_ptr<nova::mathmodel::IMathModel> model(
+        new nova::mathmodel::LumoMathModel(LUMO_CODE_POLY, poly.get()));
+    std::size_t i = 0;
+    for (auto _ : state) {
+        double x, y;
+        benchmark::DoNotOptimize(
+            model->ImageToGround(static_cast<double>(i), 3000.0, 0.0, x, y, false));
+        benchmark::DoNotOptimize(x);
+        benchmark::DoNotOptimize(y);
+        i = (i + 1) % kPoints;
+    }
+}
+BENCHMARK(BM_PolyObjectImageToGround);
+
+}  // namespace

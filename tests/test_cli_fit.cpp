@@ -1,0 +1,395 @@
+// The fitting commands of the lumo tool end to end: fit -> transform ->
+// residuals for polynomial and spline models, the spline model file, and
+// every failure path of fit and residuals.
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include <Eigen/Dense>
+#include <algorithm>
+#include <cmath>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <regex>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "cli.h"
+#include "demo.h"
+#include "lumo.h"
+#include "model_io.h"
+#include "nova/runtime.h"
+#include "points_io.h"
+#include "tps_io.h"
+
+namespace fs = std::filesystem;
+using lumo::cli::PointKind;
+using nlohmann::json;
+
+namespace {
+
+const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
+const std::string kGcps = kExamples + "/poly_utm31_gcps.csv";
+constexpr const char* kGeosys = "UTM 31 U D000";
+
+class FitTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
+        mDir = fs::temp_directory_path() /
+               ("lumo_fit_" + std::string(info->name()) + "_" + std::to_string(::getpid()));
+        fs::create_directories(mDir);
+    }
+    void TearDown() override { fs::remove_all(mDir); }
+    std::string Path(const std::string& name) const { return (mDir / name).string(); }
+    std::string Write(const std::string& name, const std::string& text) const {
+        std::ofstream(Path(name), std::ios::binary) << text;
+        return Path(name);
+    }
+    fs::path mDir;
+};
+
+struct RunResult {
+    int nCode;
+    std::string osOut;
+    std::string osErr;
+};
+
+RunResult RunTool(std::vector<std::string> args) {
+    args.insert(args.begin(), "lumo");
+    std::vector<char*> argv;
+    argv.reserve(args.size());
+    for (auto& a : args) argv.push_back(a.data());
+    std::ostringstream out, err;
+    const int code = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
+    return {code, out.str(), err.str()};
+}
+
+std::string ReadText(const std::string& path) {
+    std::ifstream in(path);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+// A number that follows `label` in the text (e.g. "rms dpixel 1.2e-05").
+double NumberAfter(const std::string& text, const std::string& label) {
+    std::smatch m;
+    const std::regex re(label + " ([-+0-9.eE]+)");
+    if (!std::regex_search(text, m, re)) {
+        ADD_FAILURE() << "no " << label << " in:\n" << text;
+        return std::nan("");
+    }
+    return std::stod(m[1]);
+}
+
+// Root mean square of the residuals of a least-squares polynomial of the
+// given order, fitted here with Eigen on centred and scaled coordinates: an
+// independent check of the host regression behind `lumo fit`.
+double IndependentRms(const std::vector<double>& u, const std::vector<double>& v,
+                      const std::vector<double>& target, int order) {
+    const int n = static_cast<int>(u.size());
+    double mu = 0, mv = 0;
+    for (int i = 0; i < n; ++i) mu += u[i] / n, mv += v[i] / n;
+    const double s = 1e4;
+    std::vector<std::pair<int, int>> powers;
+    for (int d = 0; d <= order; ++d)
+        for (int a = d; a >= 0; --a) powers.emplace_back(a, d - a);
+    Eigen::MatrixXd A(n, static_cast<int>(powers.size()));
+    Eigen::VectorXd b(n);
+    for (int i = 0; i < n; ++i) {
+        for (std::size_t k = 0; k < powers.size(); ++k) {
+            A(i, static_cast<int>(k)) = std::pow((u[i] - mu) / s, powers[k].first) *
+                                        std::pow((v[i] - mv) / s, powers[k].second);
+        }
+        b(i) = target[i];
+    }
+    const Eigen::VectorXd c = A.colPivHouseholderQr().solve(b);
+    return std::sqrt((A * c - b).squaredNorm() / n);
+}
+
+lumo::cli::PointSet BundledGcps() {
+    return lumo::cli::ReadPointsFile(kGcps, PointKind::ControlPoint);
+}
+
+TEST_F(FitTest, PolyFitTransformResidualsEndToEnd) {
+    const std::string model = Path("poly.json");
+    RunResult r = RunTool({"fit", "--model", "poly", "--gcps", kGcps, "--order", "2", "--geosys",
+                           kGeosys, "-o", model});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osOut.find("order 2 (6 terms) to 15 control points"), std::string::npos);
+
+    const lumo::cli::LoadedModel loaded = lumo::cli::ReadModelFile(model);
+    ASSERT_EQ(loaded.nModelCode, LUMO_CODE_POLY);
+    EXPECT_EQ(loaded.AsPoly()->nCoeffs, 6);
+    EXPECT_EQ(loaded.sEnvelope.osGeosys, kGeosys);
+    EXPECT_EQ(loaded.sEnvelope.nPixels, 5812);  // largest pixel 5811.00 lies inside
+    EXPECT_EQ(loaded.sEnvelope.nLines, 5891);
+
+    // Residual RMS against an independent least-squares fit of the same order.
+    const auto gcps = BundledGcps();
+    std::vector<double> px, ln, x, y;
+    for (const auto& p : gcps.asPoints) {
+        px.push_back(p.dfPixel), ln.push_back(p.dfLine), x.push_back(p.dfX), y.push_back(p.dfY);
+    }
+    r = RunTool({"residuals", model, "--gcps", kGcps});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NEAR(NumberAfter(r.osOut, "rms dpixel"), IndependentRms(x, y, px, 2), 1e-5);
+    EXPECT_NEAR(NumberAfter(r.osOut, "dline"), IndependentRms(x, y, ln, 2), 1e-5);
+    EXPECT_NEAR(NumberAfter(r.osOut, "rms dx"), IndependentRms(px, ln, x, 2), 1e-4);
+    EXPECT_NEAR(NumberAfter(r.osOut, "dy"), IndependentRms(px, ln, y, 2), 1e-4);
+
+    // The per-point residuals read back as a point file and agree with the
+    // model's own transform.
+    const std::string table = Path("residuals.csv");
+    r = RunTool({"residuals", model, "--gcps", kGcps, "-o", table});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osOut.find("# rms dpixel"), std::string::npos);
+    const auto back = lumo::cli::ReadPointsFile(table, PointKind::ControlPoint);
+    ASSERT_EQ(back.asPoints.size(), 15u);
+    r = RunTool({"transform", model, "--to-image", kGcps});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    std::istringstream transformed(r.osOut);
+    const auto mapped = lumo::cli::ReadPoints(transformed, "out", PointKind::ControlPoint);
+    ASSERT_EQ(mapped.asPoints.size(), 15u);
+    std::istringstream tableText(ReadText(table));
+    std::string header;
+    std::getline(tableText, header);
+    EXPECT_EQ(header, "id,pixel,line,x,y,z,dpixel,dline,dx,dy");
+    for (std::size_t i = 0; i < 15; ++i) {
+        std::string row;
+        std::getline(tableText, row);
+        std::vector<std::string> f;
+        std::stringstream fields(row);
+        for (std::string item; std::getline(fields, item, ',');) f.push_back(item);
+        ASSERT_EQ(f.size(), 10u);
+        EXPECT_EQ(f[0], gcps.asPoints[i].osId);
+        EXPECT_DOUBLE_EQ(std::stod(f[6]), mapped.asPoints[i].dfPixel - gcps.asPoints[i].dfPixel);
+        EXPECT_DOUBLE_EQ(std::stod(f[7]), mapped.asPoints[i].dfLine - gcps.asPoints[i].dfLine);
+    }
+}
+
+TEST_F(FitTest, PolyOrdersAndRawCoefficientPrecision) {
+    // Order 4 on 15 points interpolates; the raw coefficients still hold it.
+    const std::string model = Path("p4.json");
+    RunResult r = RunTool({"fit", "--model", "poly", "--gcps", kGcps, "--order", "4", "--geosys",
+                           kGeosys, "-o", model});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunTool({"residuals", model, "--gcps", kGcps});
+    ASSERT_EQ(r.nCode, 0);
+    EXPECT_LT(NumberAfter(r.osOut, "max"), 1e-6);
+
+    // Order 5 needs 21 points: lowered to 4 with a warning.
+    r = RunTool({"fit", "--model", "poly", "--gcps", kGcps, "--order", "5", "--geosys", kGeosys,
+                 "-o", Path("p5.json")});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osErr.find("determine only order 4"), std::string::npos);
+    EXPECT_EQ(lumo::cli::ReadModelFile(Path("p5.json")).AsPoly()->nCoeffs, 15);
+
+    // A 7 x 7 grid of UTM points with a fifth-order distortion: order 5 is
+    // determined, but its raw-coordinate coefficients cannot reproduce it to
+    // 1e-6 pixel, so it is refused and no file is written.
+    std::string csv = "id,pixel,line,x,y\n";
+    for (int i = 0; i < 7; ++i) {
+        for (int j = 0; j < 7; ++j) {
+            const double p = i * 1000.0 + 13.7 * j, l = j * 1000.0 + 7.1 * i;
+            const double u = p / 6000, v = l / 6000;
+            const double x = 440000 + 10 * p + 0.08 * l + 30 * u * u * v + 20 * std::pow(u, 5);
+            const double y = 5720000 - 10 * l + 0.09 * p + 25 * u * v * v - 12 * std::pow(v, 5);
+            csv += "P" + std::to_string(i * 7 + j) + "," + lumo::cli::FormatDouble(p) + "," +
+                   lumo::cli::FormatDouble(l) + "," + lumo::cli::FormatDouble(x) + "," +
+                   lumo::cli::FormatDouble(y) + "\n";
+        }
+    }
+    const std::string grid = Write("grid.csv", csv);
+    r = RunTool({"fit", "--model", "poly", "--gcps", grid, "--order", "5", "--geosys", kGeosys,
+                 "-o", Path("g5.json")});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("--order 5: the model file keeps raw-coordinate coefficients"),
+              std::string::npos)
+        << r.osErr;
+    EXPECT_FALSE(fs::exists(Path("g5.json")));
+    r = RunTool({"fit", "--model", "poly", "--gcps", grid, "--order", "3", "--geosys", kGeosys,
+                 "-o", Path("g3.json")});
+    EXPECT_EQ(r.nCode, 0) << r.osErr;
+}
+
+TEST_F(FitTest, TpsFitTransformResidualsEndToEnd) {
+    const std::string model = Path("tps.json");
+    RunResult r = RunTool({"fit", "--model", "tps", "--gcps", kGcps, "--geosys", kGeosys,
+                           "--pixels", "6000", "--lines", "6000", "-o", model});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osOut.find("rank ground->image 18, image->ground 18"), std::string::npos);
+
+    // The file reads back into a spline that evaluates bit for bit like one
+    // fitted here in memory.
+    const lumo::cli::LoadedModel loaded = lumo::cli::ReadModelFile(model);
+    ASSERT_EQ(loaded.nModelCode, LUMO_CODE_TPS);
+    auto* fromFile = static_cast<TPSMInfo_t*>(loaded.poRecord.get());
+    EXPECT_EQ(fromFile->nPixels, 6000);
+    EXPECT_STREQ(fromFile->pszGeosys, kGeosys);
+    const auto gcps = BundledGcps();
+    std::vector<double> px, ln, x, y;
+    for (const auto& p : gcps.asPoints) {
+        px.push_back(p.dfPixel), ln.push_back(p.dfLine), x.push_back(p.dfX), y.push_back(p.dfY);
+    }
+    lumo::cli::TpsPtr direct(TPSAllocate(nullptr));
+    TRNCalculate(direct->psGeoToImage, 15, x.data(), y.data(), px.data(), ln.data(), nullptr);
+    TRNCalculate(direct->psImageToGeo, 15, px.data(), ln.data(), x.data(), y.data(), nullptr);
+    for (double gx = 440000; gx <= 500000; gx += 7500) {
+        for (double gy = 5660000; gy <= 5720000; gy += 7500) {
+            double a1 = 0, b1 = 0, a2 = 0, b2 = 0;
+            TPSGeo2Img(fromFile, gx, gy, &a1, &b1);
+            TPSGeo2Img(direct.get(), gx, gy, &a2, &b2);
+            EXPECT_EQ(a1, a2);
+            EXPECT_EQ(b1, b2);
+            const double ip = (gx - 440000) / 10, il = (5720000 - gy) / 10;
+            TPSImg2Geo(fromFile, ip, il, &a1, &b1);
+            TPSImg2Geo(direct.get(), ip, il, &a2, &b2);
+            EXPECT_EQ(a1, a2);
+            EXPECT_EQ(b1, b2);
+        }
+    }
+    // Writing the record read back gives the same file.
+    EXPECT_EQ(lumo::cli::TpsToJson(*fromFile), json::parse(ReadText(model)));
+
+    // Transform reproduces the control points (interpolation) to 1e-8 of
+    // the output extent, both ways.
+    r = RunTool({"transform", model, "--to-image", kGcps});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    std::istringstream toImage(r.osOut);
+    const auto images = lumo::cli::ReadPoints(toImage, "out", PointKind::ControlPoint);
+    r = RunTool({"transform", model, "--to-ground", kGcps});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    std::istringstream toGround(r.osOut);
+    const auto grounds = lumo::cli::ReadPoints(toGround, "out", PointKind::ControlPoint);
+    ASSERT_EQ(images.asPoints.size(), 15u);
+    ASSERT_EQ(grounds.asPoints.size(), 15u);
+    for (std::size_t i = 0; i < 15; ++i) {
+        EXPECT_NEAR(images.asPoints[i].dfPixel, px[i], 5811 * 1e-8);
+        EXPECT_NEAR(images.asPoints[i].dfLine, ln[i], 5890 * 1e-8);
+        EXPECT_NEAR(grounds.asPoints[i].dfX, x[i], 5.7e4 * 1e-8);
+        EXPECT_NEAR(grounds.asPoints[i].dfY, y[i], 5.8e4 * 1e-8);
+    }
+
+    // Residuals: the spline's own RMS function agrees with the command.
+    r = RunTool({"residuals", model, "--gcps", kGcps});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    double meanX = 0, meanY = 0, rmsPixel = 0, rmsLine = 0;
+    TPSRMSError(static_cast<TPSInfo_t*>(fromFile->psGeoToImage->pModel), 15, x.data(), y.data(),
+                px.data(), ln.data(), &meanX, &meanY, &rmsPixel, &rmsLine);
+    EXPECT_NEAR(NumberAfter(r.osOut, "rms dpixel"), rmsPixel, 1e-6 * rmsPixel + 1e-15);
+    EXPECT_NEAR(NumberAfter(r.osOut, "dline"), rmsLine, 1e-6 * rmsLine + 1e-15);
+    EXPECT_LT(NumberAfter(r.osOut, "rms dx"), 1e-4);
+
+    // The math model object takes the record read from the file.
+    nova::mathmodel::LumoMathModel object(LUMO_CODE_TPS, fromFile);
+    double p = 0, l = 0;
+    ASSERT_EQ(object.GroundToImage(x[3], y[3], 0.0, p, l, false), 0);
+    EXPECT_NEAR(p, px[3], 1e-6);
+    EXPECT_NEAR(l, ln[3], 1e-6);
+
+    // The demonstration's spline row: the bundled example interpolates its
+    // control points and round-trips within a millipixel over the image.
+    const auto& demos = lumo::cli::FamilyDemos();
+    const auto row = std::find_if(demos.begin(), demos.end(), [](const lumo::cli::FamilyDemo& d) {
+        return std::string(d.pszFamily) == "tps";
+    });
+    ASSERT_NE(row, demos.end());
+    const lumo::cli::DemoResult demo = lumo::cli::RunFamilyDemo(*row, kExamples);
+    EXPECT_EQ(demo.nGcps, 15u);
+    EXPECT_LT(demo.sImageResidual.dfMax, 1e-8);
+    EXPECT_LT(demo.sImageRoundTrip.dfMax, 1e-3);
+}
+
+TEST_F(FitTest, TpsModelFileErrorsNameFileAndField) {
+    const json good = json::parse(ReadText(kExamples + "/tps_utm31.json"));
+    struct Case {
+        std::function<void(json&)> edit;
+        std::string message;
+    };
+    const std::vector<Case> cases = {
+        {[](json& d) { d["tps"].erase("imageToGeo"); }, "field \"tps.imageToGeo\" is missing"},
+        {[](json& d) { d["tps"]["geoToImage"]["coefX"].erase(0); },
+         "field \"tps.geoToImage.coefX\" must hold 18 numbers, found 17"},
+        {[](json& d) { d["tps"]["geoToImage"]["nCPs"] = 2; },
+         "field \"tps.geoToImage.nCPs\" must be 0 (an affine spline) or at least 4, found 2"},
+        {[](json& d) { d["tps"]["geoToImage"]["nCPs"] = -1; },
+         "field \"tps.geoToImage.nCPs\" must lie in 0..1000000, found -1"},
+        {[](json& d) { d["tps"]["imageToGeo"]["cpY"][3] = "x"; },
+         "field \"tps.imageToGeo.cpY\" item 3 must be a finite number, found \"x\""},
+        {[](json& d) { d["tps"]["imageToGeo"]["calculated"] = 1; },
+         "field \"tps.imageToGeo.calculated\" must be true or false, found 1"},
+        {[](json& d) { d["tps"]["imageToGeo"]["condition"] = nullptr; },
+         "field \"tps.imageToGeo.condition\" must be a finite number, found null"},
+        {[](json& d) { d["tps"] = 3; }, "field \"tps\" must be a JSON object"},
+        {[](json& d) { d["geosys"] = "UTM 31 U D000 1234"; }, "is longer than 16 characters"},
+    };
+    for (const Case& c : cases) {
+        json document = good;
+        c.edit(document);
+        try {
+            lumo::cli::ReadModel(document, "m.json");
+            ADD_FAILURE() << "accepted: " << c.message;
+        } catch (const nova::DataException& e) {
+            EXPECT_NE(std::string(e.what()).find("m.json: "), std::string::npos) << e.what();
+            EXPECT_NE(std::string(e.what()).find(c.message), std::string::npos) << e.what();
+        }
+    }
+    // An affine spline (fewer than 4 points) is written and read with nCPs 0.
+    const std::string three =
+        Write("three.csv", "pixel,line,x,y\n0,0,1000,2000\n10,0,1100,2000\n0,10,1000,1900\n");
+    ASSERT_EQ(RunTool({"fit", "--model", "tps", "--gcps", three, "--geosys", kGeosys, "-o",
+                       Path("affine.json")})
+                  .nCode,
+              0);
+    const lumo::cli::LoadedModel affine = lumo::cli::ReadModelFile(Path("affine.json"));
+    double p = 0, l = 0;
+    ASSERT_EQ(GenGeo2Img(LUMO_CODE_TPS, affine.poRecord.get(), 1050.0, 1950.0, 0.0, &p, &l), 1);
+    EXPECT_NEAR(p, 5.0, 1e-9);
+    EXPECT_NEAR(l, 5.0, 1e-9);
+}
+
+TEST_F(FitTest, FitAndResidualsFailuresAreReportedAndKeepFiles) {
+    const std::string out = Write("keep.json", "existing");
+    auto fails = [&](std::vector<std::string> args, const std::string& message) {
+        const RunResult r = RunTool(std::move(args));
+        EXPECT_NE(r.nCode, 0) << message;
+        EXPECT_NE((r.osErr + r.osOut).find(message), std::string::npos)
+            << "expected " << message << " in:\n"
+            << r.osErr << r.osOut;
+        EXPECT_EQ(ReadText(out), "existing");
+    };
+    fails({"fit", "--model", "spline", "--gcps", kGcps, "--geosys", kGeosys, "-o", out}, "spline");
+    fails(
+        {"fit", "--model", "poly", "--gcps", kGcps, "--order", "6", "--geosys", kGeosys, "-o", out},
+        "--order");
+    fails(
+        {"fit", "--model", "tps", "--gcps", kGcps, "--order", "2", "--geosys", kGeosys, "-o", out},
+        "--order applies to --model poly only");
+    fails({"fit", "--model", "poly", "--gcps", kGcps, "--geosys", "NOWHERE 99", "-o", out},
+          "--geosys \"NOWHERE 99\" is not a known georeferencing text");
+    fails({"fit", "--model", "poly", "--gcps", kGcps, "--geosys", "UTM 31 U D000 EXTRA", "-o", out},
+          "is longer than 16 characters");
+    fails({"fit", "--model", "poly", "--gcps", kGcps, "--geosys", kGeosys}, "--output");
+    fails({"fit", "--model", "poly", "--gcps", Path("none.csv"), "--geosys", kGeosys, "-o", out},
+          "none.csv");
+    const std::string empty = Write("empty.csv", "id,pixel,line,x,y\n");
+    fails({"fit", "--model", "poly", "--gcps", empty, "--geosys", kGeosys, "-o", out},
+          "holds no control points");
+    // All outputs at one place: the spline fit's fatal error reaches the user.
+    const std::string same =
+        Write("same.csv", "pixel,line,x,y\n0,0,5,5\n10,0,5,5\n0,10,5,5\n10,10,5,5\n5,5,5,5\n");
+    fails({"fit", "--model", "tps", "--gcps", same, "--geosys", kGeosys, "-o", out},
+          "All GCP coordinates are equal. Please check your GCPs.");
+
+    fails({"residuals", Path("none.json"), "--gcps", kGcps}, "none.json");
+    fails({"residuals", kExamples + "/tps_utm31.json", "--gcps", empty}, "holds no control points");
+    fails({"residuals", kExamples + "/tps_utm31.json"}, "--gcps");
+    const std::string bad = Write("bad.csv", "pixel,line,x\n1,2,3\n");
+    fails({"residuals", kExamples + "/tps_utm31.json", "--gcps", bad}, "missing column \"y\"");
+}
+
+}  // namespace

@@ -1,0 +1,551 @@
+// The math model object over polynomial and thin plate spline records.
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "lumo.h"
+#include "nova/crs.h"
+#include "nova/projection.h"
+#include "nova/runtime.h"
+
+namespace nova {
+namespace mathmodel {
+
+// Reaches the object's private helpers and flags.
+struct LumoMathModelTestAccess {
+    static int GetNumGridPoints(const LumoMathModel& m, int nSize, int nStep) {
+        return m.GetNumGridPoints(nSize, nStep);
+    }
+    static void SetThreadSafe(LumoMathModel& m, bool bSafe) { m.mbThreadSafe = bSafe; }
+    static bool HasMutex(const LumoMathModel& m) { return m.mpoMutex != nullptr; }
+    static void SetModelCode(LumoMathModel& m, int nCode) { m.mnModelCode = nCode; }
+    static void SetType(LumoMathModel& m, LumoModelType eType) { m.meType = eType; }
+    static int G2IBlockGrid(const LumoMathModel& m) {
+        return m.G2IBlockGrid(1, 1, 1, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, 0, 0,
+                              1, 1, 0, false);
+    }
+    static int G2IBlockSimple(const LumoMathModel& m) {
+        return m.G2IBlockSimple(1, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, 0, 0, 1, 1,
+                                0, false);
+    }
+    static int I2GBlockGrid(const LumoMathModel& m) {
+        return m.I2GBlockGrid(1, 1, 1, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, 0, 0,
+                              1, 1, 0, false);
+    }
+    static int I2GBlockSimple(const LumoMathModel& m) {
+        return m.I2GBlockSimple(1, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, 0, 0, 1, 1,
+                                0, false);
+    }
+};
+
+}  // namespace mathmodel
+}  // namespace nova
+
+namespace {
+
+namespace nm = nova::mathmodel;
+using Access = nm::LumoMathModelTestAccess;
+
+constexpr const char* kFile = "mathmodel/lumo/lumokit";
+constexpr const char* kUnknownModel =
+    "Unknown model, only Toutin, Polynomial, Thin plate spline, ADS, and Radar models are "
+    "supported";
+constexpr const char* kNotThreadSafe =
+    "Internal error: math model marked as non-threadsafe, but implementation not defined";
+
+struct PolyDeleter {
+    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
+};
+using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
+struct TpsDeleter {
+    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
+};
+using TpsPtr = std::unique_ptr<TPSMInfo_t, TpsDeleter>;
+
+// An affine UTM model: about 10 m pixels over a 6000 x 5000 image.
+PolyPtr MakePoly(const char* pszGeosys = "UTM 31 U D000") {
+    PolyPtr poly(POLYAllocate());
+    poly->nCoeffs = 3;
+    poly->nPixels = 6000;
+    poly->nLines = 5000;
+    const double pixel[3] = {-44000.0, 0.1, 0.0};
+    const double line[3] = {572000.0, 0.0, -0.1};
+    const double x[3] = {440000.0, 10.0, 0.0};
+    const double y[3] = {5720000.0, 0.0, -10.0};
+    std::memcpy(poly->padfPixelCoeffs, pixel, sizeof pixel);
+    std::memcpy(poly->padfLineCoeffs, line, sizeof line);
+    std::memcpy(poly->padfXCoeffs, x, sizeof x);
+    std::memcpy(poly->padfYCoeffs, y, sizeof y);
+    std::strncpy(poly->pszGeosys, pszGeosys, POLY_GEOSYS_SIZE - 1);
+    Geosys2ProjInfo(poly->psProjInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0);
+    return poly;
+}
+
+// The bundled control points (image and UTM 31 ground positions).
+struct Gcps {
+    std::vector<double> pixel, line, x, y;
+};
+
+Gcps BundledGcps() {
+    Gcps g;
+    g.pixel = {152.50,  5811.00, 3020.75, 450.00,  5600.50, 1200.25, 4480.00, 2255.50,
+               3890.25, 990.00,  5105.75, 2710.00, 1888.50, 4025.00, 320.75};
+    g.line = {240.25,  97.50,   2988.50, 5702.25, 5890.00, 1333.00, 1510.75, 4470.00,
+              5120.50, 3405.50, 3310.25, 620.50,  2411.00, 4011.75, 1890.00};
+    g.x = {441544.763, 498124.542, 470467.143, 445000.399, 496519.732,
+           452118.326, 484932.076, 462944.722, 479347.767, 450197.925,
+           491347.253, 467152.959, 459094.892, 480598.853, 443372.537};
+    g.y = {5717611.227, 5719529.779, 5690379.745, 5663013.896, 5661587.653,
+           5706775.165, 5705283.162, 5675497.391, 5669134.543, 5686032.494,
+           5687344.390, 5714030.951, 5696055.727, 5680235.026, 5701128.896};
+    return g;
+}
+
+TpsPtr MakeTps(const char* pszGeosys = "UTM 31 U D000") {
+    TpsPtr tps(TPSAllocate(nullptr));
+    Gcps g = BundledGcps();
+    const int n = static_cast<int>(g.x.size());
+    TRNCalculate(tps->psGeoToImage, n, g.x.data(), g.y.data(), g.pixel.data(), g.line.data(),
+                 nullptr);
+    TRNCalculate(tps->psImageToGeo, n, g.pixel.data(), g.line.data(), g.x.data(), g.y.data(),
+                 nullptr);
+    tps->nPixels = 6000;
+    tps->nLines = 6000;
+    std::strncpy(tps->pszGeosys, pszGeosys, TPS_GEOSYS_SIZE - 1);
+    Geosys2ProjInfo(tps->psProjInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0);
+    return tps;
+}
+
+// Runs `f`, which must throw E, and checks the exception's message, function
+// text and line.
+template <typename E, typename F>
+std::optional<E> Catch(F f, const std::string& message, int line) {
+    try {
+        f();
+    } catch (const E& e) {
+        EXPECT_EQ(e.GetMessage(), message);
+        EXPECT_EQ(e.GetFile(), kFile);
+        EXPECT_EQ(e.GetLine(), line);
+        return e;
+    }
+    ADD_FAILURE() << "no exception: " << message;
+    return std::nullopt;
+}
+
+void CatchParameter(const std::function<void()>& f, const char* name, const std::string& message,
+                    int line, const char* function) {
+    const std::optional<nova::ParameterException> e =
+        Catch<nova::ParameterException>(f, message, line);
+    if (!e) return;
+    EXPECT_EQ(e->GetParameterName(), name);
+    EXPECT_EQ(e->GetParameterType(), 1);
+    EXPECT_EQ(e->GetText1(), "");
+    EXPECT_EQ(e->GetText2(), "");
+    EXPECT_EQ(e->GetFunction(), function);
+}
+
+constexpr const char* kFnInitModel =
+    "void __cdecl nova::mathmodel::LumoMathModel::InitModel(int,const void *)";
+
+// A model of another family that reports the lumo type value.
+class ForeignModel : public nm::IMathModel {
+  public:
+    explicit ForeignModel(nm::MathModelType eType) : meType(eType) {}
+    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
+    nm::MathModelType GetModelType() const override { return meType; }
+    std::string GetModelName() const override { return "Foreign"; }
+    int GetNumColumns() const override { return 1; }
+    int GetNumRows() const override { return 1; }
+    int GetDownsampleFactor() const override { return 1; }
+    int GetMinValidHeight(double&) const override { return -1; }
+    int GetMaxValidHeight(double&) const override { return -1; }
+    bool IsHeightDependent() const override { return false; }
+    bool IsEqual(const IMathModel* o) const override { return o == this; }
+    int ImageToGround(int, int, int, const float*, const float*, const float*, float*, float*,
+                      unsigned char*, double, double, double, double, double, bool) const override {
+        return -1;
+    }
+    int ImageToGround(double, double, int, const double*, double*, double*, int*,
+                      bool) const override {
+        return -1;
+    }
+    int ImageToGround(double, double, double, double&, double&, bool) const override { return -1; }
+    int GroundToImage(int, int, int, const float*, const float*, const float*, float*, float*,
+                      unsigned char*, double, double, double, double, double, bool) const override {
+        return -1;
+    }
+    int GroundToImage(double, double, int, const double*, double*, double*, int*,
+                      bool) const override {
+        return -1;
+    }
+    int GroundToImage(double, double, double, double&, double&, bool) const override { return -1; }
+    IMathModel* Clone() const override { return new ForeignModel(meType); }
+    void SetDownsampleFactor(int) override {}
+
+  private:
+    nm::MathModelType meType;
+};
+
+TEST(LumoMathModel, ConstructorsWrapOwnCopyWithCompoundCrs) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel byCode(4, poly.get());
+    nm::LumoMathModel byType(nm::LUMO_MODEL_POLY, poly.get());
+    for (const nm::LumoMathModel* m : {&byCode, &byType}) {
+        EXPECT_EQ(m->GetLumoModelType(), nm::LUMO_MODEL_POLY);
+        EXPECT_EQ(m->GetModelType(), 6);
+        EXPECT_EQ(m->GetModelName(), "Lumo");
+        EXPECT_EQ(m->GetNumColumns(), 6000);
+        EXPECT_EQ(m->GetNumRows(), 5000);
+        EXPECT_EQ(m->GetDownsampleFactor(), 1);
+        EXPECT_TRUE(m->IsHeightDependent());
+        EXPECT_NE(m->GetModel(), poly.get());
+        const auto* copy = static_cast<const POLYInfo_t*>(m->GetModel());
+        EXPECT_EQ(copy->padfXCoeffs[1], 10.0);
+        EXPECT_STREQ(copy->pszGeosys, "UTM 31 U D000");
+        const nova::ogc::cs::ICRS* crs = m->GetCRS();
+        ASSERT_NE(crs, nullptr);
+        EXPECT_TRUE(crs->IsCompound());
+        EXPECT_TRUE(crs->IsProjected());
+        EXPECT_EQ(crs->GetVerticalDatumType(), nova::ogc::cs::CS_VD_Ellipsoidal);
+    }
+    // The caller's record stays the caller's: changing it does not change the object.
+    double pixel = 0.0, line = 0.0;
+    ASSERT_EQ(byCode.GroundToImage(450000.0, 5700000.0, 0.0, pixel, line, false), 0);
+    poly->padfPixelCoeffs[0] = 0.0;
+    double pixel2 = 0.0, line2 = 0.0;
+    ASSERT_EQ(byCode.GroundToImage(450000.0, 5700000.0, 0.0, pixel2, line2, false), 0);
+    EXPECT_EQ(pixel, pixel2);
+    EXPECT_EQ(line, line2);
+
+    // A geographic projection gives a geographic compound system.
+    PolyPtr geographic = MakePoly("LONG/LAT D000");
+    nm::LumoMathModel lonlat(4, geographic.get());
+    EXPECT_TRUE(lonlat.GetCRS()->IsGeographic());
+    EXPECT_TRUE(lonlat.GetCRS()->IsCompound());
+}
+
+TEST(LumoMathModel, ConstructionFailuresThrowExactExceptions) {
+    PolyPtr poly = MakePoly();
+    CatchParameter([&] { nm::LumoMathModel m(nm::LUMO_MODEL_CODE11, poly.get()); }, "eType",
+                   "Unknown model code passed to LumoMathModel constructor", 105,
+                   "__cdecl nova::mathmodel::LumoMathModel::LumoMathModel(enum "
+                   "nova::mathmodel::LumoModelType,const void *)");
+    // Types and codes the object does not wrap go through InitModel's rejection.
+    for (nm::LumoModelType t :
+         {nm::LUMO_MODEL_AP, nm::LUMO_MODEL_RF, nm::LUMO_MODEL_CODE10, nm::LUMO_MODEL_CODE12}) {
+        CatchParameter([&] { nm::LumoMathModel m(t, poly.get()); }, "eType", kUnknownModel, 466,
+                       kFnInitModel);
+    }
+    for (int code : {-1, 0, 1, 6, 8, 9, 10, 11, 12, 13}) {
+        CatchParameter([&] { nm::LumoMathModel m(code, poly.get()); }, "eType", kUnknownModel, 466,
+                       kFnInitModel);
+    }
+    CatchParameter([] { nm::LumoMathModel m(4, nullptr); }, "pData", "null pointer", 312,
+                   kFnInitModel);
+    CatchParameter([] { nm::LumoMathModel m(nm::LUMO_MODEL_TPS, nullptr); }, "pData",
+                   "null pointer", 312, kFnInitModel);
+
+    // Unit-only and unreadable descriptions have no CRS: a data exception,
+    // not a parameter exception.
+    for (const char* geosys : {"METRE", "PIXEL", "NOT A PROJ", ""}) {
+        PolyPtr bad = MakePoly(geosys);
+        try {
+            nm::LumoMathModel m(4, bad.get());
+            ADD_FAILURE() << "no exception for " << geosys;
+        } catch (const nova::ParameterException&) {
+            ADD_FAILURE() << "parameter exception for " << geosys;
+        } catch (const nova::DataException& e) {
+            EXPECT_EQ(e.GetMessage(), "Failed to get a CRS for the math model!");
+            EXPECT_EQ(e.GetFunction(), kFnInitModel);
+            EXPECT_EQ(e.GetLine(), 473);
+            EXPECT_EQ(e.GetFile(), kFile);
+        }
+    }
+}
+
+TEST(LumoMathModel, CopiesClonesAndEquality) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel original(4, poly.get());
+    nm::LumoMathModel copy(original);
+    std::unique_ptr<nm::IMathModel> clone(original.Clone());
+    auto* lumoClone = dynamic_cast<nm::LumoMathModel*>(clone.get());
+    ASSERT_NE(lumoClone, nullptr);
+    for (const nm::LumoMathModel* m : {static_cast<const nm::LumoMathModel*>(&copy),
+                                       static_cast<const nm::LumoMathModel*>(lumoClone)}) {
+        EXPECT_EQ(m->GetLumoModelType(), nm::LUMO_MODEL_POLY);
+        EXPECT_NE(m->GetModel(), original.GetModel());
+        EXPECT_NE(m->GetCRS(), original.GetCRS());
+        EXPECT_EQ(m->GetCRS()->GetDefinition(), original.GetCRS()->GetDefinition());
+        double p1 = 0, l1 = 0, p2 = 0, l2 = 0;
+        ASSERT_EQ(original.GroundToImage(455000.0, 5690000.0, 10.0, p1, l1, false), 0);
+        ASSERT_EQ(m->GroundToImage(455000.0, 5690000.0, 10.0, p2, l2, false), 0);
+        EXPECT_EQ(p1, p2);
+        EXPECT_EQ(l1, l2);
+        EXPECT_FALSE(Access::HasMutex(*m));
+    }
+
+    EXPECT_TRUE(original.IsEqual(&original));
+    EXPECT_FALSE(original.IsEqual(clone.get()));
+    EXPECT_FALSE(original.IsEqual(&copy));
+    EXPECT_FALSE(original.IsEqual(nullptr));
+    ForeignModel foreignLumo(nm::MM_TYPE_LUMO);
+    ForeignModel foreignPoly(nm::MM_TYPE_POLYNOMIAL);
+    EXPECT_FALSE(original.IsEqual(&foreignLumo));
+    EXPECT_FALSE(original.IsEqual(&foreignPoly));
+    TpsPtr tps = MakeTps();
+    nm::LumoMathModel spline(5, tps.get());
+    EXPECT_FALSE(original.IsEqual(&spline));
+
+    // A copy of an object that is not thread-safe gets its own mutex and
+    // keeps the flag.
+    Access::SetThreadSafe(original, false);
+    nm::LumoMathModel unsafeCopy(original);
+    EXPECT_TRUE(Access::HasMutex(unsafeCopy));
+    std::unique_ptr<nm::IMathModel> unsafeClone(unsafeCopy.Clone());
+    EXPECT_TRUE(Access::HasMutex(*dynamic_cast<nm::LumoMathModel*>(unsafeClone.get())));
+    double p = 0, l = 0;
+    EXPECT_EQ(unsafeCopy.GroundToImage(455000.0, 5690000.0, 0.0, p, l, false), -1);
+}
+
+TEST(LumoMathModel, SizesHeightsDownsampleAndGridPoints) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel m(4, poly.get());
+    double h = 123.5;
+    EXPECT_EQ(m.GetMinValidHeight(h), -1);
+    EXPECT_EQ(h, 123.5);
+    EXPECT_EQ(m.GetMaxValidHeight(h), -1);
+    EXPECT_EQ(h, 123.5);
+
+    const char* fnSet = "void __cdecl nova::mathmodel::LumoMathModel::SetDownsampleFactor(int)";
+    const auto e = Catch<nova::DataException>(
+        [&] { m.SetDownsampleFactor(2); },
+        "Downsample factor not supported for the current model type", 1277);
+    if (e) {
+        EXPECT_EQ(e->GetFunction(), fnSet);
+    }
+    EXPECT_EQ(m.GetDownsampleFactor(), 2);  // stored before the check
+    EXPECT_NO_THROW(m.SetDownsampleFactor(1));
+    EXPECT_EQ(m.GetDownsampleFactor(), 1);
+
+    // A type the object never wraps: it cannot be sized, downsampled or copied.
+    Access::SetType(m, nm::LUMO_MODEL_RF);
+    CatchParameter([&] { (void)m.GetNumColumns(); }, "eType", kUnknownModel, 563,
+                   "int __cdecl nova::mathmodel::LumoMathModel::GetNumColumns(void) const");
+    CatchParameter([&] { (void)m.GetNumRows(); }, "eType", kUnknownModel, 614,
+                   "int __cdecl nova::mathmodel::LumoMathModel::GetNumRows(void) const");
+    CatchParameter([&] { m.SetDownsampleFactor(3); }, "eType", kUnknownModel, 1289, fnSet);
+    EXPECT_EQ(m.GetDownsampleFactor(), 3);
+    CatchParameter([&] { (void)nm::LumoMathModel(m).GetModel(); }, "eType", "Model not supported",
+                   221,
+                   "void __cdecl nova::mathmodel::LumoMathModel::CopyFrom(const class "
+                   "nova::mathmodel::LumoMathModel &)");
+    Access::SetType(m, nm::LUMO_MODEL_POLY);  // so the record is released
+
+    EXPECT_EQ(Access::GetNumGridPoints(m, 10, 3), 5);
+    EXPECT_EQ(Access::GetNumGridPoints(m, 9, 3), 4);
+    EXPECT_EQ(Access::GetNumGridPoints(m, 2, 5), 2);
+    EXPECT_EQ(Access::GetNumGridPoints(m, 1, 7), 1);
+    EXPECT_EQ(Access::GetNumGridPoints(m, 17, 1), 17);
+    EXPECT_EQ(Access::GetNumGridPoints(m, 100, 10), 11);
+    EXPECT_THROW(Access::GetNumGridPoints(m, 10, 0), nova::ParameterException);
+    EXPECT_THROW(Access::GetNumGridPoints(m, 10, -2), nova::ParameterException);
+}
+
+TEST(LumoMathModel, PointOperationsMatchFamilyAndNeverThrow) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel m(4, poly.get());
+    double pixel = -1, line = -1;
+    ASSERT_EQ(m.GroundToImage(450000.0, 5700000.0, 55.0, pixel, line, true), 0);
+    EXPECT_DOUBLE_EQ(pixel, 1000.0);
+    EXPECT_DOUBLE_EQ(line, 2000.0);
+    double x = 0, y = 0;
+    ASSERT_EQ(m.ImageToGround(1000.0, 2000.0, 55.0, x, y, false), 0);
+    EXPECT_DOUBLE_EQ(x, 450000.0);
+    EXPECT_DOUBLE_EQ(y, 5700000.0);
+
+    TpsPtr tps = MakeTps();
+    nm::LumoMathModel spline(nm::LUMO_MODEL_TPS, tps.get());
+    EXPECT_EQ(spline.GetNumColumns(), 6000);
+    EXPECT_EQ(spline.GetNumRows(), 6000);
+    const Gcps g = BundledGcps();
+    for (std::size_t i = 0; i < g.x.size(); ++i) {
+        double p = 0, l = 0, px = 0, ly = 0;
+        ASSERT_EQ(spline.GroundToImage(g.x[i], g.y[i], 0.0, p, l, false), 0);
+        TPSGeo2Img(tps.get(), g.x[i], g.y[i], &px, &ly);
+        EXPECT_EQ(p, px);
+        EXPECT_EQ(l, ly);
+        EXPECT_NEAR(p, g.pixel[i], 1e-6);  // the spline interpolates its points
+        EXPECT_NEAR(l, g.line[i], 1e-6);
+        ASSERT_EQ(spline.ImageToGround(g.pixel[i], g.line[i], 0.0, p, l, false), 0);
+        EXPECT_NEAR(p, g.x[i], 1e-5);
+        EXPECT_NEAR(l, g.y[i], 1e-5);
+    }
+
+    // A failing family (here: a code the dispatch refuses) gives -1 and
+    // leaves the outputs alone.
+    Access::SetModelCode(m, 8);
+    pixel = line = 7.0;
+    EXPECT_EQ(m.GroundToImage(450000.0, 5700000.0, 0.0, pixel, line, false), -1);
+    EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, pixel, line, false), -1);
+    EXPECT_EQ(pixel, 7.0);
+    EXPECT_EQ(line, 7.0);
+    Access::SetModelCode(m, 4);
+}
+
+TEST(LumoMathModel, NotThreadSafeObjectLogsAndThrowsFromBlocks) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel m(4, poly.get());
+    Access::SetThreadSafe(m, false);
+    std::vector<nova::diag::DebugRecord> records;
+    const int oldLevel = nova::diag::Debugger::moDebugLevel;
+    nova::diag::Debugger::SetDebugLevel(1);
+    auto oldSink = nova::diag::Debugger::SetSink(
+        [&records](const nova::diag::DebugRecord& r) { records.push_back(r); });
+    double a = 5, b = 6;
+    EXPECT_EQ(m.GroundToImage(1.0, 2.0, 0.0, a, b, false), -1);
+    EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);
+    nova::diag::Debugger::SetDebugLevel(0);
+    EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);  // silent at level 0
+    nova::diag::Debugger::SetSink(oldSink);
+    nova::diag::Debugger::SetDebugLevel(oldLevel);
+    EXPECT_EQ(a, 5);
+    EXPECT_EQ(b, 6);
+    ASSERT_EQ(records.size(), 2u);
+    EXPECT_EQ(records[0].osMessage, "GenGeo2Img failed for type 4, the results may be hosed");
+    EXPECT_EQ(records[0].nLine, 695);
+    EXPECT_EQ(records[1].osMessage, "GenImg2Geo failed for type 4, the results may be invalid");
+    EXPECT_EQ(records[1].nLine, 655);
+    for (const auto& r : records) {
+        EXPECT_EQ(r.nLevel, 1);
+        EXPECT_EQ(r.osModule, "lumokit");
+        EXPECT_EQ(r.osFile, kFile);
+    }
+
+    float in[1] = {0}, out1[1] = {0}, out2[1] = {0};
+    auto e = Catch<nova::Exception>(
+        [&] {
+            m.GroundToImage(1, 1, 1, in, in, nullptr, out1, out2, nullptr, 0, 0, 1, 1, 0, false);
+        },
+        kNotThreadSafe, 777);
+    if (e) {
+        EXPECT_NE(e->GetFunction().find("GroundToImage(int,int,int,const float *"),
+                  std::string::npos);
+    }
+    e = Catch<nova::Exception>(
+        [&] {
+            m.ImageToGround(1, 1, 1, in, in, nullptr, out1, out2, nullptr, 0, 0, 1, 1, 0, false);
+        },
+        kNotThreadSafe, 994);
+    if (e) {
+        EXPECT_NE(e->GetFunction().find("ImageToGround(int,int,int,const float *"),
+                  std::string::npos);
+    }
+
+    // The private block helpers only report the missing implementation.
+    Catch<nova::Exception>([&] { Access::G2IBlockGrid(m); }, kNotThreadSafe, 900);
+    Catch<nova::Exception>([&] { Access::G2IBlockSimple(m); }, kNotThreadSafe, 826);
+    Catch<nova::Exception>([&] { Access::I2GBlockGrid(m); }, kNotThreadSafe, 1117);
+    e = Catch<nova::Exception>([&] { Access::I2GBlockSimple(m); }, kNotThreadSafe, 1042);
+    if (e) {
+        EXPECT_EQ(
+            e->GetFunction(),
+            "int __cdecl nova::mathmodel::LumoMathModel::I2GBlockSimple(int,const float *,const "
+            "float *,const float *,float *,float *,unsigned char "
+            "*,double,double,double,double,double,bool) const");
+    }
+}
+
+TEST(LumoMathModel, ArrayAndBlockSlotsForwardToHostFunctions) {
+    PolyPtr poly = MakePoly();
+    nm::LumoMathModel m(4, poly.get());
+    const std::vector<double> xs = {440000.0, 450000.5, 470000.25, 499999.0};
+    std::vector<double> p1(4), l1(4), p2(4), l2(4);
+    std::vector<int> v1(4), v2(4);
+    EXPECT_EQ(m.GroundToImage(5700000.0, 0.0, 4, xs.data(), p1.data(), l1.data(), v1.data(), false),
+              nm::GroundToImage(&m, 5700000.0, 0.0, 4, xs.data(), p2.data(), l2.data(), v2.data(),
+                                false));
+    EXPECT_EQ(p1, p2);
+    EXPECT_EQ(l1, l2);
+    EXPECT_EQ(v1, std::vector<int>(4, 1));
+    for (std::size_t i = 0; i < xs.size(); ++i) EXPECT_DOUBLE_EQ(p1[i], 0.1 * xs[i] - 44000.0);
+    // The host function's argument checks come through unchanged.
+    EXPECT_EQ(m.ImageToGround(10.0, 0.0, -1, xs.data(), p1.data(), l1.data(), nullptr, false), -1);
+    EXPECT_EQ(m.ImageToGround(10.0, 0.0, 4, xs.data(), p1.data(), l1.data(), v1.data(), false), 0);
+    for (std::size_t i = 0; i < xs.size(); ++i) {
+        EXPECT_DOUBLE_EQ(p1[i], 440000.0 + 10.0 * xs[i]);
+        EXPECT_DOUBLE_EQ(l1[i], 5720000.0 - 100.0);
+    }
+
+    // A regular 5 x 4 ground grid, evaluated exactly (tolerance 0).
+    const int cols = 5, rows = 4;
+    std::vector<float> pa(cols * rows), la(cols * rows), pb(cols * rows), lb(cols * rows);
+    std::vector<unsigned char> va(cols * rows), vb(cols * rows);
+    EXPECT_EQ(m.GroundToImage(cols, rows, 1, nullptr, nullptr, nullptr, pa.data(), la.data(),
+                              va.data(), 450000.0, 5700000.0, 100.0, -100.0, 0.0, false),
+              0);
+    EXPECT_EQ(nm::GroundToImage(&m, cols, rows, 1, nullptr, nullptr, nullptr, pb.data(), lb.data(),
+                                vb.data(), 450000.0, 5700000.0, 100.0, -100.0, 0.0, false),
+              0);
+    EXPECT_EQ(pa, pb);
+    EXPECT_EQ(la, lb);
+    EXPECT_FLOAT_EQ(pa[cols + 2], 1000.0f + 20.0f);
+    EXPECT_FLOAT_EQ(la[cols + 2], 2000.0f + 10.0f);
+    EXPECT_EQ(m.ImageToGround(cols, rows, 1, nullptr, nullptr, nullptr, pa.data(), la.data(),
+                              va.data(), 0.0, 0.0, 10.0, 10.0, 0.0, false),
+              0);
+    EXPECT_FLOAT_EQ(pa[cols * 3 + 4], 440000.0f + 400.0f);
+    EXPECT_FLOAT_EQ(la[cols * 3 + 4], 5720000.0f - 300.0f);
+    // Bad block arguments are the host's to refuse.
+    EXPECT_EQ(m.GroundToImage(cols, rows, 0, nullptr, nullptr, nullptr, pa.data(), la.data(),
+                              nullptr, 0.0, 0.0, 1.0, 1.0, 0.0, false),
+              -1);
+}
+
+TEST(LumoMathModel, ConcurrentEvaluationOfOneObjectAgrees) {
+    PolyPtr poly = MakePoly();
+    TpsPtr tps = MakeTps();
+    const nm::LumoMathModel polyModel(4, poly.get());
+    const nm::LumoMathModel splineModel(5, tps.get());
+    for (const nm::LumoMathModel* model : {&polyModel, &splineModel}) {
+        constexpr int kPoints = 2000;
+        std::vector<double> expected(2 * kPoints);
+        auto ground = [](int i) {
+            return std::make_pair(441000.0 + 27.5 * i, 5662000.0 + 28.25 * i);
+        };
+        for (int i = 0; i < kPoints; ++i) {
+            const auto [x, y] = ground(i);
+            ASSERT_EQ(model->GroundToImage(x, y, 0.0, expected[2 * i], expected[2 * i + 1], false),
+                      0);
+        }
+        std::vector<int> mismatches(4, 0);
+        std::vector<std::thread> threads;
+        threads.reserve(4);
+        for (int t = 0; t < 4; ++t) {
+            threads.emplace_back([&, t] {
+                for (int round = 0; round < 3; ++round) {
+                    for (int i = 0; i < kPoints; ++i) {
+                        const auto [x, y] = ground(i);
+                        double p = 0, l = 0, gx = 0, gy = 0;
+                        if (model->GroundToImage(x, y, 0.0, p, l, false) != 0 ||
+                            p != expected[2 * i] || l != expected[2 * i + 1] ||
+                            model->ImageToGround(p, l, 0.0, gx, gy, false) != 0) {
+                            ++mismatches[t];
+                        }
+                    }
+                }
+            });
+        }
+        for (std::thread& th : threads) th.join();
+        EXPECT_EQ(mismatches, std::vector<int>(4, 0));
+    }
+}
+
+}  // namespace

@@ -1,0 +1,260 @@
+// `lumo fit --model poly|tps --gcps FILE [--order N] --geosys TEXT -o MODEL`:
+// fits a polynomial or thin plate spline model to control points, both
+// directions, and writes it as a model file.
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+
+#include "cli_error.h"
+#include "commands.h"
+#include "nova/projection.h"
+#include "nova/regression.h"
+#include "points_io.h"
+#include "tps_io.h"
+
+namespace lumo::cli {
+namespace {
+
+// Largest error, in pixels, that evaluating the written raw-coordinate
+// coefficients may add on the control points. The model file keeps only raw
+// coefficients (no centring or scaling); for high orders over large ground
+// coordinates (UTM eastings and northings) their evaluation cancels huge
+// terms, and an order that cannot be written exactly enough is refused.
+constexpr double kRawTolerancePixels = 1e-6;
+
+struct FitOptions {
+    std::string osModel;
+    std::string osGcps;
+    std::string osGeosys;
+    std::string osOutput;
+    std::string osSegment;  // srit only
+    int nOrder = 0;    // 0: not given
+    int nPixels = -1;  // -1: from the control points
+    int nLines = -1;
+};
+
+// The control points as the parallel arrays the fitting functions take.
+struct ControlArrays {
+    std::vector<double> pixel, line, x, y;
+    int Count() const { return static_cast<int>(pixel.size()); }
+};
+
+ControlArrays ToArrays(const PointSet& gcps) {
+    ControlArrays c;
+    for (const PointRecord& p : gcps.asPoints) {
+        c.pixel.push_back(p.dfPixel);
+        c.line.push_back(p.dfLine);
+        c.x.push_back(p.dfX);
+        c.y.push_back(p.dfY);
+    }
+    return c;
+}
+
+std::string Number(double value) {
+    char text[32];
+    std::snprintf(text, sizeof text, "%.6g", value);
+    return text;
+}
+
+// Projection description of the ground coordinates; the text must fit the
+// records' 16-character buffers and be one the projection service reads.
+void CheckGeosys(const std::string& geosys, ProjInfo_t* psProjInfo) {
+    if (geosys.size() >= static_cast<std::size_t>(POLY_GEOSYS_SIZE)) {
+        LUMO_CLI_FAIL("--geosys " + Quoted(geosys) + " is longer than " +
+                      std::to_string(POLY_GEOSYS_SIZE - 1) + " characters");
+    }
+    if (Geosys2ProjInfo(psProjInfo, geosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
+        LUMO_CLI_FAIL("--geosys " + Quoted(geosys) + " is not a known georeferencing text");
+    }
+}
+
+// Image size: given, or the smallest whole size whose image [0, size) holds
+// every control point.
+void ImageSize(const FitOptions& options, const ControlArrays& c, int& nPixels, int& nLines) {
+    double maxPixel = 0.0;
+    double maxLine = 0.0;
+    for (int i = 0; i < c.Count(); ++i) {
+        maxPixel = std::max(maxPixel, c.pixel[i]);
+        maxLine = std::max(maxLine, c.line[i]);
+    }
+    const double limit = std::numeric_limits<int>::max();
+    nPixels = options.nPixels >= 0 ? options.nPixels
+                                   : static_cast<int>(std::min(std::floor(maxPixel) + 1.0, limit));
+    nLines = options.nLines >= 0 ? options.nLines
+                                 : static_cast<int>(std::min(std::floor(maxLine) + 1.0, limit));
+}
+
+// Ground size of one pixel from the image-to-ground affine part, so that the
+// raw-coefficient check of that direction can be made in pixels too.
+double GroundPerPixel(const GEOInfo_t& inverse) {
+    const double area = std::fabs(inverse.adfAffine[1] * inverse.adfAffine[5] -
+                                  inverse.adfAffine[2] * inverse.adfAffine[4]);
+    const double size = std::sqrt(area);
+    return size > 0.0 && std::isfinite(size) ? size : 1.0;
+}
+
+// Largest difference, in pixels, between the written raw coefficients and the
+// regression's own (normalised) evaluation on the control points.
+double RawCoefficientError(const POLYInfo_t& poly, const GEOInfo_t& forward,
+                           const GEOInfo_t& inverse, const ControlArrays& c) {
+    const double groundPerPixel = GroundPerPixel(inverse);
+    double worst = 0.0;
+    for (int i = 0; i < c.Count(); ++i) {
+        double rawPixel = 0, rawLine = 0, fitPixel = 0, fitLine = 0;
+        POLYGeo2Img(&poly, c.x[i], c.y[i], &rawPixel, &rawLine);
+        GCPTransform(&forward, c.x[i], c.y[i], &fitPixel, &fitLine);
+        worst = std::max({worst, std::fabs(rawPixel - fitPixel), std::fabs(rawLine - fitLine)});
+        double rawX = 0, rawY = 0, fitX = 0, fitY = 0;
+        POLYImg2Geo(&poly, c.pixel[i], c.line[i], &rawX, &rawY);
+        GCPTransform(&inverse, c.pixel[i], c.line[i], &fitX, &fitY);
+        worst = std::max({worst, std::fabs(rawX - fitX) / groundPerPixel,
+                          std::fabs(rawY - fitY) / groundPerPixel});
+    }
+    // A NaN difference counts as a total loss.
+    return std::isnan(worst) ? std::numeric_limits<double>::infinity() : worst;
+}
+
+PolyPtr FitPoly(const FitOptions& options, ControlArrays& c, CommandContext& context) {
+    const int requested = options.nOrder == 0 ? 1 : options.nOrder;
+    std::unique_ptr<GEOInfo_t> forward(new GEOInfo_t{});
+    std::unique_ptr<GEOInfo_t> inverse(new GEOInfo_t{});
+    int orderForward = requested;
+    int orderInverse = requested;
+    double rmsPixel = 0, rmsLine = 0, rmsX = 0, rmsY = 0;
+    const char* unit = options.osGeosys.c_str();
+    GCPRegression2(forward.get(), unit, c.x.data(), c.y.data(), "PIXEL", c.pixel.data(),
+                   c.line.data(), c.Count(), &orderForward, 0, &rmsPixel, &rmsLine);
+    GCPRegression2(inverse.get(), "PIXEL", c.pixel.data(), c.line.data(), unit, c.x.data(),
+                   c.y.data(), c.Count(), &orderInverse, 0, &rmsX, &rmsY);
+
+    PolyPtr poly(POLYAllocate());
+    // Both directions share one term count; the lower one's extra terms stay 0.
+    poly->nCoeffs = std::max(forward->nTerms, inverse->nTerms);
+    std::copy_n(forward->adfXCoeffs, forward->nTerms, poly->padfPixelCoeffs);
+    std::copy_n(forward->adfYCoeffs, forward->nTerms, poly->padfLineCoeffs);
+    std::copy_n(inverse->adfXCoeffs, inverse->nTerms, poly->padfXCoeffs);
+    std::copy_n(inverse->adfYCoeffs, inverse->nTerms, poly->padfYCoeffs);
+
+    const double rawError = RawCoefficientError(*poly, *forward, *inverse, c);
+    if (!(rawError <= kRawTolerancePixels)) {
+        LUMO_CLI_FAIL("--order " + std::to_string(requested) +
+                      ": the model file keeps raw-coordinate coefficients, and with these ground "
+                      "coordinates they reproduce the fit only to " +
+                      Number(rawError) + " pixels (more than " + Number(kRawTolerancePixels) +
+                      "); use a lower --order");
+    }
+    if (orderForward != requested || orderInverse != requested) {
+        context.err << "lumo fit: the control points determine only order "
+                    << std::min(orderForward, orderInverse) << " (asked for " << requested << ")\n";
+    }
+    context.out << "fitted poly: order " << std::max(orderForward, orderInverse) << " ("
+                << poly->nCoeffs << " terms) to " << c.Count() << " control points\n"
+                << "rms ground->image: pixel " << Number(rmsPixel) << ", line " << Number(rmsLine)
+                << "\nrms image->ground: x " << Number(rmsX) << ", y " << Number(rmsY)
+                << "\nraw coefficients reproduce the fit to " << Number(rawError) << " pixels\n";
+    return poly;
+}
+
+TpsPtr FitTps(ControlArrays& c, CommandContext& context) {
+    TpsPtr tps(TPSAllocate(nullptr));
+    TRNCalculate(tps->psGeoToImage, c.Count(), c.x.data(), c.y.data(), c.pixel.data(),
+                 c.line.data(), nullptr);
+    TRNCalculate(tps->psImageToGeo, c.Count(), c.pixel.data(), c.line.data(), c.x.data(),
+                 c.y.data(), nullptr);
+    const auto* forward = static_cast<const TPSInfo_t*>(tps->psGeoToImage->pModel);
+    const auto* inverse = static_cast<const TPSInfo_t*>(tps->psImageToGeo->pModel);
+    context.out << "fitted tps: " << c.Count() << " control points, "
+                << (forward->nCPs > 0 ? "interpolating" : "affine (fewer than 4 points)")
+                << "; rank ground->image " << forward->nRank << ", image->ground " << inverse->nRank
+                << "\n";
+    if (forward->nCPs > 0 && forward->nRank < forward->nCPs + 3) {
+        context.err << "lumo fit: the spline system is rank deficient (rank " << forward->nRank
+                    << " of " << forward->nCPs + 3
+                    << "): coincident or duplicate control points?\n";
+    }
+    return tps;
+}
+
+void RunFit(const FitOptions& options, CommandContext& context) {
+    if (options.osModel != "poly" && options.nOrder != 0) {
+        throw CLI::ValidationError("--order applies to --model poly only");
+    }
+    if (options.osModel == "srit") {
+        RunSritFit(options.osGcps, options.osSegment, options.osGeosys, options.osOutput, context);
+        return;
+    }
+    if (!options.osSegment.empty()) {
+        throw CLI::ValidationError("--segment applies to --model srit only");
+    }
+    if (options.osGeosys.empty()) {
+        throw CLI::ValidationError("--geosys is required for --model poly and tps");
+    }
+    ProjInfo_t projInfo{};
+    CheckGeosys(options.osGeosys, &projInfo);
+    const PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    ControlArrays c = ToArrays(gcps);
+    int nPixels = 0;
+    int nLines = 0;
+    ImageSize(options, c, nPixels, nLines);
+
+    nlohmann::json document;
+    if (options.osModel == "poly") {
+        PolyPtr poly = FitPoly(options, c, context);
+        poly->nPixels = nPixels;
+        poly->nLines = nLines;
+        std::memcpy(poly->pszGeosys, options.osGeosys.c_str(), options.osGeosys.size() + 1);
+        *poly->psProjInfo = projInfo;
+        document = PolyToJson(*poly);
+    } else {
+        TpsPtr tps = FitTps(c, context);
+        tps->nPixels = nPixels;
+        tps->nLines = nLines;
+        std::memcpy(tps->pszGeosys, options.osGeosys.c_str(), options.osGeosys.size() + 1);
+        *tps->psProjInfo = projInfo;
+        document = TpsToJson(*tps);
+    }
+    WriteModelFile(options.osOutput, document);
+    context.out << "wrote " << options.osOutput << "\n";
+}
+
+}  // namespace
+
+void AddFitCommand(CLI::App& app, CommandContext& context) {
+    auto options = std::make_shared<FitOptions>();
+    CLI::App* command = app.add_subcommand(
+        "fit", "Fit a polynomial, thin plate spline or rigorous model to control points");
+    command->add_option("--model", options->osModel, "model family: poly, tps or srit")
+        ->required()
+        ->check(CLI::IsMember({"poly", "tps", "srit"}));
+    command->add_option("--segment", options->osSegment,
+                        "ephemeris segment of the image (JSON; srit only)");
+    command->add_option("--gcps", options->osGcps, "control points (CSV with pixel,line,x,y)")
+        ->required();
+    command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
+        ->check(CLI::Range(1, GCP_MAX_ORDER));
+    command
+        ->add_option("--geosys", options->osGeosys,
+                     "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
+                     "(srit: default the segment's)");
+    command
+        ->add_option("--pixels", options->nPixels,
+                     "image width (default: just above the largest control point pixel)")
+        ->check(CLI::NonNegativeNumber);
+    command
+        ->add_option("--lines", options->nLines,
+                     "image height (default: just above the largest control point line)")
+        ->check(CLI::NonNegativeNumber);
+    command->add_option("-o,--output", options->osOutput, "model file to write (JSON)")->required();
+    command->callback([options, &context] { RunFit(*options, context); });
+}
+
+}  // namespace lumo::cli
