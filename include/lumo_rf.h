@@ -1,0 +1,109 @@
+// Rational function model: pixel and line as ratios of cubic polynomials in
+// normalised ground coordinates, its fixed-size binary block and the RPC
+// text forms in which image vendors deliver such models.
+#pragma once
+
+#include <cstddef>
+#include <string>
+
+#include "lumo_types.h"
+
+constexpr int RF_MAX_TERMS = 20;
+constexpr int RF_TEXT_SIZE = 17;  // sensor and georeferencing buffers: 16 characters + NUL
+constexpr int RF_ADJUST_TERMS = 6;
+constexpr int RF_BINARY_SIZE = 3584;
+
+// Term i of every polynomial, with U, V, W the normalised first ground
+// coordinate, second ground coordinate and height:
+//  0 1      5 UW     10 UVW    15 V3
+//  1 U      6 VW     11 U3     16 VW2
+//  2 V      7 U2     12 UV2    17 U2W
+//  3 W      8 V2     13 UW2    18 V2W
+//  4 UV     9 W2     14 U2V    19 W3
+struct RFInfo_t {
+    int nHalfPixelShift;  // 1: image coordinates are shifted by half a pixel
+    int nAdjust;          // 1: the image-space adjustment is in force
+    int nDownsample;      // carried with the model; the transforms do not apply it
+    int nTerms;           // terms in use, 0..20
+    int nExtra1;          // carried, not interpreted
+    int nExtra2;
+    double* padfPixelNum;  // max(nTerms, 20) coefficients each
+    double* padfPixelDen;
+    double* padfLineNum;
+    double* padfLineDen;
+    double dfXOffset;
+    double dfXScale;
+    double dfYOffset;
+    double dfYScale;
+    double dfZOffset;
+    double dfZScale;
+    double dfPixelOffset;
+    double dfPixelScale;
+    double dfLineOffset;
+    double dfLineScale;
+    // a0..a5 over (1, p, l, p*l, p^2, l^2) of the rational functions' pixel p and line l
+    double adfPixelAdjust[RF_ADJUST_TERMS];
+    double adfLineAdjust[RF_ADJUST_TERMS];
+    char* pszSensor;  // RF_TEXT_SIZE bytes, empty when unknown
+    char* pszGeosys;  // RF_TEXT_SIZE bytes
+    ProjInfo_t* psProjInfo;
+};
+
+// A record with default contents for nTerms terms (coefficients 0, offsets
+// and scales 0, georeferencing "LON D000"). With psExisting given the new
+// contents are placed there (its old pointers are overwritten, not released)
+// and psExisting is returned.
+LUMO_API RFInfo_t* RFAllocate(RFInfo_t* psExisting, int nTerms);
+LUMO_API void RFDeallocate(RFInfo_t* psRF);
+
+// Ground to image. A height of -1e20 is taken as 0. A record that cannot be
+// evaluated (null, or a scale that is zero or not finite) is reported as a
+// warning and gives -1e20 for both outputs.
+LUMO_API void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPixel,
+                        double* pdfLine);
+// Image to ground at the height *pdfZ (-1e20: the model's height offset,
+// written back). *pdfX and *pdfY carry the starting guess in (0 or -1e20: the
+// model's offsets) and the result out. Returns 1, or 0 when the record cannot
+// be evaluated or an input is not finite (outputs untouched).
+LUMO_API int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
+                       double* pdfZ);
+// One Newton step towards the normalised image position (dfPixelN,
+// dfLineN) at the fixed normalised height dfW. Returns 1 and the new
+// estimate, or 0 (outputs untouched) when the Jacobian is near-singular or
+// the functions cannot be evaluated there.
+LUMO_API int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double dfV,
+                    double dfW, double* pdfU, double* pdfV);
+
+// The 3584-byte binary block. The writer returns a new block (released with
+// free()) and sets *pnLength to 3584, or returns null with a warning when a
+// field cannot be stored without loss (term count outside 0..20, a number
+// wider than its field). The reader returns a new record (RFDeallocate), or
+// null when the block does not start with "RFMODEL ", is shorter than 3584
+// bytes (nLength positive and below that) or holds a term count outside
+// 0..20.
+LUMO_API unsigned char* LumoRFInfoToBinary(RFInfo_t* psRF, int* pnLength);
+LUMO_API RFInfo_t* LumoBinaryToRFInfo(int nLength, unsigned char* pabyBlock);
+
+// RPC00B text forms: the "KEY: value" form of *_RPC.TXT files and the
+// "name = value;" block form of .RPB files. Longitude is X, latitude Y,
+// sample the pixel; the record gets nHalfPixelShift = 1, so pixel (0, 0) is
+// the corner of the first pixel while RPC sample 0 is its centre.
+enum LumoRPCTextForm {
+    LUMO_RPC_TEXT_AUTO = 0,  // reading only: recognised from the text
+    LUMO_RPC_TEXT_TXT = 1,
+    LUMO_RPC_TEXT_RPB = 2,
+};
+
+// Reads a model from RPC text. pszSource names the text in messages (a file
+// name). Throws nova::DataException naming the source, the line and the key
+// for a missing, repeated or malformed key, a non-finite number or a zero
+// scale. Returns a new record (RFDeallocate).
+LUMO_API RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
+                                       const char* pszSource);
+// Writes a model as RPC text in the given form. Throws nova::DataException
+// when the model has no RPC equivalent (image-space adjustment in force,
+// ground coordinates not geographic, more than 20 terms, values not finite).
+LUMO_API std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm);
+// The form of a text: LUMO_RPC_TEXT_TXT, LUMO_RPC_TEXT_RPB, or
+// LUMO_RPC_TEXT_AUTO when it looks like neither.
+LUMO_API int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength);

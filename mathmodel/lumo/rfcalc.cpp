@@ -1,0 +1,413 @@
+// Rational function model: allocation, release, ground to image and the
+// Newton inverse.
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "lumo_rf.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+constexpr const char* kDefaultGeosys = "LON D0";
+constexpr int kMaxNewtonSteps = 20;
+constexpr double kStepTolerance = 1e-5;     // normalised units
+constexpr double kSingularJacobian = 1e-5;  // |det| below this stops the iteration
+
+// Values of the 20 terms, and their derivatives by U and by V.
+struct TermSet {
+    double t[RF_MAX_TERMS];
+};
+
+inline void FormTerms(double u, double v, double w, double* t) {
+    t[0] = 1.0;
+    t[1] = u;
+    t[2] = v;
+    t[3] = w;
+    t[4] = u * v;
+    t[5] = u * w;
+    t[6] = v * w;
+    t[7] = u * u;
+    t[8] = v * v;
+    t[9] = w * w;
+    t[10] = u * v * w;
+    t[11] = u * u * u;
+    t[12] = u * v * v;
+    t[13] = u * w * w;
+    t[14] = u * u * v;
+    t[15] = v * v * v;
+    t[16] = v * w * w;
+    t[17] = u * u * w;
+    t[18] = v * v * w;
+    t[19] = w * w * w;
+}
+
+inline void FormDerivativeTermsU(double u, double v, double w, double* d) {
+    d[0] = 0.0;
+    d[1] = 1.0;
+    d[2] = 0.0;
+    d[3] = 0.0;
+    d[4] = v;
+    d[5] = w;
+    d[6] = 0.0;
+    d[7] = 2.0 * u;
+    d[8] = 0.0;
+    d[9] = 0.0;
+    d[10] = v * w;
+    d[11] = 3.0 * u * u;
+    d[12] = v * v;
+    d[13] = w * w;
+    d[14] = 2.0 * u * v;
+    d[15] = 0.0;
+    d[16] = 0.0;
+    d[17] = 2.0 * u * w;
+    d[18] = 0.0;
+    d[19] = 0.0;
+}
+
+inline void FormDerivativeTermsV(double u, double v, double w, double* d) {
+    d[0] = 0.0;
+    d[1] = 0.0;
+    d[2] = 1.0;
+    d[3] = 0.0;
+    d[4] = u;
+    d[5] = 0.0;
+    d[6] = w;
+    d[7] = 0.0;
+    d[8] = 2.0 * v;
+    d[9] = 0.0;
+    d[10] = u * w;
+    d[11] = 0.0;
+    d[12] = 2.0 * u * v;
+    d[13] = 0.0;
+    d[14] = u * u;
+    d[15] = 3.0 * v * v;
+    d[16] = w * w;
+    d[17] = 0.0;
+    d[18] = 2.0 * v * w;
+    d[19] = 0.0;
+}
+
+// Sum of c[i] * t[i] over the terms in use. The full model is the common
+// case; its fixed length lets the compiler unroll and vectorise the sum.
+// Four interleaved partial sums keep the chains of dependent additions short.
+inline double Sum(const double* c, const double* t, int nTerms) {
+    if (nTerms == RF_MAX_TERMS) {
+        double a0 = 0.0, a1 = 0.0, a2 = 0.0, a3 = 0.0;
+        for (int i = 0; i < RF_MAX_TERMS; i += 4) {
+            a0 += c[i] * t[i];
+            a1 += c[i + 1] * t[i + 1];
+            a2 += c[i + 2] * t[i + 2];
+            a3 += c[i + 3] * t[i + 3];
+        }
+        return (a0 + a1) + (a2 + a3);
+    }
+    double dfSum = 0.0;
+    for (int i = 0; i < nTerms; ++i) dfSum += c[i] * t[i];
+    return dfSum;
+}
+
+// Derivatives of a full 20-term polynomial by U and by V, formed from the
+// ten terms of each that are not identically zero.
+inline double DerivativeU(const double* c, double u, double v, double w) {
+    return (c[1] + c[4] * v + c[5] * w + 2.0 * c[7] * u + c[10] * v * w) +
+           (3.0 * c[11] * u * u + c[12] * v * v + c[13] * w * w + 2.0 * c[14] * u * v +
+            2.0 * c[17] * u * w);
+}
+
+inline double DerivativeV(const double* c, double u, double v, double w) {
+    return (c[2] + c[4] * u + c[6] * w + 2.0 * c[8] * v + c[10] * u * w) +
+           (2.0 * c[12] * u * v + c[14] * u * u + 3.0 * c[15] * v * v + c[16] * w * w +
+            2.0 * c[18] * v * w);
+}
+
+// Only 20 terms exist: a larger count evaluates those, a negative one none.
+inline int UsableTerms(const RFInfo_t* psRF) {
+    return std::clamp(psRF->nTerms, 0, RF_MAX_TERMS);
+}
+
+bool IsUsableScale(double dfScale) {
+    return std::isfinite(dfScale) && dfScale != 0.0;
+}
+
+// A record whose arrays exist and whose normalisation is finite with
+// non-zero scales; anything else would give NaN or infinity silently.
+bool IsEvaluable(const RFInfo_t* psRF) {
+    return psRF != nullptr && psRF->padfPixelNum != nullptr && psRF->padfPixelDen != nullptr &&
+           psRF->padfLineNum != nullptr && psRF->padfLineDen != nullptr &&
+           IsUsableScale(psRF->dfXScale) && IsUsableScale(psRF->dfYScale) &&
+           IsUsableScale(psRF->dfZScale) && IsUsableScale(psRF->dfPixelScale) &&
+           IsUsableScale(psRF->dfLineScale) && std::isfinite(psRF->dfXOffset) &&
+           std::isfinite(psRF->dfYOffset) && std::isfinite(psRF->dfZOffset) &&
+           std::isfinite(psRF->dfPixelOffset) && std::isfinite(psRF->dfLineOffset);
+}
+
+// Names the first field that makes a record unusable.
+void ReportUnusableRecord(const RFInfo_t* psRF) {
+    if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
+        psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
+        IMPError(11, 0, _("Rational function model or its coefficient arrays are null."));
+        return;
+    }
+    const struct {
+        const char* pszName;
+        double dfValue;
+        bool bScale;
+    } asFields[] = {
+        {"RFInfo_t.dfXScale", psRF->dfXScale, true},
+        {"RFInfo_t.dfYScale", psRF->dfYScale, true},
+        {"RFInfo_t.dfZScale", psRF->dfZScale, true},
+        {"RFInfo_t.dfPixelScale", psRF->dfPixelScale, true},
+        {"RFInfo_t.dfLineScale", psRF->dfLineScale, true},
+        {"RFInfo_t.dfXOffset", psRF->dfXOffset, false},
+        {"RFInfo_t.dfYOffset", psRF->dfYOffset, false},
+        {"RFInfo_t.dfZOffset", psRF->dfZOffset, false},
+        {"RFInfo_t.dfPixelOffset", psRF->dfPixelOffset, false},
+        {"RFInfo_t.dfLineOffset", psRF->dfLineOffset, false},
+    };
+    for (const auto& f : asFields) {
+        const bool bBad = f.bScale ? !IsUsableScale(f.dfValue) : !std::isfinite(f.dfValue);
+        if (bBad) {
+            IMPErrReal(11, 0, f.pszName, f.dfValue, 0);
+            return;
+        }
+    }
+}
+
+// Longitude wrap for models near the antimeridian: a model centred east of
+// 90 degrees sees negative longitudes as beyond 180, and the converse.
+inline double WrapLongitude(double dfX, double dfXOffset) {
+    if (std::fabs(dfXOffset) > 90.0) {
+        if (dfXOffset > 0.0 && dfX < 0.0) return dfX + 360.0;
+        if (dfXOffset < 0.0 && dfX > 0.0) return dfX - 360.0;
+    }
+    return dfX;
+}
+
+// The four sums at normalised (u, v, w).
+struct Ratios {
+    double dfPixelNum, dfPixelDen, dfLineNum, dfLineDen;
+};
+
+inline Ratios EvaluateSums(const RFInfo_t* psRF, const double* t) {
+    const int n = UsableTerms(psRF);
+    return {Sum(psRF->padfPixelNum, t, n), Sum(psRF->padfPixelDen, t, n),
+            Sum(psRF->padfLineNum, t, n), Sum(psRF->padfLineDen, t, n)};
+}
+
+// Image position the rational functions give, before the adjustment or the
+// half-pixel shift.
+inline void RationalImage(const RFInfo_t* psRF, double u, double v, double w, double* pdfPixel,
+                          double* pdfLine) {
+    TermSet sTerms;
+    FormTerms(u, v, w, sTerms.t);
+    Ratios r = EvaluateSums(psRF, sTerms.t);
+    if (r.dfPixelDen == 0.0) r.dfPixelDen = 1.0;
+    if (r.dfLineDen == 0.0) r.dfLineDen = 1.0;
+    *pdfPixel = r.dfPixelNum / r.dfPixelDen * psRF->dfPixelScale + psRF->dfPixelOffset;
+    *pdfLine = r.dfLineNum / r.dfLineDen * psRF->dfLineScale + psRF->dfLineOffset;
+}
+
+// Adjustment polynomial a0 + a1 p + a2 l + a3 p l + a4 p^2 + a5 l^2.
+inline double Adjustment(const double* a, double p, double l) {
+    return a[0] + a[1] * p + a[2] * l + a[3] * p * l + a[4] * p * p + a[5] * l * l;
+}
+
+// Places a new record's contents into the caller's record, or hands the new
+// record over.
+RFInfo_t* PlaceRecord(RFInfo_t* psNew, RFInfo_t* psExisting) {
+    if (psExisting == nullptr) return psNew;
+    *psExisting = *psNew;
+    std::free(psNew);
+    return psExisting;
+}
+
+// Normalises the default georeferencing text; the normalised form may be
+// longer than the buffer, so it is cut to fit.
+void SetDefaultGeosys(RFInfo_t* psRF) {
+    char szNormalised[NOVA_GEOSYS_LEN] = {};
+    DecodeGeosys(kDefaultGeosys, szNormalised);
+    const std::size_t nCopy = strnlen(szNormalised, RF_TEXT_SIZE - 1);
+    std::memcpy(psRF->pszGeosys, szNormalised, nCopy);
+    psRF->pszGeosys[nCopy] = '\0';
+    Geosys2ProjInfo(psRF->psProjInfo, psRF->pszGeosys, 0.0, 0.0, 1.0, 1.0);
+}
+
+}  // namespace
+
+RFInfo_t* RFAllocate(RFInfo_t* psExisting, int nTerms) {
+    // Every piece is owned by the unique_ptr until the record is complete, so
+    // an allocation failure part way releases what was already taken.
+    std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)> psNew(
+        static_cast<RFInfo_t*>(HCalloc(1, sizeof(RFInfo_t))), &RFDeallocate);
+    psNew->nTerms = nTerms;
+    psNew->nHalfPixelShift = 1;
+    psNew->nDownsample = 1;
+    psNew->nAdjust = 0;
+    const std::uint64_t nCoeffs = static_cast<std::uint64_t>(std::max(nTerms, RF_MAX_TERMS));
+    psNew->padfPixelNum = static_cast<double*>(HCalloc(nCoeffs, sizeof(double)));
+    psNew->padfPixelDen = static_cast<double*>(HCalloc(nCoeffs, sizeof(double)));
+    psNew->padfLineNum = static_cast<double*>(HCalloc(nCoeffs, sizeof(double)));
+    psNew->padfLineDen = static_cast<double*>(HCalloc(nCoeffs, sizeof(double)));
+    psNew->pszSensor = static_cast<char*>(HMalloc(RF_TEXT_SIZE));
+    psNew->pszSensor[0] = '\0';
+    psNew->pszGeosys = static_cast<char*>(HMalloc(RF_TEXT_SIZE));
+    psNew->pszGeosys[0] = '\0';
+    psNew->psProjInfo = static_cast<ProjInfo_t*>(HCalloc(1, sizeof(ProjInfo_t)));
+    InitProjInfo(psNew->psProjInfo, 0);
+    std::fill(std::begin(psNew->adfPixelAdjust), std::end(psNew->adfPixelAdjust), 0.0);
+    std::fill(std::begin(psNew->adfLineAdjust), std::end(psNew->adfLineAdjust), 0.0);
+    SetDefaultGeosys(psNew.get());
+    return PlaceRecord(psNew.release(), psExisting);
+}
+
+void RFDeallocate(RFInfo_t* psRF) {
+    if (psRF == nullptr) return;
+    std::free(psRF->psProjInfo);
+    std::free(psRF->pszSensor);
+    std::free(psRF->pszGeosys);
+    std::free(psRF->padfLineDen);
+    std::free(psRF->padfLineNum);
+    std::free(psRF->padfPixelDen);
+    std::free(psRF->padfPixelNum);
+    std::free(psRF);
+}
+
+void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPixel,
+               double* pdfLine) {
+    if (pdfPixel == nullptr || pdfLine == nullptr) {
+        IMPError(11, 0, _("Rational function output pointer is null."));
+        return;
+    }
+    if (!IsEvaluable(psRF)) {
+        ReportUnusableRecord(psRF);
+        *pdfPixel = LUMO_NULL_VALUE;
+        *pdfLine = LUMO_NULL_VALUE;
+        return;
+    }
+    if (dfZ == LUMO_NULL_VALUE) dfZ = 0.0;
+    dfX = WrapLongitude(dfX, psRF->dfXOffset);
+    const double u = (dfX - psRF->dfXOffset) / psRF->dfXScale;
+    const double v = (dfY - psRF->dfYOffset) / psRF->dfYScale;
+    const double w = (dfZ - psRF->dfZOffset) / psRF->dfZScale;
+    double p = 0.0;
+    double l = 0.0;
+    RationalImage(psRF, u, v, w, &p, &l);
+    if (psRF->nAdjust) {
+        *pdfPixel = p + Adjustment(psRF->adfPixelAdjust, p, l);
+        *pdfLine = l + Adjustment(psRF->adfLineAdjust, p, l);
+    } else if (psRF->nHalfPixelShift) {
+        *pdfPixel = p + 0.5;
+        *pdfLine = l + 0.5;
+    } else {
+        *pdfPixel = p;
+        *pdfLine = l;
+    }
+}
+
+int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double dfV, double dfW,
+           double* pdfU, double* pdfV) {
+    if (psRF == nullptr || pdfU == nullptr || pdfV == nullptr || !IsEvaluable(psRF)) return 0;
+    TermSet sT;
+    FormTerms(dfU, dfV, dfW, sT.t);
+    const Ratios r = EvaluateSums(psRF, sT.t);
+    Ratios ru, rv;
+    if (UsableTerms(psRF) == RF_MAX_TERMS) {
+        ru = {DerivativeU(psRF->padfPixelNum, dfU, dfV, dfW),
+              DerivativeU(psRF->padfPixelDen, dfU, dfV, dfW),
+              DerivativeU(psRF->padfLineNum, dfU, dfV, dfW),
+              DerivativeU(psRF->padfLineDen, dfU, dfV, dfW)};
+        rv = {DerivativeV(psRF->padfPixelNum, dfU, dfV, dfW),
+              DerivativeV(psRF->padfPixelDen, dfU, dfV, dfW),
+              DerivativeV(psRF->padfLineNum, dfU, dfV, dfW),
+              DerivativeV(psRF->padfLineDen, dfU, dfV, dfW)};
+    } else {
+        // Fewer terms: the derivatives take the same terms as the values.
+        TermSet sDu, sDv;
+        FormDerivativeTermsU(dfU, dfV, dfW, sDu.t);
+        FormDerivativeTermsV(dfU, dfV, dfW, sDv.t);
+        ru = EvaluateSums(psRF, sDu.t);
+        rv = EvaluateSums(psRF, sDv.t);
+    }
+    // A vanishing denominator has no ratio and no derivative: no step.
+    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return 0;
+    const double fp = r.dfPixelNum / r.dfPixelDen - dfPixelN;
+    const double fl = r.dfLineNum / r.dfLineDen - dfLineN;
+    const double dp2 = r.dfPixelDen * r.dfPixelDen;
+    const double dl2 = r.dfLineDen * r.dfLineDen;
+    const double pu = (ru.dfPixelNum * r.dfPixelDen - r.dfPixelNum * ru.dfPixelDen) / dp2;
+    const double pv = (rv.dfPixelNum * r.dfPixelDen - r.dfPixelNum * rv.dfPixelDen) / dp2;
+    const double lu = (ru.dfLineNum * r.dfLineDen - r.dfLineNum * ru.dfLineDen) / dl2;
+    const double lv = (rv.dfLineNum * r.dfLineDen - r.dfLineNum * rv.dfLineDen) / dl2;
+    const double det = pu * lv - pv * lu;
+    if (!(std::fabs(det) >= kSingularJacobian)) return 0;  // also refuses NaN
+    const double u = dfU - (lv * fp - pv * fl) / det;
+    const double v = dfV - (pu * fl - lu * fp) / det;
+    if (!std::isfinite(u) || !std::isfinite(v)) return 0;
+    *pdfU = u;
+    *pdfV = v;
+    return 1;
+}
+
+int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
+              double* pdfZ) {
+    if (pdfX == nullptr || pdfY == nullptr || pdfZ == nullptr) {
+        IMPError(11, 0, _("Rational function output pointer is null."));
+        return 0;
+    }
+    if (!IsEvaluable(psRF)) {
+        ReportUnusableRecord(psRF);
+        return 0;
+    }
+    if (!std::isfinite(dfPixel) || !std::isfinite(dfLine)) {
+        IMPErrReal(11, 0, std::isfinite(dfPixel) ? "line" : "pixel",
+                   std::isfinite(dfPixel) ? dfLine : dfPixel, 0);
+        return 0;
+    }
+    const double dfHeight = *pdfZ == LUMO_NULL_VALUE ? psRF->dfZOffset : *pdfZ;
+    const double dfStartX = (*pdfX == 0.0 || *pdfX == LUMO_NULL_VALUE) ? psRF->dfXOffset : *pdfX;
+    const double dfStartY = (*pdfY == 0.0 || *pdfY == LUMO_NULL_VALUE) ? psRF->dfYOffset : *pdfY;
+    if (!std::isfinite(dfHeight) || !std::isfinite(dfStartX) || !std::isfinite(dfStartY)) {
+        IMPErrReal(
+            11, 0, !std::isfinite(dfHeight) ? "height" : "starting ground coordinate",
+            !std::isfinite(dfHeight) ? dfHeight : (std::isfinite(dfStartX) ? dfStartY : dfStartX),
+            0);
+        return 0;
+    }
+
+    // Remove the image-space adjustment or the half-pixel shift.
+    double p = dfPixel;
+    double l = dfLine;
+    if (psRF->nAdjust) {
+        p = dfPixel - Adjustment(psRF->adfPixelAdjust, dfPixel, dfLine);
+        l = dfLine - Adjustment(psRF->adfLineAdjust, dfPixel, dfLine);
+    } else if (psRF->nHalfPixelShift) {
+        p = dfPixel - 0.5;
+        l = dfLine - 0.5;
+    }
+    const double pn = (p - psRF->dfPixelOffset) / psRF->dfPixelScale;
+    const double ln = (l - psRF->dfLineOffset) / psRF->dfLineScale;
+
+    double u = (dfStartX - psRF->dfXOffset) / psRF->dfXScale;
+    double v = (dfStartY - psRF->dfYOffset) / psRF->dfYScale;
+    const double w = (dfHeight - psRF->dfZOffset) / psRF->dfZScale;
+    for (int nSteps = 1; nSteps <= kMaxNewtonSteps; ++nSteps) {
+        double uNext = u;
+        double vNext = v;
+        if (!Newton(psRF, pn, ln, u, v, w, &uNext, &vNext)) break;
+        const bool bSmallStep =
+            std::fabs(uNext - u) < kStepTolerance && std::fabs(vNext - v) < kStepTolerance;
+        u = uNext;
+        v = vNext;
+        if (bSmallStep) break;
+    }
+
+    *pdfZ = dfHeight;
+    *pdfX = WrapLongitude(u * psRF->dfXScale + psRF->dfXOffset, psRF->dfXOffset);
+    *pdfY = v * psRF->dfYScale + psRF->dfYOffset;
+    return 1;
+}

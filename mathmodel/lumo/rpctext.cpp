@@ -1,0 +1,539 @@
+// RPC00B text forms of a rational function model: the "KEY: value" lines of
+// *_RPC.TXT files and the "name = value;" statements of .RPB files. Both
+// carry ten normalisation values and four lists of 20 coefficients, with
+// longitude, latitude and height on the ground side and line and sample on
+// the image side. RPC sample and line 0 are the centre of the first pixel,
+// which is what the model's half-pixel shift expresses.
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "lumo_rf.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+#define RPC_FAIL(message) throw nova::DataException((message), __FILE__, __func__, __LINE__)
+
+// The ten normalisation values, in the order of the text forms.
+enum Scalar {
+    kLineOff,
+    kSampOff,
+    kLatOff,
+    kLongOff,
+    kHeightOff,
+    kLineScale,
+    kSampScale,
+    kLatScale,
+    kLongScale,
+    kHeightScale,
+    kScalarCount
+};
+constexpr std::array<const char*, kScalarCount> kTxtScalarKeys = {
+    "LINE_OFF",   "SAMP_OFF",   "LAT_OFF",   "LONG_OFF",   "HEIGHT_OFF",
+    "LINE_SCALE", "SAMP_SCALE", "LAT_SCALE", "LONG_SCALE", "HEIGHT_SCALE"};
+constexpr std::array<const char*, kScalarCount> kRpbScalarKeys = {
+    "lineOffset", "sampOffset", "latOffset", "longOffset", "heightOffset",
+    "lineScale",  "sampScale",  "latScale",  "longScale",  "heightScale"};
+constexpr std::array<const char*, kScalarCount> kUnits = {"pixels",  "pixels", "degrees", "degrees",
+                                                          "meters",  "pixels", "pixels",  "degrees",
+                                                          "degrees", "meters"};
+
+// The four coefficient lists.
+enum List { kLineNum, kLineDen, kSampNum, kSampDen, kListCount };
+constexpr std::array<const char*, kListCount> kTxtListPrefixes = {
+    "LINE_NUM_COEFF_", "LINE_DEN_COEFF_", "SAMP_NUM_COEFF_", "SAMP_DEN_COEFF_"};
+constexpr std::array<const char*, kListCount> kRpbListKeys = {"lineNumCoef", "lineDenCoef",
+                                                              "sampNumCoef", "sampDenCoef"};
+
+// Everything a text gives, with the line each value came from (0: not yet).
+struct RpcValues {
+    std::array<double, kScalarCount> adfScalar{};
+    std::array<int, kScalarCount> anScalarLine{};
+    std::array<std::array<double, RF_MAX_TERMS>, kListCount> aadfCoeff{};
+    std::array<std::array<int, RF_MAX_TERMS>, kListCount> aanCoeffLine{};
+    std::string osSensor;
+};
+
+// Where a value came from, for messages.
+struct Origin {
+    const std::string& osSource;
+    int nLine;
+    std::string osKey;
+
+    std::string Prefix() const {
+        return osSource + ": line " + std::to_string(nLine) + ": key \"" + osKey + "\"";
+    }
+};
+
+bool IsBlank(char ch) {
+    return ch == ' ' || ch == '\t' || ch == '\r' || ch == '\n';
+}
+
+std::string Trim(const std::string& osText) {
+    std::size_t nStart = 0;
+    std::size_t nEnd = osText.size();
+    while (nStart < nEnd && IsBlank(osText[nStart])) ++nStart;
+    while (nEnd > nStart && IsBlank(osText[nEnd - 1])) --nEnd;
+    return osText.substr(nStart, nEnd - nStart);
+}
+
+bool EqualNoCase(const std::string& a, const char* b) {
+    const std::size_t n = std::strlen(b);
+    if (a.size() != n) return false;
+    for (std::size_t i = 0; i < n; ++i) {
+        if (std::tolower(static_cast<unsigned char>(a[i])) !=
+            std::tolower(static_cast<unsigned char>(b[i]))) {
+            return false;
+        }
+    }
+    return true;
+}
+
+bool StartsWithNoCase(const std::string& a, const char* b) {
+    const std::size_t n = std::strlen(b);
+    return a.size() >= n && EqualNoCase(a.substr(0, n), b);
+}
+
+// Printable form of a value for messages: long or binary texts are cut.
+std::string Shown(const std::string& osText) {
+    constexpr std::size_t kMaxShown = 60;
+    std::string osShown;
+    for (char ch : osText.substr(0, kMaxShown)) {
+        osShown += std::isprint(static_cast<unsigned char>(ch)) ? ch : '?';
+    }
+    if (osText.size() > kMaxShown) osShown += "...";
+    return "\"" + osShown + "\"";
+}
+
+// A whole token as a finite decimal number.
+double ParseNumber(const std::string& osToken, const Origin& origin) {
+    const char* pszStart = osToken.c_str();
+    char* pszEnd = nullptr;
+    const double dfValue = osToken.empty() ? 0.0 : std::strtod(pszStart, &pszEnd);
+    if (osToken.empty() || pszEnd != pszStart + osToken.size()) {
+        RPC_FAIL(origin.Prefix() + ": " + Shown(osToken) + " is not a number");
+    }
+    if (!std::isfinite(dfValue)) {
+        RPC_FAIL(origin.Prefix() + ": " + Shown(osToken) + " is not a finite number");
+    }
+    return dfValue;
+}
+
+std::vector<std::string> SplitLines(const std::string& osText) {
+    std::vector<std::string> aosLines;
+    std::size_t nStart = 0;
+    while (nStart <= osText.size()) {
+        const std::size_t nEnd = osText.find('\n', nStart);
+        if (nEnd == std::string::npos) {
+            aosLines.push_back(osText.substr(nStart));
+            break;
+        }
+        aosLines.push_back(osText.substr(nStart, nEnd - nStart));
+        nStart = nEnd + 1;
+    }
+    return aosLines;
+}
+
+void StoreScalar(RpcValues& values, int nIndex, double dfValue, const Origin& origin) {
+    if (values.anScalarLine[nIndex] != 0) {
+        RPC_FAIL(origin.Prefix() + ": repeated (first given on line " +
+                 std::to_string(values.anScalarLine[nIndex]) + ")");
+    }
+    const bool bScale = nIndex >= kLineScale;
+    if (bScale && dfValue == 0.0) RPC_FAIL(origin.Prefix() + ": a scale must not be 0");
+    values.adfScalar[nIndex] = dfValue;
+    values.anScalarLine[nIndex] = origin.nLine;
+}
+
+void StoreCoefficient(RpcValues& values, int nList, int nTerm, double dfValue,
+                      const Origin& origin) {
+    if (values.aanCoeffLine[nList][nTerm] != 0) {
+        RPC_FAIL(origin.Prefix() + ": repeated (first given on line " +
+                 std::to_string(values.aanCoeffLine[nList][nTerm]) + ")");
+    }
+    values.aadfCoeff[nList][nTerm] = dfValue;
+    values.aanCoeffLine[nList][nTerm] = origin.nLine;
+}
+
+// Every value must have been given.
+void RequireComplete(const RpcValues& values, const std::string& osSource, bool bTxt) {
+    for (int k = 0; k < kScalarCount; ++k) {
+        if (values.anScalarLine[k] == 0) {
+            RPC_FAIL(osSource + ": key \"" + (bTxt ? kTxtScalarKeys[k] : kRpbScalarKeys[k]) +
+                     "\" is missing");
+        }
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            if (values.aanCoeffLine[nList][i] != 0) continue;
+            std::string osKey = bTxt ? kTxtListPrefixes[nList] : kRpbListKeys[nList];
+            if (bTxt) osKey += std::to_string(i + 1);
+            RPC_FAIL(osSource + ": key \"" + osKey + "\" is missing");
+        }
+    }
+}
+
+// ---------------------------------------------------------------------------
+// KEY: value
+// ---------------------------------------------------------------------------
+
+// "number [unit]": a unit word after the number is allowed and not checked
+// against the key, as vendors spell units differently.
+double ParseTxtValue(const std::string& osValue, const Origin& origin) {
+    const std::size_t nBlank = osValue.find_first_of(" \t");
+    if (nBlank == std::string::npos) return ParseNumber(osValue, origin);
+    const std::string osUnit = Trim(osValue.substr(nBlank));
+    for (char ch : osUnit) {
+        if (!std::isalpha(static_cast<unsigned char>(ch))) {
+            RPC_FAIL(origin.Prefix() + ": " + Shown(osValue) +
+                     " is not a number followed by a unit");
+        }
+    }
+    return ParseNumber(osValue.substr(0, nBlank), origin);
+}
+
+// Index 1..20 after a coefficient key's prefix.
+int ParseTermIndex(const std::string& osDigits, const Origin& origin) {
+    bool bDigits = !osDigits.empty() && osDigits.size() <= 2;
+    for (char ch : osDigits) bDigits = bDigits && std::isdigit(static_cast<unsigned char>(ch));
+    const int nIndex = bDigits ? std::atoi(osDigits.c_str()) : 0;
+    if (nIndex < 1 || nIndex > RF_MAX_TERMS) {
+        RPC_FAIL(origin.Prefix() + ": coefficient number must lie in 1..20");
+    }
+    return nIndex - 1;
+}
+
+void ReadTxtLine(const std::string& osLine, int nLine, const std::string& osSource,
+                 RpcValues& values) {
+    const std::size_t nColon = osLine.find(':');
+    if (nColon == std::string::npos) {
+        RPC_FAIL(osSource + ": line " + std::to_string(nLine) +
+                 ": expected \"KEY: value\", found " + Shown(osLine));
+    }
+    const Origin origin{osSource, nLine, Trim(osLine.substr(0, nColon))};
+    const std::string osValue = Trim(osLine.substr(nColon + 1));
+    for (int k = 0; k < kScalarCount; ++k) {
+        if (EqualNoCase(origin.osKey, kTxtScalarKeys[k])) {
+            StoreScalar(values, k, ParseTxtValue(osValue, origin), origin);
+            return;
+        }
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        if (StartsWithNoCase(origin.osKey, kTxtListPrefixes[nList])) {
+            const int nTerm =
+                ParseTermIndex(origin.osKey.substr(std::strlen(kTxtListPrefixes[nList])), origin);
+            StoreCoefficient(values, nList, nTerm, ParseTxtValue(osValue, origin), origin);
+            return;
+        }
+    }
+    // Other keys (ERR_BIAS, ERR_RAND, vendor additions) carry nothing the
+    // model keeps.
+}
+
+RpcValues ReadTxt(const std::string& osText, const std::string& osSource) {
+    RpcValues values;
+    const std::vector<std::string> aosLines = SplitLines(osText);
+    for (std::size_t i = 0; i < aosLines.size(); ++i) {
+        const std::string osLine = Trim(aosLines[i]);
+        if (osLine.empty()) continue;
+        ReadTxtLine(osLine, static_cast<int>(i + 1), osSource, values);
+    }
+    RequireComplete(values, osSource, true);
+    return values;
+}
+
+// ---------------------------------------------------------------------------
+// name = value;
+// ---------------------------------------------------------------------------
+
+// The items of "( a, b, ... )".
+std::vector<std::string> SplitList(const std::string& osValue, const Origin& origin) {
+    if (osValue.size() < 2 || osValue.front() != '(' || osValue.back() != ')') {
+        RPC_FAIL(origin.Prefix() + ": expected a list \"( ..., ... )\", found " + Shown(osValue));
+    }
+    std::vector<std::string> aosItems;
+    const std::string osInner = osValue.substr(1, osValue.size() - 2);
+    std::size_t nStart = 0;
+    while (true) {
+        const std::size_t nComma = osInner.find(',', nStart);
+        aosItems.push_back(Trim(osInner.substr(nStart, nComma - nStart)));
+        if (nComma == std::string::npos) break;
+        nStart = nComma + 1;
+    }
+    return aosItems;
+}
+
+std::string Unquote(const std::string& osValue) {
+    if (osValue.size() >= 2 && osValue.front() == '"' && osValue.back() == '"') {
+        return osValue.substr(1, osValue.size() - 2);
+    }
+    return osValue;
+}
+
+void ReadRpbStatement(const std::string& osStatement, int nLine, const std::string& osSource,
+                      RpcValues& values) {
+    const std::size_t nEquals = osStatement.find('=');
+    if (nEquals == std::string::npos) {
+        RPC_FAIL(osSource + ": line " + std::to_string(nLine) +
+                 ": expected \"name = value;\", found " + Shown(osStatement));
+    }
+    const Origin origin{osSource, nLine, Trim(osStatement.substr(0, nEquals))};
+    // The statement ends with its ';', which is not part of the value.
+    const std::string osValue =
+        Trim(osStatement.substr(nEquals + 1, osStatement.size() - nEquals - 2));
+    for (int k = 0; k < kScalarCount; ++k) {
+        if (EqualNoCase(origin.osKey, kRpbScalarKeys[k])) {
+            StoreScalar(values, k, ParseNumber(osValue, origin), origin);
+            return;
+        }
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        if (!EqualNoCase(origin.osKey, kRpbListKeys[nList])) continue;
+        const std::vector<std::string> aosItems = SplitList(osValue, origin);
+        if (aosItems.size() != RF_MAX_TERMS) {
+            RPC_FAIL(origin.Prefix() + ": must hold 20 coefficients, found " +
+                     std::to_string(aosItems.size()));
+        }
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            StoreCoefficient(values, nList, i, ParseNumber(aosItems[i], origin), origin);
+        }
+        return;
+    }
+    if (EqualNoCase(origin.osKey, "satId")) values.osSensor = Unquote(osValue);
+}
+
+// Group brackets and the closing "END;" carry no values.
+bool IsStructureLine(const std::string& osLine) {
+    return StartsWithNoCase(osLine, "BEGIN_GROUP") || StartsWithNoCase(osLine, "END_GROUP") ||
+           EqualNoCase(osLine, "END;") || EqualNoCase(osLine, "END");
+}
+
+RpcValues ReadRpb(const std::string& osText, const std::string& osSource) {
+    RpcValues values;
+    const std::vector<std::string> aosLines = SplitLines(osText);
+    std::string osStatement;
+    int nStatementLine = 0;
+    for (std::size_t i = 0; i < aosLines.size(); ++i) {
+        const std::string osLine = Trim(aosLines[i]);
+        if (osLine.empty()) continue;
+        if (osStatement.empty()) {
+            if (IsStructureLine(osLine)) continue;
+            nStatementLine = static_cast<int>(i + 1);
+        } else {
+            osStatement += ' ';
+        }
+        osStatement += osLine;
+        // A statement (a list may span lines) ends with ';'.
+        if (osStatement.back() == ';') {
+            ReadRpbStatement(osStatement, nStatementLine, osSource, values);
+            osStatement.clear();
+        }
+    }
+    if (!osStatement.empty()) {
+        RPC_FAIL(osSource + ": line " + std::to_string(nStatementLine) +
+                 ": statement not ended by \";\": " + Shown(osStatement));
+    }
+    RequireComplete(values, osSource, false);
+    return values;
+}
+
+// ---------------------------------------------------------------------------
+// Record
+// ---------------------------------------------------------------------------
+
+RFInfo_t* ValuesToRecord(const RpcValues& values) {
+    std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)> psRF(RFAllocate(nullptr, RF_MAX_TERMS),
+                                                        &RFDeallocate);
+    psRF->dfXOffset = values.adfScalar[kLongOff];
+    psRF->dfXScale = values.adfScalar[kLongScale];
+    psRF->dfYOffset = values.adfScalar[kLatOff];
+    psRF->dfYScale = values.adfScalar[kLatScale];
+    psRF->dfZOffset = values.adfScalar[kHeightOff];
+    psRF->dfZScale = values.adfScalar[kHeightScale];
+    psRF->dfPixelOffset = values.adfScalar[kSampOff];
+    psRF->dfPixelScale = values.adfScalar[kSampScale];
+    psRF->dfLineOffset = values.adfScalar[kLineOff];
+    psRF->dfLineScale = values.adfScalar[kLineScale];
+    for (int i = 0; i < RF_MAX_TERMS; ++i) {
+        psRF->padfPixelNum[i] = values.aadfCoeff[kSampNum][i];
+        psRF->padfPixelDen[i] = values.aadfCoeff[kSampDen][i];
+        psRF->padfLineNum[i] = values.aadfCoeff[kLineNum][i];
+        psRF->padfLineDen[i] = values.aadfCoeff[kLineDen][i];
+    }
+    // The sensor buffer holds 16 characters; a longer name is cut.
+    const std::size_t nCopy = std::min<std::size_t>(values.osSensor.size(), RF_TEXT_SIZE - 1);
+    std::memcpy(psRF->pszSensor, values.osSensor.data(), nCopy);
+    psRF->pszSensor[nCopy] = '\0';
+    return psRF.release();
+}
+
+#define RPC_REFUSE(message)                                                                 \
+    throw nova::DataException(std::string("cannot write RPC text: ") + (message), __FILE__, \
+                              __func__, __LINE__)
+
+std::string BoundedText(const char* pszText) {
+    if (pszText == nullptr) return std::string();
+    return std::string(pszText, strnlen(pszText, RF_TEXT_SIZE - 1));
+}
+
+void CheckFinite(double dfValue, const char* pszField) {
+    if (!std::isfinite(dfValue)) {
+        RPC_REFUSE(std::string(pszField) + " = " + nova::FormatString("%g", dfValue) +
+                   " is not finite");
+    }
+}
+
+// The record as RPC values; refuses what the text forms cannot express.
+RpcValues RecordToValues(const RFInfo_t* psRF) {
+    if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
+        psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
+        RPC_REFUSE("the model or its coefficient arrays are null");
+    }
+    if (psRF->nAdjust) RPC_REFUSE("the image-space adjustment has no RPC equivalent");
+    if (psRF->nTerms > RF_MAX_TERMS) {
+        RPC_REFUSE("nTerms = " + std::to_string(psRF->nTerms) + " exceeds 20");
+    }
+    const std::string osGeosys = BoundedText(psRF->pszGeosys);
+    if (DecodeGeosys(osGeosys.c_str(), nullptr) != NOVA_PROJ_GEOGRAPHIC) {
+        RPC_REFUSE("ground coordinates \"" + osGeosys + "\" are not longitude and latitude");
+    }
+    RpcValues values;
+    // Without the half-pixel shift the model's pixel 0 is the first pixel's
+    // centre already; RPC positions are centre-based, so move the offsets.
+    const double dfShift = psRF->nHalfPixelShift ? 0.0 : -0.5;
+    values.adfScalar[kLongOff] = psRF->dfXOffset;
+    values.adfScalar[kLongScale] = psRF->dfXScale;
+    values.adfScalar[kLatOff] = psRF->dfYOffset;
+    values.adfScalar[kLatScale] = psRF->dfYScale;
+    values.adfScalar[kHeightOff] = psRF->dfZOffset;
+    values.adfScalar[kHeightScale] = psRF->dfZScale;
+    values.adfScalar[kSampOff] = psRF->dfPixelOffset + dfShift;
+    values.adfScalar[kSampScale] = psRF->dfPixelScale;
+    values.adfScalar[kLineOff] = psRF->dfLineOffset + dfShift;
+    values.adfScalar[kLineScale] = psRF->dfLineScale;
+    for (int k = 0; k < kScalarCount; ++k) {
+        CheckFinite(values.adfScalar[k], kTxtScalarKeys[k]);
+        if (k >= kLineScale && values.adfScalar[k] == 0.0) {
+            RPC_REFUSE(std::string(kTxtScalarKeys[k]) + " is 0");
+        }
+    }
+    // Terms beyond nTerms do not take part in the model: written as 0.
+    const int nTerms = std::max(psRF->nTerms, 0);
+    for (int i = 0; i < nTerms; ++i) {
+        values.aadfCoeff[kSampNum][i] = psRF->padfPixelNum[i];
+        values.aadfCoeff[kSampDen][i] = psRF->padfPixelDen[i];
+        values.aadfCoeff[kLineNum][i] = psRF->padfLineNum[i];
+        values.aadfCoeff[kLineDen][i] = psRF->padfLineDen[i];
+        for (int nList = 0; nList < kListCount; ++nList) {
+            CheckFinite(values.aadfCoeff[nList][i], kTxtListPrefixes[nList]);
+        }
+    }
+    values.osSensor = BoundedText(psRF->pszSensor);
+    return values;
+}
+
+// Shortest "%g" form that reads back to the same double, with its sign.
+std::string ExactNumber(double dfValue) {
+    for (int nDigits = 15; nDigits <= 17; ++nDigits) {
+        std::string osText = nova::FormatString("%+.*g", nDigits, dfValue);
+        if (std::strtod(osText.c_str(), nullptr) == dfValue) return osText;
+    }
+    return nova::FormatString("%+.17g", dfValue);
+}
+
+std::string Coefficient(double dfValue) {
+    return nova::FormatString("%+.16E", dfValue);
+}
+
+std::string WriteTxt(const RpcValues& values) {
+    std::string osText;
+    for (int k = 0; k < kScalarCount; ++k) {
+        osText += std::string(kTxtScalarKeys[k]) + ": " + ExactNumber(values.adfScalar[k]) + " " +
+                  kUnits[k] + "\n";
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            osText += kTxtListPrefixes[nList] + std::to_string(i + 1) + ": " +
+                      Coefficient(values.aadfCoeff[nList][i]) + "\n";
+        }
+    }
+    return osText;
+}
+
+std::string WriteRpb(const RpcValues& values) {
+    std::string osText;
+    // A sensor name with a quote or a line end cannot be written in the form.
+    bool bPlainSensor = !values.osSensor.empty();
+    for (char ch : values.osSensor) bPlainSensor = bPlainSensor && ch != '"' && ch >= ' ';
+    if (bPlainSensor) osText += "satId = \"" + values.osSensor + "\";\n";
+    osText += "SpecId = \"RPC00B\";\nBEGIN_GROUP = IMAGE\n";
+    for (int k = 0; k < kScalarCount; ++k) {
+        osText += std::string("\t") + kRpbScalarKeys[k] + " = " + ExactNumber(values.adfScalar[k]) +
+                  ";\n";
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        osText += std::string("\t") + kRpbListKeys[nList] + " = (";
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            osText += "\n\t\t\t" + Coefficient(values.aadfCoeff[nList][i]) +
+                      (i + 1 < RF_MAX_TERMS ? "," : ");\n");
+        }
+    }
+    osText += "END_GROUP = IMAGE\nEND;\n";
+    return osText;
+}
+
+}  // namespace
+
+int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength) {
+    if (pszText == nullptr) return LUMO_RPC_TEXT_AUTO;
+    const std::string osText(pszText, nLength);
+    for (const std::string& osRaw : SplitLines(osText)) {
+        const std::string osLine = Trim(osRaw);
+        if (osLine.empty()) continue;
+        const std::size_t nColon = osLine.find(':');
+        const std::size_t nEquals = osLine.find('=');
+        if (nColon != std::string::npos && nColon < nEquals) return LUMO_RPC_TEXT_TXT;
+        if (nEquals != std::string::npos) return LUMO_RPC_TEXT_RPB;
+        return LUMO_RPC_TEXT_AUTO;
+    }
+    return LUMO_RPC_TEXT_AUTO;
+}
+
+RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
+                              const char* pszSource) {
+    const std::string osSource = pszSource != nullptr ? pszSource : "RPC text";
+    if (pszText == nullptr) RPC_FAIL(osSource + ": no text");
+    if (nForm == LUMO_RPC_TEXT_AUTO) nForm = LumoDetectRPCTextForm(pszText, nLength);
+    const std::string osText(pszText, nLength);
+    switch (nForm) {
+        case LUMO_RPC_TEXT_TXT:
+            return ValuesToRecord(ReadTxt(osText, osSource));
+        case LUMO_RPC_TEXT_RPB:
+            return ValuesToRecord(ReadRpb(osText, osSource));
+        default:
+            RPC_FAIL(osSource +
+                     ": not RPC text (neither \"KEY: value\" lines nor \"name = value;\" "
+                     "statements)");
+    }
+}
+
+std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm) {
+    const RpcValues values = RecordToValues(psRF);
+    switch (nForm) {
+        case LUMO_RPC_TEXT_TXT:
+            return WriteTxt(values);
+        case LUMO_RPC_TEXT_RPB:
+            return WriteRpb(values);
+        default:
+            RPC_REFUSE("unknown text form " + std::to_string(nForm));
+    }
+}

@@ -1,0 +1,330 @@
+// Rational function model: allocation, forward and inverse transforms, the
+// Newton step and the generic dispatch with code 6.
+#include <gtest/gtest.h>
+
+#include <array>
+#include <cmath>
+#include <memory>
+#include <random>
+
+#include "lumo.h"
+#include "nova/projection.h"
+#include "nova/runtime.h"
+
+namespace {
+
+using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
+
+RecordPtr Allocate(int nTerms) {
+    return RecordPtr(RFAllocate(nullptr, nTerms), &RFDeallocate);
+}
+
+// Silences and counts warnings for the life of the object.
+class QuietWarnings {
+  public:
+    QuietWarnings() {
+        nova::ResetWarningCount();
+        moPrevious = nova::SetErrorSink([](const nova::ErrorReport&) {});
+    }
+    ~QuietWarnings() { nova::SetErrorSink(moPrevious); }
+    std::uint64_t Count() const { return nova::GetWarningCount(); }
+
+  private:
+    nova::ErrorSink moPrevious;
+};
+
+// A frame-like scene near 7.45 E 46.95 N: mostly linear, with cubic terms
+// and a first-order denominator as a perspective view has.
+RecordPtr SceneModel() {
+    RecordPtr psRF = Allocate(20);
+    psRF->dfXOffset = 7.45;
+    psRF->dfXScale = 0.16;
+    psRF->dfYOffset = 46.95;
+    psRF->dfYScale = 0.11;
+    psRF->dfZOffset = 800.0;
+    psRF->dfZScale = 500.0;
+    psRF->dfPixelOffset = 5074.5;
+    psRF->dfPixelScale = 5000.0;
+    psRF->dfLineOffset = 4961.5;
+    psRF->dfLineScale = 5000.0;
+    const std::array<double, 20> adfPixelNum = {0.002, 1.2,   0.05, 0.012, 0.003, 1e-4,  2e-4,
+                                                4e-3,  -2e-3, 1e-5, 1e-6,  3e-4,  -2e-4, 1e-6,
+                                                2e-4,  1e-4,  2e-6, -1e-6, 3e-6,  1e-7};
+    const std::array<double, 20> adfLineNum = {-0.001, 0.04, -1.21, 0.004, -0.002, 1e-4, -3e-4,
+                                               1e-3,   3e-3, 2e-5,  -1e-6, 1e-4,   2e-4, 1e-6,
+                                               -1e-4,  2e-4, 1e-6,  2e-6,  -2e-6,  -1e-7};
+    for (int i = 0; i < 20; ++i) {
+        psRF->padfPixelNum[i] = adfPixelNum[i];
+        psRF->padfLineNum[i] = adfLineNum[i];
+    }
+    psRF->padfPixelDen[0] = psRF->padfLineDen[0] = 1.0;
+    psRF->padfPixelDen[1] = psRF->padfLineDen[1] = 0.01;
+    psRF->padfPixelDen[2] = psRF->padfLineDen[2] = -0.02;
+    psRF->padfPixelDen[3] = psRF->padfLineDen[3] = 0.001;
+    return psRF;
+}
+
+// Independent evaluation of one polynomial, term by term from the table.
+double Polynomial(const double* c, int nTerms, double U, double V, double W) {
+    const double t[20] = {1,         U,         V,         W,         U * V,
+                          U * W,     V * W,     U * U,     V * V,     W * W,
+                          U * V * W, U * U * U, U * V * V, U * W * W, U * U * V,
+                          V * V * V, V * W * W, U * U * W, V * V * W, W * W * W};
+    double sum = 0.0;
+    for (int i = 0; i < nTerms; ++i) sum += c[i] * t[i];
+    return sum;
+}
+
+void ExpectedImage(const RFInfo_t& m, double x, double y, double z, double* p, double* l) {
+    const double U = (x - m.dfXOffset) / m.dfXScale;
+    const double V = (y - m.dfYOffset) / m.dfYScale;
+    const double W = (z - m.dfZOffset) / m.dfZScale;
+    *p = Polynomial(m.padfPixelNum, m.nTerms, U, V, W) /
+             Polynomial(m.padfPixelDen, m.nTerms, U, V, W) * m.dfPixelScale +
+         m.dfPixelOffset;
+    *l = Polynomial(m.padfLineNum, m.nTerms, U, V, W) /
+             Polynomial(m.padfLineDen, m.nTerms, U, V, W) * m.dfLineScale +
+         m.dfLineOffset;
+}
+
+TEST(RFAllocate, DefaultsAndPlacementIntoExistingRecord) {
+    RecordPtr psRF = Allocate(10);
+    EXPECT_EQ(psRF->nTerms, 10);
+    EXPECT_EQ(psRF->nHalfPixelShift, 1);
+    EXPECT_EQ(psRF->nDownsample, 1);
+    EXPECT_EQ(psRF->nAdjust, 0);
+    EXPECT_STREQ(psRF->pszSensor, "");
+    EXPECT_STREQ(psRF->pszGeosys, "LON D000");
+    EXPECT_EQ(DecodeGeosys(psRF->psProjInfo->szProj, nullptr), NOVA_PROJ_GEOGRAPHIC);
+    for (int i = 0; i < 20; ++i) {  // 20 entries although 10 terms
+        EXPECT_EQ(psRF->padfPixelNum[i], 0.0);
+        EXPECT_EQ(psRF->padfLineDen[i], 0.0);
+    }
+    for (int k = 0; k < 6; ++k) EXPECT_EQ(psRF->adfPixelAdjust[k] + psRF->adfLineAdjust[k], 0.0);
+    EXPECT_EQ(psRF->dfXScale, 0.0);
+
+    // Allocation into an existing record fills it and returns it.
+    RFInfo_t* psOuter = static_cast<RFInfo_t*>(HCalloc(1, sizeof(RFInfo_t)));
+    EXPECT_EQ(RFAllocate(psOuter, 30), psOuter);
+    EXPECT_EQ(psOuter->nTerms, 30);
+    psOuter->padfLineDen[29] = 1.0;  // 30 entries: in bounds
+    RFDeallocate(psOuter);
+    RFDeallocate(nullptr);  // no effect
+}
+
+TEST(RFGeo2Img, MatchesIndependentEvaluationWithShiftAndTermCounts) {
+    RecordPtr psRF = SceneModel();
+    double p = 0.0, l = 0.0, ep = 0.0, el = 0.0;
+    for (int nTerms : {20, 10, 4, 1}) {
+        psRF->nTerms = nTerms;
+        RFGeo2Img(psRF.get(), 7.52, 46.91, 1020.0, &p, &l);
+        ExpectedImage(*psRF, 7.52, 46.91, 1020.0, &ep, &el);
+        EXPECT_NEAR(p, ep + 0.5, 1e-9) << nTerms;
+        EXPECT_NEAR(l, el + 0.5, 1e-9) << nTerms;
+    }
+    // Without the shift the rational values come out unchanged; a null
+    // height is taken as 0.
+    psRF->nTerms = 20;
+    psRF->nHalfPixelShift = 0;
+    RFGeo2Img(psRF.get(), 7.4, 47.0, LUMO_NULL_VALUE, &p, &l);
+    ExpectedImage(*psRF, 7.4, 47.0, 0.0, &ep, &el);
+    EXPECT_NEAR(p, ep, 1e-9);
+    EXPECT_NEAR(l, el, 1e-9);
+
+    // No terms: every polynomial is 0, a zero denominator counts as 1.
+    psRF->nTerms = 0;
+    psRF->nHalfPixelShift = 1;
+    RFGeo2Img(psRF.get(), 7.4, 47.0, 0.0, &p, &l);
+    EXPECT_DOUBLE_EQ(p, 5075.0);
+    EXPECT_DOUBLE_EQ(l, 4962.0);
+    // More than 20 terms evaluates the 20 that exist.
+    RecordPtr psWide = Allocate(25);
+    psWide->dfXScale = psWide->dfYScale = psWide->dfZScale = 1.0;
+    psWide->dfPixelScale = psWide->dfLineScale = 1.0;
+    psWide->padfPixelNum[1] = psWide->padfLineNum[2] = 1.0;
+    psWide->padfPixelDen[0] = psWide->padfLineDen[0] = 1.0;
+    psWide->padfPixelNum[22] = 1e9;  // beyond the model
+    RFGeo2Img(psWide.get(), 3.0, 4.0, 0.0, &p, &l);
+    EXPECT_DOUBLE_EQ(p, 3.5);
+    EXPECT_DOUBLE_EQ(l, 4.5);
+}
+
+TEST(RFImg2Geo, RoundTripInsideTheCubeWithinTenNanodegrees) {
+    RecordPtr psRF = SceneModel();
+    std::mt19937 rng(7);
+    std::uniform_real_distribution<double> unit(-1.0, 1.0);
+    double worst = 0.0;
+    for (int k = 0; k < 2000; ++k) {
+        const double x = 7.45 + 0.16 * unit(rng), y = 46.95 + 0.11 * unit(rng);
+        const double z = 800.0 + 500.0 * unit(rng);
+        double p = 0.0, l = 0.0;
+        RFGeo2Img(psRF.get(), x, y, z, &p, &l);
+        double gx = LUMO_NULL_VALUE, gy = LUMO_NULL_VALUE, gz = z;
+        ASSERT_EQ(RFImg2Geo(psRF.get(), p, l, &gx, &gy, &gz), 1);
+        worst = std::max({worst, std::fabs(gx - x), std::fabs(gy - y)});
+    }
+    EXPECT_LT(worst, 1e-7);
+}
+
+TEST(RFImg2Geo, StartingGuessAndHeightRules) {
+    RecordPtr psRF = SceneModel();
+    double p = 0.0, l = 0.0;
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 800.0, &p, &l);
+    // X = 0 and Y = 0 start from the offsets; a null height becomes the
+    // height offset and is written back.
+    double x = 0.0, y = 0.0, z = LUMO_NULL_VALUE;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), p, l, &x, &y, &z), 1);
+    EXPECT_EQ(z, 800.0);
+    EXPECT_NEAR(x, 7.5, 1e-9);
+    EXPECT_NEAR(y, 46.9, 1e-9);
+    // A height of 0 is used as given.
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 0.0, &p, &l);
+    x = y = z = 0.0;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), p, l, &x, &y, &z), 1);
+    EXPECT_EQ(z, 0.0);
+    EXPECT_NEAR(x, 7.5, 1e-9);
+    // A caller's good guess converges to the same point.
+    x = 7.49;
+    y = 46.91;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), p, l, &x, &y, &z), 1);
+    EXPECT_NEAR(y, 46.9, 1e-9);
+}
+
+TEST(RFTransforms, AdjustmentReplacesTheHalfPixelShiftBothWays) {
+    RecordPtr psRF = SceneModel();
+    psRF->nAdjust = 1;
+    const double a[6] = {1.5, 1e-4, -2e-4, 1e-9, 2e-9, -1e-9};
+    const double b[6] = {-2.0, 3e-4, 1e-4, -1e-9, 1e-9, 3e-9};
+    std::copy(a, a + 6, psRF->adfPixelAdjust);
+    std::copy(b, b + 6, psRF->adfLineAdjust);
+    double p = 0.0, l = 0.0, ep = 0.0, el = 0.0;
+    RFGeo2Img(psRF.get(), 7.4, 46.99, 700.0, &p, &l);
+    ExpectedImage(*psRF, 7.4, 46.99, 700.0, &ep, &el);
+    const auto adjust = [&](const double* c) {
+        return c[0] + c[1] * ep + c[2] * el + c[3] * ep * el + c[4] * ep * ep + c[5] * el * el;
+    };
+    EXPECT_NEAR(p, ep + adjust(a), 1e-8);  // no +0.5
+    EXPECT_NEAR(l, el + adjust(b), 1e-8);
+    // The inverse subtracts the adjustment evaluated at the given position,
+    // which is not the exact inverse of the forward one: compare with that
+    // rule computed here.
+    const double P = 5000.0, L = 5000.0;
+    const double pa = P - (a[0] + a[1] * P + a[2] * L + a[3] * P * L + a[4] * P * P + a[5] * L * L);
+    const double la = L - (b[0] + b[1] * P + b[2] * L + b[3] * P * L + b[4] * P * P + b[5] * L * L);
+    double x = LUMO_NULL_VALUE, y = LUMO_NULL_VALUE, z = 700.0;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), P, L, &x, &y, &z), 1);
+    psRF->nAdjust = 0;
+    psRF->nHalfPixelShift = 0;
+    RFGeo2Img(psRF.get(), x, y, 700.0, &p, &l);
+    EXPECT_NEAR(p, pa, 1e-5);
+    EXPECT_NEAR(l, la, 1e-5);
+}
+
+TEST(RFTransforms, AntimeridianWrapsLongitudesIntoTheModelsSide) {
+    RecordPtr psRF = SceneModel();
+    psRF->dfXOffset = 179.0;
+    double p1 = 0.0, l1 = 0.0, p2 = 0.0, l2 = 0.0;
+    RFGeo2Img(psRF.get(), -179.05, 46.95, 800.0, &p1, &l1);
+    RFGeo2Img(psRF.get(), 180.95, 46.95, 800.0, &p2, &l2);
+    EXPECT_EQ(p1, p2);
+    EXPECT_EQ(l1, l2);
+    double x = LUMO_NULL_VALUE, y = LUMO_NULL_VALUE, z = 800.0;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), p1, l1, &x, &y, &z), 1);
+    EXPECT_NEAR(x, 180.95, 1e-9);  // -179.05 comes back as 180.95
+
+    psRF->dfXOffset = -179.0;
+    RFGeo2Img(psRF.get(), 179.05, 46.95, 800.0, &p1, &l1);
+    RFGeo2Img(psRF.get(), -180.95, 46.95, 800.0, &p2, &l2);
+    EXPECT_EQ(p1, p2);
+    x = y = LUMO_NULL_VALUE;
+    ASSERT_EQ(RFImg2Geo(psRF.get(), p1, l1, &x, &y, &z), 1);
+    EXPECT_NEAR(x, -180.95, 1e-9);
+
+    // A model away from the antimeridian does not wrap.
+    psRF->dfXOffset = 7.45;
+    RFGeo2Img(psRF.get(), -7.0, 46.95, 800.0, &p1, &l1);
+    ExpectedImage(*psRF, -7.0, 46.95, 800.0, &p2, &l2);
+    EXPECT_NEAR(p1, p2 + 0.5, 1e-6);
+}
+
+TEST(RFNewton, StepSingularJacobianAndZeroDenominator) {
+    RecordPtr psRF = SceneModel();
+    // One step from the centre towards a target moves closer to it.
+    double u = 9.0, v = 9.0;
+    ASSERT_EQ(Newton(psRF.get(), 0.3, -0.2, 0.0, 0.0, 0.1, &u, &v), 1);
+    double u2 = 0.0, v2 = 0.0;
+    ASSERT_EQ(Newton(psRF.get(), 0.3, -0.2, u, v, 0.1, &u2, &v2), 1);
+    EXPECT_LT(std::fabs(u2 - u), 0.05);
+    // A model without first-order terms has a zero Jacobian at the centre.
+    RecordPtr psFlat = Allocate(20);
+    psFlat->dfXScale = psFlat->dfYScale = psFlat->dfZScale = 1.0;
+    psFlat->dfPixelScale = psFlat->dfLineScale = 1.0;
+    psFlat->padfPixelDen[0] = psFlat->padfLineDen[0] = 1.0;
+    u = v = 42.0;
+    EXPECT_EQ(Newton(psFlat.get(), 0.5, 0.5, 0.0, 0.0, 0.0, &u, &v), 0);
+    EXPECT_EQ(u, 42.0);
+    EXPECT_EQ(v, 42.0);
+    // A vanishing denominator gives no step instead of NaN.
+    psFlat->padfPixelNum[1] = psFlat->padfLineNum[2] = 1.0;
+    psFlat->padfPixelDen[0] = 0.0;
+    EXPECT_EQ(Newton(psFlat.get(), 0.5, 0.5, 0.0, 0.0, 0.0, &u, &v), 0);
+    EXPECT_EQ(u, 42.0);
+    // The inverse stops at the singular step and keeps a finite estimate.
+    double x = LUMO_NULL_VALUE, y = LUMO_NULL_VALUE, z = 0.0;
+    EXPECT_EQ(RFImg2Geo(psFlat.get(), 3.0, 3.0, &x, &y, &z), 1);
+    EXPECT_TRUE(std::isfinite(x) && std::isfinite(y));
+}
+
+TEST(RFTransforms, UnusableRecordsAndInputsAreRefusedNotNaN) {
+    QuietWarnings quiet;
+    RecordPtr psRF = SceneModel();
+    psRF->dfYScale = 0.0;
+    double p = 1.0, l = 1.0;
+    RFGeo2Img(psRF.get(), 7.4, 47.0, 0.0, &p, &l);
+    EXPECT_EQ(p, LUMO_NULL_VALUE);
+    EXPECT_EQ(l, LUMO_NULL_VALUE);
+    EXPECT_EQ(nova::GetLastErrorReport().nCode, 11);
+    EXPECT_NE(nova::GetLastErrorReport().osText.find("dfYScale"), std::string::npos);
+    double x = 5.0, y = 6.0, z = 0.0;
+    EXPECT_EQ(RFImg2Geo(psRF.get(), 100.0, 100.0, &x, &y, &z), 0);
+    EXPECT_EQ(x, 5.0);
+    psRF->dfYScale = std::nan("");
+    EXPECT_EQ(RFImg2Geo(psRF.get(), 100.0, 100.0, &x, &y, &z), 0);
+    psRF->dfYScale = 0.11;
+    EXPECT_EQ(RFImg2Geo(psRF.get(), std::nan(""), 100.0, &x, &y, &z), 0);
+    z = INFINITY;
+    EXPECT_EQ(RFImg2Geo(psRF.get(), 100.0, 100.0, &x, &y, &z), 0);
+    EXPECT_EQ(x, 5.0);
+    EXPECT_EQ(RFImg2Geo(nullptr, 100.0, 100.0, &x, &y, &z), 0);
+    EXPECT_EQ(RFImg2Geo(psRF.get(), 100.0, 100.0, nullptr, &y, &z), 0);
+    RFGeo2Img(nullptr, 1.0, 1.0, 1.0, &p, &l);
+    EXPECT_EQ(p, LUMO_NULL_VALUE);
+    EXPECT_GE(quiet.Count(), 7u);
+}
+
+TEST(RFDispatch, Code6ForwardsAndStartsFromTheModelsGuess) {
+    RecordPtr psRF = SceneModel();
+    double p = 0.0, l = 0.0, ep = 0.0, el = 0.0;
+    EXPECT_EQ(GenGeo2Img(LUMO_CODE_RF, psRF.get(), 7.5, 46.9, 900.0, &p, &l), 1);
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 900.0, &ep, &el);
+    EXPECT_EQ(p, ep);
+    EXPECT_EQ(l, el);
+    // A wild guess in the outputs is overwritten before the inverse runs.
+    double x = 1e6, y = -1e6, z = LUMO_NULL_VALUE;
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 800.0, &p, &l);
+    EXPECT_EQ(GenImg2GeoDem(LUMO_CODE_RF, psRF.get(), p, l, &z, &x, &y), 1);
+    EXPECT_NEAR(x, 7.5, 1e-9);
+    EXPECT_NEAR(y, 46.9, 1e-9);
+    EXPECT_EQ(z, 800.0);  // the family writes the height back
+    x = y = 0.0;
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 900.0, &p, &l);
+    EXPECT_EQ(GenImg2Geo(LUMO_CODE_RF, psRF.get(), p, l, 900.0, &x, &y), 1);
+    EXPECT_NEAR(x, 7.5, 1e-9);
+    EXPECT_EQ(nova::mathmodel::ModelCodeToLumoType(LUMO_CODE_RF), nova::mathmodel::LUMO_MODEL_RF);
+    // A failed inverse is a failed dispatch.
+    QuietWarnings quiet;
+    psRF->dfXScale = 0.0;
+    EXPECT_EQ(GenImg2Geo(LUMO_CODE_RF, psRF.get(), p, l, 900.0, &x, &y), 0);
+}
+
+}  // namespace

@@ -1,0 +1,285 @@
+// RPC text forms: reading the bundled sample, round trips through both
+// forms, and every error path of the reader and the writer.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+
+#include "cli.h"
+#include "lumo.h"
+#include "model_io.h"
+#include "nova/runtime.h"
+
+namespace {
+
+using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
+
+const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
+
+std::string ReadFile(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+RecordPtr Parse(const std::string& text, int nForm = LUMO_RPC_TEXT_AUTO) {
+    return RecordPtr(LumoRPCTextToRFInfo(text.data(), text.size(), nForm, "sample.txt"),
+                     &RFDeallocate);
+}
+
+// The message of the exception a text raises ("" when it reads).
+std::string ParseError(const std::string& text) {
+    try {
+        Parse(text);
+    } catch (const nova::DataException& e) {
+        return e.what();
+    }
+    return "";
+}
+
+std::string WriteError(const RFInfo_t* psRF, int nForm) {
+    try {
+        LumoRFInfoToRPCText(psRF, nForm);
+    } catch (const nova::DataException& e) {
+        return e.what();
+    }
+    return "";
+}
+
+std::string Replace(std::string text, const std::string& from, const std::string& to) {
+    const std::size_t at = text.find(from);
+    EXPECT_NE(at, std::string::npos) << from;
+    if (at != std::string::npos) text.replace(at, from.size(), to);
+    return text;
+}
+
+void ExpectSameModel(const RFInfo_t& a, const RFInfo_t& b) {
+    const double* pa = &a.dfXOffset;
+    const double* pb = &b.dfXOffset;
+    for (int k = 0; k < 10; ++k) EXPECT_EQ(pa[k], pb[k]) << k;
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(a.padfPixelNum[i], b.padfPixelNum[i]) << i;
+        EXPECT_EQ(a.padfPixelDen[i], b.padfPixelDen[i]) << i;
+        EXPECT_EQ(a.padfLineNum[i], b.padfLineNum[i]) << i;
+        EXPECT_EQ(a.padfLineDen[i], b.padfLineDen[i]) << i;
+    }
+}
+
+// Control points of the sample file: id,pixel,line,x,y,z after the comments.
+struct Gcp {
+    double pixel, line, x, y, z;
+};
+
+std::vector<Gcp> SampleGcps() {
+    std::istringstream in(ReadFile(kExamples + "/rf_scene_gcps.csv"));
+    std::vector<Gcp> gcps;
+    std::string line;
+    while (std::getline(in, line)) {
+        if (line.empty() || line[0] == '#' || line[0] == 'i') continue;
+        Gcp g{};
+        char id[16];
+        if (std::sscanf(line.c_str(), "%15[^,],%lf,%lf,%lf,%lf,%lf", id, &g.pixel, &g.line, &g.x,
+                        &g.y, &g.z) == 6) {
+            gcps.push_back(g);
+        }
+    }
+    return gcps;
+}
+
+TEST(RPCText, SampleFileReadsIntoTheModelsAxesAndFitsItsControlPoints) {
+    const std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    EXPECT_EQ(LumoDetectRPCTextForm(text.data(), text.size()), LUMO_RPC_TEXT_TXT);
+    RecordPtr psRF = Parse(text);
+    EXPECT_EQ(psRF->dfXOffset, 7.45);   // LONG_OFF
+    EXPECT_EQ(psRF->dfYOffset, 46.95);  // LAT_OFF
+    EXPECT_EQ(psRF->dfXScale, 0.16);
+    EXPECT_EQ(psRF->dfPixelOffset, 5074.5);  // SAMP_OFF
+    EXPECT_EQ(psRF->dfLineOffset, 4961.5);
+    EXPECT_EQ(psRF->dfZScale, 500.0);
+    EXPECT_EQ(psRF->padfPixelDen[0], 1.0);  // SAMP_DEN_COEFF_1
+    EXPECT_EQ(psRF->nTerms, 20);
+    EXPECT_EQ(psRF->nHalfPixelShift, 1);
+    EXPECT_EQ(psRF->nAdjust, 0);
+    EXPECT_STREQ(psRF->pszGeosys, "LON D000");
+    // The control points come from the camera the model was fitted to, with
+    // pixel (0, 0) the corner of the first pixel.
+    const std::vector<Gcp> gcps = SampleGcps();
+    ASSERT_EQ(gcps.size(), 16u);
+    for (const Gcp& g : gcps) {
+        double p = 0.0, l = 0.0;
+        RFGeo2Img(psRF.get(), g.x, g.y, g.z, &p, &l);
+        EXPECT_NEAR(p, g.pixel, 0.01);
+        EXPECT_NEAR(l, g.line, 0.01);
+    }
+}
+
+TEST(RPCText, BothFormsRoundTripExactly) {
+    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    std::strcpy(psRF->pszSensor, "PLEIADES 1A");
+    const std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
+    EXPECT_EQ(LumoDetectRPCTextForm(rpb.data(), rpb.size()), LUMO_RPC_TEXT_RPB);
+    RecordPtr psFromRpb = Parse(rpb);
+    ExpectSameModel(*psRF, *psFromRpb);
+    EXPECT_STREQ(psFromRpb->pszSensor, "PLEIADES 1A");  // satId
+    const std::string txt = LumoRFInfoToRPCText(psFromRpb.get(), LUMO_RPC_TEXT_TXT);
+    ExpectSameModel(*psRF, *Parse(txt));
+    EXPECT_EQ(LumoRFInfoToRPCText(Parse(txt).get(), LUMO_RPC_TEXT_TXT), txt);
+
+    // Without the half-pixel shift the offsets move so that the model maps
+    // the same way after the round trip.
+    psRF->nHalfPixelShift = 0;
+    RecordPtr psShifted = Parse(LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_TXT));
+    EXPECT_EQ(psShifted->nHalfPixelShift, 1);
+    double p1 = 0, l1 = 0, p2 = 0, l2 = 0;
+    RFGeo2Img(psRF.get(), 7.5, 46.9, 700.0, &p1, &l1);
+    RFGeo2Img(psShifted.get(), 7.5, 46.9, 700.0, &p2, &l2);
+    EXPECT_NEAR(p1, p2, 1e-9);
+    EXPECT_NEAR(l1, l2, 1e-9);
+
+    // Fewer terms: the missing ones are written as 0.
+    psRF->nTerms = 4;
+    psRF->padfPixelNum[10] = 99.0;
+    RecordPtr psShort = Parse(LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB));
+    EXPECT_EQ(psShort->padfPixelNum[3], psRF->padfPixelNum[3]);
+    EXPECT_EQ(psShort->padfPixelNum[10], 0.0);
+}
+
+TEST(RPCText, TolerantOfLayoutVariants) {
+    std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    RecordPtr psRF = Parse(text);
+    // Windows line ends, lower-case keys, no units, extra vendor keys.
+    std::string variant = "ERR_BIAS: 1.5\r\nERR_RAND: 0.2\r\n";
+    std::istringstream in(text);
+    std::string line;
+    while (std::getline(in, line)) {
+        for (char& ch : line) ch = static_cast<char>(std::tolower(static_cast<unsigned char>(ch)));
+        const std::size_t unit = line.find(" pixels");
+        if (unit != std::string::npos) line.erase(unit);
+        variant += "  " + line + "\r\n\r\n";
+    }
+    ExpectSameModel(*psRF, *Parse(variant));
+    // The block form accepts lists spread over lines in any way.
+    std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
+    rpb = Replace(rpb, "lineNumCoef = (\n", "lineNumCoef=(");
+    ExpectSameModel(*psRF, *Parse(rpb));
+}
+
+TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
+    const std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    EXPECT_NE(ParseError(Replace(text, "LAT_SCALE: +0.11 degrees\n", ""))
+                  .find("key \"LAT_SCALE\" is missing"),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(text, "+4961.5", "4961,5")).find("line 1: key \"LINE_OFF\""),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(text, "+5000 pixels\nSAMP", "0 pixels\nSAMP"))
+                  .find("line 6: key \"LINE_SCALE\": a scale must not be 0"),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(text, "+46.95 degrees", "nan degrees")).find("not a finite"),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(text, "+7.45 degrees", "+7.45 degrees 3")).find("LONG_OFF"),
+              std::string::npos);
+    EXPECT_NE(ParseError(text + "LINE_OFF: 3\n").find("repeated (first given on line 1)"),
+              std::string::npos);
+    EXPECT_NE(ParseError(text + "LINE_NUM_COEFF_21: 3\n").find("must lie in 1..20"),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(text, "LINE_DEN_COEFF_7:", "LINE_DEN_COEFF_x:"))
+                  .find("LINE_DEN_COEFF_x"),
+              std::string::npos);
+    EXPECT_NE(ParseError(text + "garbage without colon\n").find("expected \"KEY: value\""),
+              std::string::npos);
+    EXPECT_NE(ParseError("").find("not RPC text"), std::string::npos);
+
+    RecordPtr psRF = Parse(text);
+    const std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
+    const std::size_t lastItem = rpb.rfind(",\n");
+    const std::string shortList = rpb.substr(0, lastItem) + ");\nEND_GROUP = IMAGE\nEND;\n";
+    EXPECT_NE(ParseError(shortList).find("must hold 20 coefficients, found 19"), std::string::npos);
+    EXPECT_NE(ParseError(Replace(rpb, "heightScale = +500;", "heightScale = +500"))
+                  .find("key \"heightScale\""),
+              std::string::npos);
+    EXPECT_NE(ParseError(rpb.substr(0, rpb.size() - 30)).find("statement not ended"),
+              std::string::npos);
+    EXPECT_NE(ParseError(Replace(rpb, "\tlatScale = +0.11;\n", "")).find("\"latScale\" is missing"),
+              std::string::npos);
+    EXPECT_NE(
+        ParseError(Replace(rpb, "sampNumCoef = (", "sampNumCoef = [")).find("expected a list"),
+        std::string::npos);
+    // A NUL inside a value is not part of a number.
+    EXPECT_NE(ParseError(Replace(text, "+800",
+                                 std::string("+8\0"
+                                             "0",
+                                             4)))
+                  .find("HEIGHT_OFF"),
+              std::string::npos);
+}
+
+TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
+    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    psRF->nAdjust = 1;
+    EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT).find("adjustment"), std::string::npos);
+    psRF->nAdjust = 0;
+    std::strcpy(psRF->pszGeosys, "UTM 31 U D000");
+    EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_RPB).find("UTM 31 U D000"), std::string::npos);
+    std::strcpy(psRF->pszGeosys, "LONG/LAT D000");
+    psRF->padfLineDen[3] = INFINITY;
+    EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT).find("not finite"), std::string::npos);
+    psRF->padfLineDen[3] = 0.0;
+    psRF->dfZScale = 0.0;
+    EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT).find("HEIGHT_SCALE is 0"),
+              std::string::npos);
+    psRF->dfZScale = 1.0;
+    EXPECT_NE(WriteError(psRF.get(), 7).find("unknown text form"), std::string::npos);
+    EXPECT_NE(WriteError(nullptr, LUMO_RPC_TEXT_TXT), "");
+    EXPECT_EQ(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT), "");
+}
+
+TEST(RPCText, LongSatelliteNameIsCutToTheSensorBuffer) {
+    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
+    rpb = "satId = \"A-VERY-LONG-SATELLITE-NAME\";\n" + rpb;
+    EXPECT_STREQ(Parse(rpb)->pszSensor, "A-VERY-LONG-SATE");
+}
+
+// The tool converts through every form and the JSON model evaluates like
+// the text it came from.
+TEST(RPCText, ToolConvertsBetweenAllForms) {
+    const std::string dir = ::testing::TempDir();
+    const std::string rpb = dir + "/h_scene.RPB", json = dir + "/h_scene.json";
+    const std::string bin = dir + "/h_scene.bin", txt = dir + "/h_scene_RPC.TXT";
+    const auto run = [](std::vector<std::string> args) {
+        args.insert(args.begin(), "lumo");
+        std::vector<char*> argv;
+        for (std::string& a : args) argv.push_back(&a[0]);
+        std::ostringstream out, err;
+        const int rc = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
+        return std::make_pair(rc, err.str());
+    };
+    const std::string sample = kExamples + "/rf_scene_RPC.TXT";
+    EXPECT_EQ(run({"rpc", sample, rpb}).first, 0);
+    EXPECT_EQ(run({"rpc", rpb, json, "--pixels", "10000", "--lines", "10000"}).first, 0);
+    EXPECT_EQ(run({"rpc", json, bin}).first, 0);
+    EXPECT_EQ(run({"rpc", bin, txt, "--to", "txt"}).first, 0);
+    RecordPtr psSample = Parse(ReadFile(sample));
+    const lumo::cli::LoadedModel model = lumo::cli::ReadModelFile(json);
+    EXPECT_EQ(model.nModelCode, LUMO_CODE_RF);
+    EXPECT_EQ(model.sEnvelope.nPixels, 10000);
+    ExpectSameModel(*psSample, *static_cast<RFInfo_t*>(model.poRecord.get()));
+    // The block keeps 15 significant digits.
+    RecordPtr psFromBlock = Parse(ReadFile(txt));
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_NEAR(psFromBlock->padfPixelNum[i], psSample->padfPixelNum[i],
+                    1e-14 * std::fabs(psSample->padfPixelNum[i]));
+    }
+    const auto failed = run({"rpc", sample, dir + "/x.unknown"});
+    EXPECT_NE(failed.first, 0);
+    EXPECT_NE(failed.second.find("give --to"), std::string::npos);
+    const auto poly = run({"rpc", kExamples + "/poly_utm31.json", txt});
+    EXPECT_NE(poly.second.find("not a rational function model"), std::string::npos);
+}
+
+}  // namespace
