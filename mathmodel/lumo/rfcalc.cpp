@@ -18,6 +18,14 @@ constexpr int kMaxNewtonSteps = 20;
 constexpr double kStepTolerance = 1e-5;     // normalised units
 constexpr double kSingularJacobian = 1e-5;  // |det| below this stops the iteration
 
+// The forward transform is the hot loop of orthorectification: on x86-64
+// Linux it is also built for AVX2/FMA processors and picked at load time.
+#if defined(__x86_64__) && defined(__linux__) && defined(__GNUC__) && !defined(__clang__)
+#define LUMO_HOT_CLONES __attribute__((flatten, target_clones("arch=x86-64-v3", "default")))
+#else
+#define LUMO_HOT_CLONES
+#endif
+
 // Values of the 20 terms, and their derivatives by U and by V.
 struct TermSet {
     double t[RF_MAX_TERMS];
@@ -277,6 +285,7 @@ void RFDeallocate(RFInfo_t* psRF) {
     std::free(psRF);
 }
 
+LUMO_HOT_CLONES
 void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPixel,
                double* pdfLine) {
     if (pdfPixel == nullptr || pdfLine == nullptr) {
