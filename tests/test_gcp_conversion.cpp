@@ -1,0 +1,331 @@
+// Control point conversion to WGS 84 ellipsoidal coordinates: vertical
+// datums, projected input, and every failure path.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <unistd.h>
+
+#include "cli.h"
+#include "lumo_gcp.h"
+#include "points_io.h"
+#include "projection.h"
+#include "runtime.h"
+
+namespace {
+
+ProjInfo_t Projection(const char* pszGeosys) {
+    ProjInfo_t sProj{};
+    EXPECT_EQ(Geosys2ProjInfo(&sProj, pszGeosys, 0.0, 0.0, 1.0, 1.0), 0) << pszGeosys;
+    return sProj;
+}
+
+void ExpectSameImage(const std::vector<ControlPoint_t>& asOut,
+                     const std::vector<ControlPoint_t>& asIn) {
+    ASSERT_EQ(asOut.size(), asIn.size());
+    for (std::size_t i = 0; i < asIn.size(); ++i) {
+        EXPECT_EQ(asOut[i].dfImageX, asIn[i].dfImageX);
+        EXPECT_EQ(asOut[i].dfImageY, asIn[i].dfImageY);
+    }
+}
+
+void ExpectUnchanged(const std::vector<ControlPoint_t>& asOut,
+                     const std::vector<ControlPoint_t>& asIn) {
+    ExpectSameImage(asOut, asIn);
+    for (std::size_t i = 0; i < asIn.size() && i < asOut.size(); ++i) {
+        EXPECT_EQ(asOut[i].dfGroundX, asIn[i].dfGroundX);
+        EXPECT_EQ(asOut[i].dfGroundY, asIn[i].dfGroundY);
+        EXPECT_EQ(asOut[i].dfGroundZ, asIn[i].dfGroundZ);
+    }
+}
+
+// Distance along the WGS 84 meridian from the equator to latitude dfLat
+// (series in the squared eccentricity to its third power).
+double MeridianArc(double dfLatDeg) {
+    const double a = 6378137.0;
+    const double f = 1.0 / 298.257223563;
+    const double e2 = f * (2.0 - f), e4 = e2 * e2, e6 = e4 * e2;
+    const double phi = dfLatDeg * M_PI / 180.0;
+    return a * ((1.0 - e2 / 4.0 - 3.0 * e4 / 64.0 - 5.0 * e6 / 256.0) * phi -
+                (3.0 * e2 / 8.0 + 3.0 * e4 / 32.0 + 45.0 * e6 / 1024.0) * std::sin(2.0 * phi) +
+                (15.0 * e4 / 256.0 + 45.0 * e6 / 1024.0) * std::sin(4.0 * phi) -
+                (35.0 * e6 / 3072.0) * std::sin(6.0 * phi));
+}
+
+TEST(GcpConversion, MeanSeaLevelPointsLandAtTheGeoidUndulation) {
+    const ProjInfo_t sLonLat = Projection("LONG/LAT D000");
+    const std::vector<ControlPoint_t> asIn = {
+        {10.0, 20.0, 5.0, 52.0, 0.0},    // the Netherlands
+        {30.0, 40.0, 78.0, -5.0, 0.0},   // Indian Ocean geoid low
+        {50.0, 60.0, 78.0, -5.0, 250.0}  // heights add to the undulation
+    };
+    std::vector<ControlPoint_t> asGcps = asIn;
+    ConvertGcpsToWgs84Ell(sLonLat, "M", asGcps);
+    ExpectSameImage(asGcps, asIn);
+    for (std::size_t i = 0; i < asIn.size(); ++i) {
+        EXPECT_NEAR(asGcps[i].dfGroundX, asIn[i].dfGroundX, 1e-9);
+        EXPECT_NEAR(asGcps[i].dfGroundY, asIn[i].dfGroundY, 1e-9);
+    }
+    EXPECT_NEAR(asGcps[0].dfGroundZ, 43.4, 0.5);
+    EXPECT_NEAR(asGcps[1].dfGroundZ, -91.8, 0.5);
+    EXPECT_NEAR(asGcps[2].dfGroundZ - asGcps[1].dfGroundZ, 250.0, 1e-6);
+
+    // Any height reference but exactly "M" is ellipsoidal: heights unchanged.
+    for (const char* pszRef : {"m", "E", "", "M ", "MSL"}) {
+        std::vector<ControlPoint_t> asEll = asIn;
+        ConvertGcpsToWgs84Ell(sLonLat, pszRef, asEll);
+        ExpectSameImage(asEll, asIn);
+        for (std::size_t i = 0; i < asIn.size(); ++i) {
+            EXPECT_NEAR(asEll[i].dfGroundX, asIn[i].dfGroundX, 1e-9) << pszRef;
+            EXPECT_NEAR(asEll[i].dfGroundY, asIn[i].dfGroundY, 1e-9) << pszRef;
+            EXPECT_NEAR(asEll[i].dfGroundZ, asIn[i].dfGroundZ, 1e-6) << pszRef;
+        }
+    }
+
+    // An empty vector stays empty.
+    std::vector<ControlPoint_t> asEmpty;
+    ConvertGcpsToWgs84Ell(sLonLat, "M", asEmpty);
+    EXPECT_TRUE(asEmpty.empty());
+}
+
+TEST(GcpConversion, UtmToWgs84Ellipsoidal) {
+    const ProjInfo_t sUtm = Projection("UTM 31 D000");
+    // On the zone's central meridian (3 E) the northing is the scaled
+    // meridian arc, so longitude and latitude are known independently.
+    const double dfNorthing = 0.9996 * MeridianArc(52.0);
+    const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 500000.0, dfNorthing, 100.0},
+                                              {3.0, 4.0, 650000.0, 5600000.0, -20.0}};
+    std::vector<ControlPoint_t> asEll = asIn;
+    ConvertGcpsToWgs84Ell(sUtm, "E", asEll);
+    ExpectSameImage(asEll, asIn);
+    EXPECT_NEAR(asEll[0].dfGroundX, 3.0, 1e-9);
+    EXPECT_NEAR(asEll[0].dfGroundY, 52.0, 1e-6);
+    EXPECT_NEAR(asEll[0].dfGroundZ, 100.0, 1e-6);
+    // Off the meridian: the host's planar reprojection gives the same place.
+    ProjInfo_t sLonLat = Projection("LONG/LAT D000");
+    double dfLon = 0.0, dfLat = 0.0;
+    ASSERT_EQ(GCTPTransform(&sUtm, 650000.0, 5600000.0, &sLonLat, &dfLon, &dfLat), 0);
+    EXPECT_NEAR(asEll[1].dfGroundX, dfLon, 1e-9);
+    EXPECT_NEAR(asEll[1].dfGroundY, dfLat, 1e-9);
+    EXPECT_NEAR(asEll[1].dfGroundZ, -20.0, 1e-6);
+
+    // Mean sea level heights gain the same undulation as the geographic
+    // point they project to.
+    std::vector<ControlPoint_t> asMsl = asIn;
+    ConvertGcpsToWgs84Ell(sUtm, "M", asMsl);
+    std::vector<ControlPoint_t> asGeo = {{0.0, 0.0, 3.0, 52.0, 100.0}};
+    ConvertGcpsToWgs84Ell(sLonLat, "M", asGeo);
+    EXPECT_NEAR(asMsl[0].dfGroundX, 3.0, 1e-9);
+    EXPECT_NEAR(asMsl[0].dfGroundY, 52.0, 1e-6);
+    EXPECT_NEAR(asMsl[0].dfGroundZ, asGeo[0].dfGroundZ, 1e-3);
+    EXPECT_GT(asMsl[0].dfGroundZ, 130.0);  // the geoid lies ~45 m above the ellipsoid here
+}
+
+TEST(GcpConversion, ProjectionWithoutCoordinateSystemIsAParameterError) {
+    ProjInfo_t sPixel{};
+    InitProjInfo(&sPixel, 1);
+    const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 3.0, 4.0, 5.0}};
+    std::vector<ControlPoint_t> asGcps = asIn;
+    try {
+        ConvertGcpsToWgs84Ell(sPixel, "E", asGcps);
+        ADD_FAILURE() << "no exception";
+    } catch (const nova::ParameterException& e) {
+        EXPECT_EQ(e.GetParameterName(), "sProj");
+        EXPECT_EQ(e.GetParameterType(), 1);
+        EXPECT_NE(e.GetMessage().find("\"PIXEL\""), std::string::npos) << e.GetMessage();
+        EXPECT_EQ(e.GetFile(), "mathmodel/lumo/mmodel_func");
+    }
+    ExpectUnchanged(asGcps, asIn);
+}
+
+TEST(GcpConversion, PointThatCannotBeTransformedChangesNothing) {
+    const ProjInfo_t sLonLat = Projection("LONG/LAT D000");
+    const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 5.0, 52.0, 0.0},
+                                              {3.0, 4.0, 5.0, 95.0, 0.0},  // beyond the pole
+                                              {5.0, 6.0, 6.0, 51.0, 0.0}};
+    for (const char* pszRef : {"M", "E"}) {
+        std::vector<ControlPoint_t> asGcps = asIn;
+        try {
+            ConvertGcpsToWgs84Ell(sLonLat, pszRef, asGcps);
+            ADD_FAILURE() << "no exception";
+        } catch (const nova::DataException& e) {
+            EXPECT_NE(e.GetMessage().find("GCP 2 "), std::string::npos) << e.GetMessage();
+            EXPECT_NE(e.GetMessage().find("Y 95"), std::string::npos) << e.GetMessage();
+        }
+        ExpectUnchanged(asGcps, asIn);
+    }
+    std::vector<ControlPoint_t> asNan = {{1.0, 2.0, std::nan(""), 52.0, 0.0}};
+    EXPECT_THROW(ConvertGcpsToWgs84Ell(Projection("UTM 31 D000"), "E", asNan), nova::DataException);
+    EXPECT_TRUE(std::isnan(asNan[0].dfGroundX));
+}
+
+// Without the geoid model no transformation from mean sea level heights
+// exists: the documented exception, even for an empty vector.
+TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
+    const std::filesystem::path oDatabase = "/usr/share/proj/proj.db";
+    if (!std::filesystem::exists(oDatabase)) GTEST_SKIP() << "no " << oDatabase;
+    const char* pszSavedData = std::getenv("PROJ_DATA");
+    const std::string osSaved = pszSavedData != nullptr ? pszSavedData : "";
+    const std::filesystem::path oDir =
+        std::filesystem::temp_directory_path() / ("lumo_gcp_nogeoid_" + std::to_string(getpid()));
+    std::filesystem::create_directories(oDir);
+    std::filesystem::create_symlink(oDatabase, oDir / "proj.db");
+    setenv("PROJ_DATA", oDir.c_str(), 1);
+
+    const ProjInfo_t sLonLat = Projection("LONG/LAT D000");
+    const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 5.0, 52.0, 0.0}};
+    std::vector<ControlPoint_t> asGcps = asIn;
+    std::vector<ControlPoint_t> asEmpty;
+    std::vector<ControlPoint_t> asEll = asIn;
+    std::string osMessage, osFile, osFunction;
+    int nLine = 0;
+    bool bEmptyThrew = false;
+    bool bEllipsoidalWorked = false;
+    // A new thread makes a new PROJ context, which reads the search path.
+    std::thread oWorker([&] {
+        try {
+            ConvertGcpsToWgs84Ell(sLonLat, "M", asGcps);
+        } catch (const nova::Exception& e) {
+            osMessage = e.GetMessage();
+            osFile = e.GetFile();
+            osFunction = e.GetFunction();
+            nLine = e.GetLine();
+        }
+        try {
+            ConvertGcpsToWgs84Ell(sLonLat, "M", asEmpty);
+        } catch (const nova::Exception&) {
+            bEmptyThrew = true;
+        }
+        ConvertGcpsToWgs84Ell(sLonLat, "E", asEll);
+        bEllipsoidalWorked = true;
+    });
+    oWorker.join();
+
+    if (pszSavedData != nullptr) {
+        setenv("PROJ_DATA", osSaved.c_str(), 1);
+    } else {
+        unsetenv("PROJ_DATA");
+    }
+    std::filesystem::remove_all(oDir);
+
+    EXPECT_EQ(osMessage, "Could not transform GCPs to WGS84 Ellipsoidal");
+    EXPECT_EQ(osFile, "mathmodel/lumo/mmodel_func");
+    EXPECT_EQ(osFunction,
+              "void __cdecl ConvertGcpsToWgs84Ell(const struct ProjInfo_t &,const class "
+              "std::basic_string<char,struct std::char_traits<char>,class "
+              "std::allocator<char> >,class std::vector<struct ControlPoint_t,class "
+              "std::allocator<struct ControlPoint_t> > &)");
+    EXPECT_EQ(nLine, 217);
+    EXPECT_TRUE(bEmptyThrew);
+    EXPECT_TRUE(asEmpty.empty());
+    ExpectUnchanged(asGcps, asIn);
+    EXPECT_TRUE(bEllipsoidalWorked);
+    EXPECT_NEAR(asEll[0].dfGroundY, 52.0, 1e-9);
+}
+
+// ---------------------------------------------------------------------------
+// The tool: lumo gcps convert
+// ---------------------------------------------------------------------------
+
+struct RunResult {
+    int nCode;
+    std::string osOut;
+    std::string osErr;
+};
+
+RunResult RunTool(std::vector<std::string> asArgs) {
+    asArgs.insert(asArgs.begin(), "lumo");
+    std::vector<char*> apszArgv;
+    for (std::string& osArg : asArgs) apszArgv.push_back(osArg.data());
+    std::ostringstream oOut, oErr;
+    const int nCode =
+        lumo::cli::RunLumo(static_cast<int>(apszArgv.size()), apszArgv.data(), oOut, oErr);
+    return {nCode, oOut.str(), oErr.str()};
+}
+
+std::string Scratch(const std::string& osName) {
+    return (std::filesystem::temp_directory_path() /
+            ("lumo_gcps_" + std::to_string(getpid()) + "_" + osName))
+        .string();
+}
+
+TEST(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
+    const std::string osInput = std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31_gcps.csv";
+    const std::string osOutput = Scratch("out.csv");
+    const RunResult sRun = RunTool({"gcps", "convert", "--geosys", "UTM 31 U D000", "--height-ref",
+                                    "M", osInput, "-o", osOutput});
+    ASSERT_EQ(sRun.nCode, 0) << sRun.osErr;
+    const lumo::cli::PointSet sIn =
+        lumo::cli::ReadPointsFile(osInput, lumo::cli::PointKind::ControlPoint);
+    const lumo::cli::PointSet sOut =
+        lumo::cli::ReadPointsFile(osOutput, lumo::cli::PointKind::ControlPoint);
+    std::filesystem::remove(osOutput);
+
+    // The library's conversion of the same points, written without loss.
+    std::vector<ControlPoint_t> asExpected;
+    asExpected.reserve(sIn.asPoints.size());
+    for (const auto& p : sIn.asPoints) {
+        asExpected.push_back({p.dfPixel, p.dfLine, p.dfX, p.dfY, p.dfZ});
+    }
+    ConvertGcpsToWgs84Ell(Projection("UTM 31 U D000"), "M", asExpected);
+    ASSERT_EQ(sOut.asPoints.size(), asExpected.size());
+    ASSERT_TRUE(sOut.bHasId && sOut.bHasZ);
+    for (std::size_t i = 0; i < asExpected.size(); ++i) {
+        EXPECT_EQ(sOut.asPoints[i].osId, sIn.asPoints[i].osId);
+        EXPECT_EQ(sOut.asPoints[i].dfPixel, sIn.asPoints[i].dfPixel);
+        EXPECT_EQ(sOut.asPoints[i].dfLine, sIn.asPoints[i].dfLine);
+        EXPECT_EQ(sOut.asPoints[i].dfX, asExpected[i].dfGroundX);
+        EXPECT_EQ(sOut.asPoints[i].dfY, asExpected[i].dfGroundY);
+        EXPECT_EQ(sOut.asPoints[i].dfZ, asExpected[i].dfGroundZ);
+        // Northern Belgium / the Netherlands: the geoid lies 40-50 m up.
+        EXPECT_NEAR(sOut.asPoints[i].dfZ - sIn.asPoints[i].dfZ, 45.0, 6.0);
+    }
+
+    // Without -o the result goes to standard output, header first.
+    const RunResult sStdout =
+        RunTool({"gcps", "convert", "--geosys", "UTM 31 U D000", "--height-ref", "E", osInput});
+    ASSERT_EQ(sStdout.nCode, 0) << sStdout.osErr;
+    EXPECT_EQ(sStdout.osOut.rfind("id,pixel,line,x,y,z\n", 0), 0u) << sStdout.osOut;
+}
+
+TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
+    const std::string osInput = Scratch("in.csv");
+    std::ofstream(osInput) << "id,pixel,line,x,y\nA,1,2,5,52\nB,3,4,5,95\n";
+    const std::string osOutput = Scratch("kept.csv");
+    std::ofstream(osOutput) << "old contents\n";
+
+    const struct {
+        std::vector<std::string> asArgs;
+        std::string osMessagePart;
+    } asCases[] = {
+        {{"--geosys", "NOT A PROJECTION", "--height-ref", "E", osInput}, "\"NOT A PROJECTION\""},
+        {{"--geosys", "PIXEL", "--height-ref", "E", osInput}, "\"PIXEL\""},
+        {{"--geosys", "LONG/LAT D000", "--height-ref", "X", osInput}, "X"},
+        {{"--geosys", "LONG/LAT D000", "--height-ref", "M", osInput}, ":3 (id \"B\")"},
+        {{"--geosys", "LONG/LAT D000", "--height-ref", "E", Scratch("missing.csv")}, "missing"},
+        {{"--height-ref", "E", osInput}, "--geosys"},
+    };
+    for (const auto& sCase : asCases) {
+        std::vector<std::string> asArgs = {"gcps", "convert"};
+        asArgs.insert(asArgs.end(), sCase.asArgs.begin(), sCase.asArgs.end());
+        asArgs.insert(asArgs.end(), {"-o", osOutput});
+        const RunResult sRun = RunTool(asArgs);
+        EXPECT_NE(sRun.nCode, 0) << sCase.osMessagePart;
+        EXPECT_NE(sRun.osErr.find(sCase.osMessagePart), std::string::npos) << sRun.osErr;
+        std::ifstream oKept(osOutput);
+        std::string osKept;
+        std::getline(oKept, osKept);
+        EXPECT_EQ(osKept, "old contents") << sCase.osMessagePart;
+    }
+    std::filesystem::remove(osInput);
+    std::filesystem::remove(osOutput);
+}
+
+}  // namespace

@@ -1,0 +1,111 @@
+// `lumo gcps convert --geosys TEXT --height-ref E|M IN.csv [-o OUT.csv]`:
+// control points from any projection and height reference to WGS 84
+// longitude, latitude and ellipsoidal height.
+#include <cstdio>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+
+#include "cli_error.h"
+#include "commands.h"
+#include "lumo_gcp.h"
+#include "nova/projection.h"
+#include "points_io.h"
+
+namespace lumo::cli {
+namespace {
+
+struct GcpsConvertOptions {
+    std::string osGeosys;
+    std::string osHeightRef;
+    std::string osInput;
+    std::string osOutput;
+};
+
+ProjInfo_t ProjectionOf(const std::string& osGeosys) {
+    ProjInfo_t sProj{};
+    if (Geosys2ProjInfo(&sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
+        LUMO_CLI_FAIL("--geosys: " + Quoted(osGeosys) + " is not a known georeferencing text");
+    }
+    return sProj;
+}
+
+std::vector<ControlPoint_t> ToControlPoints(const PointSet& points) {
+    std::vector<ControlPoint_t> asGcps;
+    asGcps.reserve(points.asPoints.size());
+    for (const PointRecord& p : points.asPoints) {
+        asGcps.push_back({p.dfPixel, p.dfLine, p.dfX, p.dfY, p.dfZ});
+    }
+    return asGcps;
+}
+
+// The library numbers a point that cannot be converted from 1 in file order;
+// the message gains the file, line and id of that point.
+[[noreturn]] void FailConversion(const PointSet& points, const nova::DataException& e) {
+    std::string osWhere = points.osSource;
+    std::size_t nNumber = 0;
+    if (std::sscanf(e.GetMessage().c_str(), "Could not transform GCP %zu", &nNumber) == 1 &&
+        nNumber >= 1 && nNumber <= points.asPoints.size()) {
+        const PointRecord& p = points.asPoints[nNumber - 1];
+        osWhere += ":" + std::to_string(p.nSourceLine);
+        if (!p.osId.empty()) osWhere += " (id " + Quoted(p.osId) + ")";
+    }
+    LUMO_CLI_FAIL(osWhere + ": " + e.GetMessage());
+}
+
+void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) {
+    const ProjInfo_t sProj = ProjectionOf(options.osGeosys);
+    PointSet points = ReadPointsFile(options.osInput, PointKind::ControlPoint);
+    std::vector<ControlPoint_t> asGcps = ToControlPoints(points);
+    try {
+        ConvertGcpsToWgs84Ell(sProj, options.osHeightRef, asGcps);
+    } catch (const nova::ParameterException& e) {
+        LUMO_CLI_FAIL("--geosys " + Quoted(options.osGeosys) + ": " + e.GetMessage());
+    } catch (const nova::DataException& e) {
+        FailConversion(points, e);
+    }
+    for (std::size_t i = 0; i < asGcps.size(); ++i) {
+        points.asPoints[i].dfX = asGcps[i].dfGroundX;
+        points.asPoints[i].dfY = asGcps[i].dfGroundY;
+        points.asPoints[i].dfZ = asGcps[i].dfGroundZ;
+    }
+
+    std::vector<PointColumn> columns;
+    if (points.bHasId) columns.push_back(PointColumn::Id);
+    columns.insert(columns.end(), {PointColumn::Pixel, PointColumn::Line, PointColumn::X,
+                                   PointColumn::Y, PointColumn::Z});
+    if (options.osOutput.empty()) {
+        WritePoints(context.out, points, columns);
+        return;
+    }
+    std::ostringstream text;
+    WritePoints(text, points, columns);
+    WriteFileReplacing(options.osOutput, text.str());
+}
+
+}  // namespace
+
+void AddGcpsCommand(CLI::App& app, CommandContext& context) {
+    CLI::App* gcps = app.add_subcommand("gcps", "Work on control point files");
+    gcps->require_subcommand(1);
+    auto options = std::make_shared<GcpsConvertOptions>();
+    CLI::App* convert = gcps->add_subcommand(
+        "convert", "Convert control points to WGS 84 longitude, latitude and ellipsoidal height");
+    convert->add_option("--geosys", options->osGeosys, "georeferencing text of the ground x, y")
+        ->required();
+    convert
+        ->add_option("--height-ref", options->osHeightRef,
+                     "heights above mean sea level (M, EGM96 geoid) or the ellipsoid (E)")
+        ->required()
+        ->check(CLI::IsMember({"E", "M"}));
+    convert->add_option("points", options->osInput, "control points (CSV with pixel,line,x,y[,z])")
+        ->required();
+    convert->add_option("-o,--output", options->osOutput,
+                        "output CSV file (standard output when not given)");
+    convert->callback([options, &context] { RunGcpsConvert(*options, context); });
+}
+
+}  // namespace lumo::cli
