@@ -1,0 +1,135 @@
+// The rigorous model in the tool: simulate, fit, residuals, exact transform,
+// the model file round trip, the demo row and the errors of each step.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "cli.h"
+#include "demo.h"
+#include "model_io.h"
+#include "points_io.h"
+#include "runtime.h"
+#include "srit_io.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+struct RunResult {
+    int nCode;
+    std::string osOut;
+    std::string osErr;
+};
+
+RunResult RunTool(std::vector<std::string> args) {
+    args.insert(args.begin(), "lumo");
+    std::vector<char*> argv;
+    for (auto& a : args) argv.push_back(a.data());
+    std::ostringstream out, err;
+    const int code = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
+    return {code, out.str(), err.str()};
+}
+
+class SritCliTest : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
+        mDir = fs::temp_directory_path() /
+               ("lumo_srit_cli_" + std::string(info->name()) + "_" + std::to_string(::getpid()));
+        fs::create_directories(mDir);
+    }
+    void TearDown() override { fs::remove_all(mDir); }
+    std::string Path(const std::string& name) const { return (mDir / name).string(); }
+    fs::path mDir;
+};
+
+// The "# rms dpixel A, dline B, ..." summary line of the residuals command.
+void ReadRms(const std::string& text, double* pdfPixel, double* pdfLine) {
+    const std::size_t at = text.find("# rms dpixel ");
+    ASSERT_NE(at, std::string::npos) << text;
+    ASSERT_EQ(std::sscanf(text.c_str() + at, "# rms dpixel %lf, dline %lf", pdfPixel, pdfLine), 2);
+}
+
+TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
+    const std::string seg = Path("seg.json"), gcps = Path("gcps.csv"), checks = Path("chk.csv");
+    const std::string model = Path("model.json");
+    RunResult r = RunTool({"simulate", "--segment", seg, "--gcps", gcps, "--checks", checks,
+                           "--roll", "20", "--seed", "3", "--check-count", "50"});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osOut.find("10 control points"), std::string::npos) << r.osOut;
+    r = RunTool({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_NE(r.osOut.find("sensor SPOT5_PAN_5 (code 55, class 1)"), std::string::npos) << r.osOut;
+    r = RunTool({"residuals", model, "--gcps", checks});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    double dfPixel = 0, dfLine = 0;
+    ReadRms(r.osOut, &dfPixel, &dfLine);
+    EXPECT_LT(dfPixel, 0.5);
+    EXPECT_LT(dfLine, 0.5);
+    // The exact inverse maps the check points to within the model's error
+    // of the truth, and its output reads back as image points.
+    r = RunTool({"transform", model, "--to-image", checks, "--exact", "-o", Path("exact.csv")});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    const lumo::cli::PointSet truth =
+        lumo::cli::ReadPointsFile(checks, lumo::cli::PointKind::ControlPoint);
+    const lumo::cli::PointSet exact =
+        lumo::cli::ReadPointsFile(Path("exact.csv"), lumo::cli::PointKind::ControlPoint);
+    ASSERT_EQ(exact.asPoints.size(), truth.asPoints.size());
+    for (std::size_t i = 0; i < truth.asPoints.size(); ++i) {
+        EXPECT_NEAR(exact.asPoints[i].dfPixel, truth.asPoints[i].dfPixel, 1.5);
+        EXPECT_NEAR(exact.asPoints[i].dfLine, truth.asPoints[i].dfLine, 1.5);
+    }
+    // The model file reads back to the same coefficients.
+    const lumo::cli::LoadedModel loaded = lumo::cli::ReadModelFile(model);
+    ASSERT_EQ(loaded.nModelCode, LUMO_CODE_SRIT);
+    const auto* psModel = static_cast<const SRITInfo_t*>(loaded.poRecord.get());
+    const nlohmann::json again = lumo::cli::SritToJson(*psModel);
+    std::ifstream in(model);
+    const nlohmann::json written = nlohmann::json::parse(in);
+    EXPECT_EQ(again["srit"]["coefficients"], written["srit"]["coefficients"]);
+    EXPECT_EQ(psModel->psEphemeris->nNumLines, 12000);
+
+    // Errors: each names what is wrong.
+    r = RunTool({"fit", "--model", "srit", "--gcps", gcps, "-o", Path("x.json")});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("--segment"), std::string::npos) << r.osErr;
+    r = RunTool({"transform", model, "--to-ground", gcps, "--exact"});
+    EXPECT_NE(r.nCode, 0);
+    r = RunTool({"transform", std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31.json",
+                 "--to-image", checks, "--exact"});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("srit"), std::string::npos) << r.osErr;
+    r = RunTool({"simulate", "--segment", seg, "--gcps", gcps, "--lat", "89"});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("dfNadirLatitudeDeg"), std::string::npos) << r.osErr;
+    // A model whose coefficient 0 (2N) is zero would divide by it.
+    nlohmann::json broken = written;
+    broken["srit"]["coefficients"][0] = 0.0;
+    std::ofstream(Path("broken.json")) << broken.dump();
+    EXPECT_THROW(lumo::cli::ReadModelFile(Path("broken.json")), nova::Exception);
+    r = RunTool({"residuals", Path("broken.json"), "--gcps", checks});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("srit.coefficients"), std::string::npos) << r.osErr;
+}
+
+TEST(SritDemo, SampleModelMeetsItsCheckPoints) {
+    for (const lumo::cli::FamilyDemo& demo : lumo::cli::FamilyDemos()) {
+        if (std::string(demo.pszFamily) != "srit") continue;
+        const lumo::cli::DemoResult r =
+            lumo::cli::RunFamilyDemo(demo, std::string(LUMO_SOURCE_DIR) + "/examples");
+        EXPECT_EQ(r.nGcps, 30u);
+        EXPECT_LT(r.sImageResidual.Rms(), 0.5);
+        // The two transforms are approximate inverses of each other.
+        EXPECT_LT(r.sImageRoundTrip.dfMax, 1.0);
+        return;
+    }
+    FAIL() << "no srit row in the demo";
+}
+
+}  // namespace
