@@ -1,6 +1,15 @@
 // All exported declarations of the lumo library.
 #pragma once
 
-#include "lumo_types.h"
+#include "lumo_ap.h"
 #include "lumo_dispatch.h"
+#include "lumo_ephemeris.h"
+#include "lumo_gcp.h"
+#include "lumo_mathmodel.h"
 #include "lumo_poly.h"
+#include "lumo_rf.h"
+#include "lumo_sensor.h"
+#include "lumo_srit.h"
+#include "lumo_tps.h"
+#include "lumo_trn.h"
+#include "lumo_types.h"

@@ -2,9 +2,9 @@
 #include <gtest/gtest.h>
 
 // The tests are not linked with Eigen's target; its headers sit under eigen3/.
+#include <Eigen/Dense>
 #include <cmath>
 #include <cstring>
-#include <Eigen/Dense>
 #include <functional>
 #include <random>
 #include <string>

@@ -161,7 +161,7 @@ TEST(RFBinary, LayoutMarkerSelectsCurrentOrOlderLayout) {
     block[28] = 'X';
     RecordPtr psOlder = Read(block);  // now read in the older layout
     ASSERT_NE(psOlder, nullptr);
-    EXPECT_EQ(psOlder->nTerms, 20);  // the number that starts the 22 characters at 512
+    EXPECT_EQ(psOlder->nTerms, 20);              // the number that starts the 22 characters at 512
     EXPECT_EQ(psOlder->adfPixelAdjust[4], 0.0);  // no second-order terms in that layout
 }
 

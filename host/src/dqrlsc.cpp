@@ -34,7 +34,9 @@ constexpr int kBlock = 64;      // pivots chosen per sketch
 constexpr int kOversample = 8;  // extra sketch rows for a reliable choice
 constexpr std::uint64_t kSketchSeed = 0x5eed5eedULL;
 
-double* Column(double* a, int lda, int j) { return a + static_cast<std::ptrdiff_t>(j) * lda; }
+double* Column(double* a, int lda, int j) {
+    return a + static_cast<std::ptrdiff_t>(j) * lda;
+}
 
 // Workspace of one LAPACK call, grown to the size the routine asks for.
 double* GrowWork(std::vector<double>& work, double query) {
@@ -173,8 +175,7 @@ struct Factoriser {
         cblas_dtrsm(CblasColMajor, CblasLeft, CblasUpper, CblasNoTrans, CblasNonUnit, b, rest, 1.0,
                     r11, lda, scratch.data(), b);
         cblas_dgemm(CblasColMajor, CblasNoTrans, CblasNoTrans, kSketch, rest, b, -1.0,
-                    SketchColumn(k), kSketch, scratch.data(), b, 1.0, SketchColumn(k + b),
-                    kSketch);
+                    SketchColumn(k), kSketch, scratch.data(), b, 1.0, SketchColumn(k + b), kSketch);
         return true;
     }
 

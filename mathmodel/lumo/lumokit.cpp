@@ -333,8 +333,8 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
 
     // Geographic and projected descriptions have a CRS; unit-only ones
     // ("METRE", "PIXEL") do not.
-    ogc::CRSPtr poHorizontal(
-        poFactory != nullptr ? poFactory->CreateCRS(bRigorous ? sP : sQ) : nullptr);
+    ogc::CRSPtr poHorizontal(poFactory != nullptr ? poFactory->CreateCRS(bRigorous ? sP : sQ)
+                                                  : nullptr);
     if (!poHorizontal && bRigorous) {
         ThrowParameter("pData", "Could not read the coordinate system for the math model",
                        kFnInitModel, 373);

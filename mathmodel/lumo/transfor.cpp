@@ -56,8 +56,8 @@ void CalculateRigorous(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* 
 void DebugNotImplemented(const char* pszKind, int nLine) {
     if (nova::diag::Debugger::GetDebugLevel() == 0) return;
     nova::diag::Debugger::Debug(
-        nova::FormatString("<TRNRMSError() not yet implemented for %s>\n", pszKind), 1,
-        "lumokit", "mathmodel/lumo/transfor", nLine);
+        nova::FormatString("<TRNRMSError() not yet implemented for %s>\n", pszKind), 1, "lumokit",
+        "mathmodel/lumo/transfor", nLine);
 }
 
 GEOInfo_t* AsRegression(const TRNInfo_t* psTrn) {
@@ -203,8 +203,7 @@ void TRNRMSError(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* x2, do
 
 void TRNRMSError3D(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* z1, double* x2,
                    double* y2, double* pdfRmsX, double* pdfRmsY) {
-    if (psTrn != nullptr && psTrn->nType == TRN_SRIT && pdfRmsX != nullptr &&
-        pdfRmsY != nullptr) {
+    if (psTrn != nullptr && psTrn->nType == TRN_SRIT && pdfRmsX != nullptr && pdfRmsY != nullptr) {
         *pdfRmsX = 0.0;
         *pdfRmsY = 0.0;
         if (psTrn->bCalculated) {

@@ -17,10 +17,11 @@ namespace {
 #endif
 
 // Every subcommand; a new family adds its Add...Command here.
-constexpr std::array<AddCommandFn, 3> kCommands = {
-    &AddDemoCommand,
-    &AddTransformCommand,
-    &AddPolyCommand,
+// (A plain array, so that adding a line needs no count.)
+constexpr AddCommandFn kCommands[] = {
+    &AddDemoCommand, &AddTransformCommand, &AddPolyCommand,
+    &AddRpcCommand,  &AddFitCommand,       &AddResidualsCommand,
+    &AddGcpsCommand, &AddSegmentCommand,   &AddSimulateCommand,
 };
 
 std::string VersionText() {

@@ -26,6 +26,23 @@ using AddCommandFn = void (*)(CLI::App& app, CommandContext& context);
 void AddDemoCommand(CLI::App& app, CommandContext& context);
 void AddTransformCommand(CLI::App& app, CommandContext& context);
 void AddPolyCommand(CLI::App& app, CommandContext& context);
+void AddRpcCommand(CLI::App& app, CommandContext& context);
+void AddFitCommand(CLI::App& app, CommandContext& context);
+void AddResidualsCommand(CLI::App& app, CommandContext& context);
+void AddGcpsCommand(CLI::App& app, CommandContext& context);
+void AddSegmentCommand(CLI::App& app, CommandContext& context);
+void AddSimulateCommand(CLI::App& app, CommandContext& context);
+
+// `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
+// from the control points (with heights) of `gcpsPath`, ground coordinates in
+// `geosys` (empty: the segment's), written to `outputPath`.
+void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
+                const std::string& geosys, const std::string& outputPath, CommandContext& context);
+
+// `lumo transform --exact --to-image`: ground points to the image of a
+// rigorous model with the exact inverse of its image-to-ground equations.
+void TransformSritExactFile(const LoadedModel& model, const std::string& pointsPath,
+                            const std::string& outputPath, CommandContext& context);
 
 // Arguments of the point-transform commands (transform and the per-family
 // commands): MODEL --to-image|--to-ground POINTS [-o OUT].

@@ -96,6 +96,10 @@ std::string Pair(const ErrorStats& stats) {
 const std::vector<FamilyDemo>& FamilyDemos() {
     static const std::vector<FamilyDemo> demos = {
         {"poly", "poly_utm31.json", "poly_utm31_gcps.csv"},
+        {"rf", "rf_scene.json", "rf_scene_gcps.csv"},
+        {"tps", "tps_utm31.json", "poly_utm31_gcps.csv"},
+        {"ap", "ap_frame_utm31.json", "ap_frame_utm31_gcps.csv"},
+        {"srit", "srit_spot5_roll20.json", "srit_spot5_roll20_checks.csv"},
     };
     return demos;
 }

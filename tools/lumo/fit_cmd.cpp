@@ -36,8 +36,8 @@ struct FitOptions {
     std::string osGeosys;
     std::string osOutput;
     std::string osSegment;  // srit only
-    int nOrder = 0;    // 0: not given
-    int nPixels = -1;  // -1: from the control points
+    int nOrder = 0;         // 0: not given
+    int nPixels = -1;       // -1: from the control points
     int nLines = -1;
 };
 
@@ -241,10 +241,9 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
         ->required();
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
         ->check(CLI::Range(1, GCP_MAX_ORDER));
-    command
-        ->add_option("--geosys", options->osGeosys,
-                     "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
-                     "(srit: default the segment's)");
+    command->add_option("--geosys", options->osGeosys,
+                        "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
+                        "(srit: default the segment's)");
     command
         ->add_option("--pixels", options->nPixels,
                      "image width (default: just above the largest control point pixel)")

@@ -7,8 +7,12 @@
 #include <limits>
 #include <sstream>
 
+#include "ap_io.h"
 #include "cli_error.h"
 #include "nova/projection.h"
+#include "rf_io.h"
+#include "srit_io.h"
+#include "tps_io.h"
 
 namespace lumo::cli {
 namespace {
@@ -119,6 +123,10 @@ POLYInfo_t* LoadedModel::AsPoly() const {
 const std::vector<ModelFamilyCodec>& ModelFamilies() {
     static const std::vector<ModelFamilyCodec> families = {
         {"poly", LUMO_CODE_POLY, "polynomial model", &ReadPolyRecord},
+        {"rf", LUMO_CODE_RF, "rational function model", &ReadRFRecord},
+        {"tps", LUMO_CODE_TPS, "thin plate spline model", &ReadTpsRecord},
+        {"ap", LUMO_CODE_AP, "aerial photo model", &ReadApRecord},
+        {"srit", LUMO_CODE_SRIT, "satellite rigorous model", &ReadSritRecord},
     };
     return families;
 }

@@ -44,8 +44,19 @@ void AddTransformCommand(CLI::App& app, CommandContext& context) {
     CLI::App* command =
         app.add_subcommand("transform", "Map points through a model file of any known family");
     AddTransformArguments(*command, *options);
-    command->callback([options, &context] {
+    auto exact = std::make_shared<bool>(false);
+    command->add_flag("--exact", *exact,
+                      "rigorous models, --to-image: invert the image-to-ground equations exactly");
+    command->callback([options, exact, &context] {
         RequireDirection(*options);
+        if (*exact) {
+            if (options->osToImage.empty()) {
+                throw CLI::ValidationError("--exact applies to --to-image only");
+            }
+            TransformSritExactFile(ReadModelFile(options->osModel), options->osToImage,
+                                   options->osOutput, context);
+            return;
+        }
         RunTransformOptions(*options, ReadModelFile(options->osModel), context);
     });
 }
