@@ -2,9 +2,8 @@
 // and release, the exported entry points with their implementation twins, and
 // the SPOT level 1A/1B image-coordinate conversions.
 //
-// Status: the multi-image adjustment (SRITCalculateN) is not available yet:
-// it reports numbered warning 100 and returns 0. A computation that fails
-// does not adopt the segment passed to it: the caller still owns it.
+// A computation that fails does not adopt the segment passed to it: the
+// caller still owns it.
 // Transforms given a null model or a record without a segment answer
 // LUMO_NULL_VALUE.
 #pragma once
@@ -96,7 +95,14 @@ LUMO_API int SRITCalculate_imp(SRITInfo_t* psModel, bool bImageFirst, EphemerisS
 // the standard deviations (LUMO_NULL_VALUE = not given). Tie observations:
 // image, point, pixel, line, elevation in/out, standard deviations, and the
 // estimated ground X and Y out. The report lists the control points seen in
-// more than one image. Returns 1 when the models were computed, else 0.
+// more than one image; its arrays need room for one entry per distinct
+// control point (at most nGCP) and may be null when not wanted, as may the
+// tie X and Y outputs and every standard-deviation array. Every image needs
+// its own record and segment. An observation naming an unknown image, a
+// single tie observation, and more than SRIT_MAX_IMAGES images are fatal
+// errors. Returns 1 when the models were computed, else 0 (fewer than 3
+// control-point observations, or an image with fewer than 4 of them, 5 for
+// radar).
 LUMO_API int SRITCalculateN(
     int nImages, const char* pszImageIds, SRITInfo_t** papsModels, bool bImageFirst,
     EphemerisSeg_t** papsEphemeris, const ProjInfo_t* psProjInfo, int nGCP,

@@ -252,13 +252,14 @@ TEST(SRITRecord, FailedComputationsTouchNothing) {
     };
     EXPECT_EQ(fnCalculateN(2), 0);
     EXPECT_TRUE(oWarnings.Reports().empty());
-    // The multi-image adjustment is not available yet: a warning, failure.
-    EXPECT_EQ(fnCalculateN(3), 0);
-    ASSERT_EQ(oWarnings.Reports().size(), 1u);
-    EXPECT_EQ(oWarnings.Reports()[0].nCode, 100);
-    EXPECT_FALSE(oWarnings.Reports()[0].bFatal);
-    EXPECT_NE(oWarnings.Reports()[0].osText.find("SRITCalculateN: "), std::string::npos);
-    EXPECT_NE(oWarnings.Reports()[0].osText.find("not available yet"), std::string::npos);
+    // Missing identifier arrays are a fatal error naming the argument.
+    try {
+        fnCalculateN(3);
+        ADD_FAILURE() << "no error for null identifiers";
+    } catch (const nova::NumberedError& e) {
+        EXPECT_EQ(e.GetCode(), 100);
+        EXPECT_NE(std::string(e.what()).find("pszImageIds"), std::string::npos);
+    }
 
     EXPECT_EQ(RecordBytes(psModel), abyBefore);
     ExpectFilledRecord(*psModel);

@@ -1,7 +1,8 @@
 // Rigorous model implementation: the SPOT level 1A/1B conversions, the
 // one-image adjustment (sensor table, starting values, observation equations,
 // packed normal equations), the ground and image transforms and the
-// residuals. The multi-image adjustment is not available yet.
+// residuals, and the block adjustment of several images with tie points,
+// which runs the same driver with more images, points and image pairs.
 #include <algorithm>
 #include <cctype>
 #include <cmath>
@@ -9,8 +10,11 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
+#include <new>
 #include <stdexcept>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 #include "lumo_ephemeris.h"
@@ -24,12 +28,6 @@ namespace {
 constexpr int kComputationFailed = 100;
 constexpr int kFormCubic = 20;  // cubic polynomials in pixel and line
 constexpr int kFormRatio = 39;  // normalised polynomials with a ratio in pixel
-
-// Warning for the parts of the model that the library does not provide yet.
-void ReportNotAvailable(const char* pszFunction) {
-    IMPError(kComputationFailed, 0,
-             MkName(_("%s: the rigorous model computation is not available yet.\n"), pszFunction));
-}
 
 // ---------------------------------------------------------------------------
 // Level 1A/1B conversion
@@ -437,6 +435,7 @@ struct ImageState {
     bool bFormosatPan = false;
     bool bConstrained = false;
     int nObservations = 0;
+    int nBlockStart = 0;  // first position of the image's block in the unknown vector
     double P[kMaxUnknowns] = {};
     double adfStart[kMaxUnknowns] = {};              // starting values (P3 ... P7 used)
     double c0 = 0.0, c2 = 0.0, c4 = 0.0, c10 = 0.0;  // 2N, IFOV, centre column and line
@@ -492,15 +491,27 @@ class NormalEquations {
 
     // Adds the row set in Row() with misclosure l (computed - observed) and
     // weight w (1 / standard deviation): element (r, c) gains g_r g_c.
+    // Only the non-zero elements are visited: a row of a block adjustment
+    // touches one or two image blocks of a long unknown vector.
     void AddRow(double dfMisclosure, double dfWeight) {
         const int n = m_nSize - 1;
-        for (int r = 0; r < n; ++r) m_adfRow[r] *= dfWeight;
+        m_anNonZero.clear();
+        for (int r = 0; r < n; ++r) {
+            if (m_adfRow[r] == 0.0) continue;
+            m_adfRow[r] *= dfWeight;
+            m_anNonZero.push_back(r);
+        }
         m_adfRow[n] = dfMisclosure * dfWeight;
-        for (int r = 0; r <= n; ++r) {
+        m_anNonZero.push_back(n);
+        for (std::size_t a = 0; a < m_anNonZero.size(); ++a) {
+            const int r = m_anNonZero[a];
             const double g = m_adfRow[r];
             if (g == 0.0) continue;
             double* pdf = &m_adf[Offset(r)];
-            for (int c = r; c <= n; ++c) pdf[c - r] += g * m_adfRow[c];
+            for (std::size_t b = a; b < m_anNonZero.size(); ++b) {
+                const int c = m_anNonZero[b];
+                pdf[c - r] += g * m_adfRow[c];
+            }
         }
     }
 
@@ -544,12 +555,19 @@ class NormalEquations {
     std::vector<double> m_adf;
     std::vector<double> m_adfRow;
     std::vector<double> m_adfScale;
+    std::vector<int> m_anNonZero;
 };
 
 // The terms of the image-to-ground equations of one measurement.
 struct GroundTerms {
     double t = 0.0, u = 0.0, H = 0.0, g = 0.0, K = 0.0;
     double dfX = 0.0, dfY = 0.0;
+};
+
+// Two images whose viewing angles differ enough to intersect their rays.
+struct ImagePair {
+    std::size_t i = 0, j = 0;  // i < j
+    double dfDiff = 0.0;       // |tan(view angle i) - tan(view angle j)|
 };
 
 // Parameter constraint weights (one set for the adjustment).
@@ -564,6 +582,8 @@ struct Adjustment {
     std::vector<PointRecord> asPoints;
     ConstraintWeights sWeights;
     double dfMinControlWeight = 0.0;  // smallest control row weight of an iteration
+    double dfLastRowWeight = 0.0;     // weight of the observation row added last
+    std::vector<ImagePair> asPairs;   // empty for one image
 };
 
 // Image-to-ground of the adjustment at centred coordinates and elevation.
@@ -643,9 +663,7 @@ void ObservationCoefficients(const ImageState& sImg, const GroundTerms& s, bool 
 
 // Start of image k's block in the unknown vector.
 int BlockStart(const Adjustment& sAdj, std::size_t k) {
-    int nStart = 0;
-    for (std::size_t i = 0; i < k; ++i) nStart += sAdj.asImages[i].sSetup.nUnknowns;
-    return nStart;
+    return sAdj.asImages[k].nBlockStart;
 }
 
 // Writes image k's coefficients (by parameter) into its block of the row;
@@ -659,31 +677,307 @@ void WriteBlock(const Adjustment& sAdj, std::size_t k, const double* pdfCoef, do
     }
 }
 
-// Control-point rows of every used observation of full control points.
-void AddControlPointRows(Adjustment& sAdj, NormalEquations& sNormal) {
-    double adfCoef[kMaxUnknowns];
-    for (const PointRecord& sPoint : sAdj.asPoints) {
-        if (sPoint.nInUse != 1 || sPoint.cType != 'X') continue;
-        for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
-            const PointSlot& sSlot = sPoint.asSlots[k];
-            if (sSlot.nFlag != 1) continue;
-            const ImageState& sImg = sAdj.asImages[k];
-            const double dfSigma = sImg.sSetup.dfAccuracy;
-            const double dfTan = 2.5 * std::tan(sImg.psSeg->dfViewAngle - sSlot.dfXc * sImg.c2);
-            const double w = 1.0 / std::sqrt(dfSigma * dfSigma + 6.25 + dfTan * dfTan);
-            if (sAdj.dfMinControlWeight == 0.0 || w < sAdj.dfMinControlWeight) {
-                sAdj.dfMinControlWeight = w;
-            }
-            const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, sPoint.dfZ);
-            sNormal.ClearRow();
-            ObservationCoefficients(sImg, s, true, adfCoef);
-            WriteBlock(sAdj, k, adfCoef, sNormal.Row());
-            sNormal.AddRow(s.dfX - sPoint.dfX, w);
-            sNormal.ClearRow();
-            ObservationCoefficients(sImg, s, false, adfCoef);
-            WriteBlock(sAdj, k, adfCoef, sNormal.Row());
-            sNormal.AddRow(s.dfY - sPoint.dfY, w);
+// Moving a ground point's elevation by dZ moves the ground position derived
+// from its measurement at centred pixel xc by (ax, ay) * dZ.
+struct Displacement {
+    double ax = 0.0, ay = 0.0;
+};
+
+Displacement DisplacementOf(const ImageState& sImg, double xc) {
+    const double* P = sImg.P;
+    const double c2 = sImg.c2;
+    const double u = -(c2 * xc * P[3]) / (c2 * P[4] * xc + 1.0);
+    double D = u * sImg.c9 + sImg.c15;
+    if (!sImg.bLinearGroup) {
+        const double g = (P[4] * c2 * xc + 1.0) /
+                         (std::sqrt((c2 * xc) * (c2 * xc) + 1.0) * std::sqrt(P[4] * P[4] + 1.0));
+        D -= g * P[12];
+    }
+    const double ct = std::cos(P[2]), st = std::sin(P[2]);
+    return {P[7] * st - D * ct, D * st + P[7] * ct};
+}
+
+// Number of images in which the point takes part in the adjustment.
+int UsedSlots(const PointRecord& sPoint) {
+    int n = 0;
+    for (const PointSlot& sSlot : sPoint.asSlots) n += sSlot.nFlag == 1 ? 1 : 0;
+    return n;
+}
+
+// Planimetric standard deviation: mean of X and Y, 2.5 when either is not given.
+double PlanimetricSd(const PointRecord& sPoint) {
+    if (sPoint.dfSdX == kNull || sPoint.dfSdY == kNull) return 2.5;
+    return 0.5 * (sPoint.dfSdX + sPoint.dfSdY);
+}
+
+// Ground position of a point's measurements met from several images.
+struct Intersection {
+    double dfX = 0.0, dfY = 0.0, dfZ = 0.0;
+    double dfMeanAbsX = 0.0, dfMeanAbsY = 0.0;  // mean |estimate - image-derived position|
+};
+
+// Intersects the rays of the point's used measurements near elevation Z0:
+// every image gives its ground position at Z0 and the direction in which it
+// moves with the elevation; the least-squares meeting point gives X, Y and the
+// elevation change. When the directions are parallel (no intersection), the
+// mean ground position at Z0 is taken.
+Intersection Intersect(const Adjustment& sAdj, const PointRecord& sPoint, double dfZ0) {
+    NormalEquations sNormal(3);
+    std::vector<double> adfX, adfY;
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const PointSlot& sSlot = sPoint.asSlots[k];
+        if (sSlot.nFlag != 1) continue;
+        const ImageState& sImg = sAdj.asImages[k];
+        const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, dfZ0);
+        const Displacement a = DisplacementOf(sImg, sSlot.dfXc);
+        adfX.push_back(s.dfX);
+        adfY.push_back(s.dfY);
+        double* pdfRow = sNormal.Row();
+        pdfRow[0] = 1.0;
+        pdfRow[1] = 0.0;
+        pdfRow[2] = -a.ax;
+        sNormal.AddRow(-s.dfX, 1.0);
+        pdfRow[0] = 0.0;
+        pdfRow[1] = 1.0;
+        pdfRow[2] = -a.ay;
+        sNormal.AddRow(-s.dfY, 1.0);
+    }
+    Intersection sOut;
+    if (adfX.empty()) return sOut;
+    double adfSolution[3] = {0.0, 0.0, 0.0};
+    if (adfX.size() >= 2 && sNormal.Solve(adfSolution) && std::isfinite(adfSolution[2])) {
+        sOut.dfX = adfSolution[0];
+        sOut.dfY = adfSolution[1];
+        sOut.dfZ = dfZ0 + adfSolution[2];
+    } else {
+        for (std::size_t i = 0; i < adfX.size(); ++i) {
+            sOut.dfX += adfX[i] / static_cast<double>(adfX.size());
+            sOut.dfY += adfY[i] / static_cast<double>(adfY.size());
         }
+        sOut.dfZ = dfZ0;
+    }
+    for (std::size_t i = 0; i < adfX.size(); ++i) {
+        sOut.dfMeanAbsX += std::abs(sOut.dfX - adfX[i]) / static_cast<double>(adfX.size());
+        sOut.dfMeanAbsY += std::abs(sOut.dfY - adfY[i]) / static_cast<double>(adfY.size());
+    }
+    return sOut;
+}
+
+bool IsTieOrNoElevation(const PointRecord& sPoint) {
+    return sPoint.cType == 'H' || sPoint.cType == 'P';
+}
+
+// Elevations of the points without one: first the mean elevation of the
+// points that have one, then (and after every iteration) the intersection of
+// their measurements in two or more images.
+void EstimateElevations(Adjustment& sAdj, bool bFirst) {
+    if (bFirst) {
+        double dfSum = 0.0;
+        int nCount = 0;
+        for (const PointRecord& sPoint : sAdj.asPoints) {
+            if (sPoint.nInUse != 1 || (sPoint.cType != 'X' && sPoint.cType != 'A')) continue;
+            dfSum += sPoint.dfZ;
+            ++nCount;
+        }
+        const double dfMean = nCount > 0 ? dfSum / nCount : 0.0;
+        for (PointRecord& sPoint : sAdj.asPoints) {
+            if (sPoint.nInUse == 1 && IsTieOrNoElevation(sPoint)) sPoint.dfEstZ = dfMean;
+        }
+    }
+    for (PointRecord& sPoint : sAdj.asPoints) {
+        if (sPoint.nInUse != 1 || !IsTieOrNoElevation(sPoint) || UsedSlots(sPoint) < 2) continue;
+        const Intersection sMeet = Intersect(sAdj, sPoint, sPoint.dfEstZ);
+        sPoint.dfEstX = sMeet.dfX;
+        sPoint.dfEstY = sMeet.dfY;
+        sPoint.dfEstZ = sMeet.dfZ;
+    }
+}
+
+// Ground estimate and residuals (given minus estimated) of every point from
+// its used measurements.
+void EstimatePoints(Adjustment& sAdj) {
+    for (PointRecord& sPoint : sAdj.asPoints) {
+        if (sPoint.nInUse != 1) continue;
+        const int nUsed = UsedSlots(sPoint);
+        if (nUsed == 0) continue;
+        const bool bKnownZ = sPoint.cType == 'X' || sPoint.cType == 'A';
+        const double dfZ0 = bKnownZ ? sPoint.dfZ : sPoint.dfEstZ;
+        if (nUsed == 1) {
+            // One ray: its ground position at the point's (estimated) elevation.
+            std::size_t k = 0;
+            while (sPoint.asSlots[k].nFlag != 1) ++k;
+            const PointSlot& sSlot = sPoint.asSlots[k];
+            const GroundTerms s =
+                AdjustmentImageToGround(sAdj.asImages[k], sSlot.dfXc, sSlot.dfYc, dfZ0);
+            sPoint.dfEstX = s.dfX;
+            sPoint.dfEstY = s.dfY;
+            sPoint.dfEstZ = sPoint.cType == 'X' ? 0.0 : dfZ0;
+            const bool bControl = sPoint.cType == 'X' || sPoint.cType == 'P';
+            sPoint.dfResX = bControl ? sPoint.dfX - s.dfX : 0.0;
+            sPoint.dfResY = bControl ? sPoint.dfY - s.dfY : 0.0;
+            sPoint.dfResZ = 0.0;
+            continue;
+        }
+        const Intersection sMeet = Intersect(sAdj, sPoint, dfZ0);
+        sPoint.dfEstX = sMeet.dfX;
+        sPoint.dfEstY = sMeet.dfY;
+        sPoint.dfEstZ = sMeet.dfZ;
+        const bool bControl = sPoint.cType == 'X' || sPoint.cType == 'P';
+        sPoint.dfResX = bControl ? sPoint.dfX - sMeet.dfX : sMeet.dfMeanAbsX;
+        sPoint.dfResY = bControl ? sPoint.dfY - sMeet.dfY : sMeet.dfMeanAbsY;
+        sPoint.dfResZ = bKnownZ ? sPoint.dfZ - sMeet.dfZ : 0.0;
+    }
+}
+
+// The X and Y rows of one measurement of a full control point.
+void AddControlRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    double adfCoef[kMaxUnknowns];
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const PointSlot& sSlot = sPoint.asSlots[k];
+        if (sSlot.nFlag != 1) continue;
+        const ImageState& sImg = sAdj.asImages[k];
+        const double dfSigma = sImg.sSetup.dfAccuracy;
+        const double dfTan = 2.5 * std::tan(sImg.psSeg->dfViewAngle - sSlot.dfXc * sImg.c2);
+        const double w = 1.0 / std::sqrt(dfSigma * dfSigma + 6.25 + dfTan * dfTan);
+        if (sAdj.dfMinControlWeight == 0.0 || w < sAdj.dfMinControlWeight) {
+            sAdj.dfMinControlWeight = w;
+        }
+        const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, sPoint.dfZ);
+        sNormal.ClearRow();
+        ObservationCoefficients(sImg, s, true, adfCoef);
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(s.dfX - sPoint.dfX, w);
+        sNormal.ClearRow();
+        ObservationCoefficients(sImg, s, false, adfCoef);
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(s.dfY - sPoint.dfY, w);
+        sAdj.dfLastRowWeight = w;
+    }
+}
+
+// One measurement's ground position and its X and Y coefficient rows.
+struct MeasurementRows {
+    GroundTerms s;
+    double adfX[kMaxUnknowns];
+    double adfY[kMaxUnknowns];
+};
+
+MeasurementRows RowsOf(const ImageState& sImg, const PointSlot& sSlot, double dfZ) {
+    MeasurementRows sRows{};
+    sRows.s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, dfZ);
+    ObservationCoefficients(sImg, sRows.s, true, sRows.adfX);
+    ObservationCoefficients(sImg, sRows.s, false, sRows.adfY);
+    return sRows;
+}
+
+// Adds the row whose image-i part is pdfI and image-j part pdfJ.
+void AddPairRow(Adjustment& sAdj, NormalEquations& sNormal, const ImagePair& sPair,
+                const double* pdfI, const double* pdfJ, double dfMisclosure, double dfWeight) {
+    sNormal.ClearRow();
+    WriteBlock(sAdj, sPair.i, pdfI, sNormal.Row());
+    WriteBlock(sAdj, sPair.j, pdfJ, sNormal.Row());
+    sNormal.AddRow(dfMisclosure, dfWeight);
+    sAdj.dfLastRowWeight = dfWeight;
+}
+
+// Rows that make the ground positions of a point with a known elevation agree
+// in both images of a pair.
+void AddPairRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    const double dfSdZ = sPoint.dfSdZ == kNull ? 2.5 : sPoint.dfSdZ;
+    const bool bRows =
+        sPoint.cType == 'A' || (sPoint.cType == 'X' && dfSdZ <= 0.5 * PlanimetricSd(sPoint));
+    if (!bRows) return;
+    for (const ImagePair& sPair : sAdj.asPairs) {
+        const PointSlot& sI = sPoint.asSlots[sPair.i];
+        const PointSlot& sJ = sPoint.asSlots[sPair.j];
+        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
+        const ImageState& sImgI = sAdj.asImages[sPair.i];
+        const ImageState& sImgJ = sAdj.asImages[sPair.j];
+        const MeasurementRows sRi = RowsOf(sImgI, sI, sPoint.dfZ);
+        const MeasurementRows sRj = RowsOf(sImgJ, sJ, sPoint.dfZ);
+        const double dfSigI = sImgI.sSetup.dfAccuracy, dfSigJ = sImgJ.sSetup.dfAccuracy;
+        const double dfTanDiff = std::tan(sImgI.psSeg->dfViewAngle - sI.dfXc * sImgI.c2) -
+                                 std::tan(sImgJ.psSeg->dfViewAngle - sJ.dfXc * sImgJ.c2);
+        const double w =
+            1.0 / std::sqrt(6.25 + (dfSigI * dfSigI + dfSigJ * dfSigJ) / (dfTanDiff * dfTanDiff));
+        if (!(w > 0.0) || !std::isfinite(w)) continue;  // parallel rays bind nothing
+        double adfNegX[kMaxUnknowns], adfNegY[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfNegX[p] = -sRj.adfX[p];
+            adfNegY[p] = -sRj.adfY[p];
+        }
+        AddPairRow(sAdj, sNormal, sPair, sRi.adfX, adfNegX, sRi.s.dfX - sRj.s.dfX, w);
+        AddPairRow(sAdj, sNormal, sPair, sRi.adfY, adfNegY, sRi.s.dfY - sRj.s.dfY, w);
+    }
+}
+
+// Rows across the direction in which the two images' ground positions part
+// with a wrong elevation: they hold whatever the elevation.
+void AddCrossRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    const double dfZ = IsTieOrNoElevation(sPoint) ? sPoint.dfEstZ : sPoint.dfZ;
+    for (const ImagePair& sPair : sAdj.asPairs) {
+        const PointSlot& sI = sPoint.asSlots[sPair.i];
+        const PointSlot& sJ = sPoint.asSlots[sPair.j];
+        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
+        const ImageState& sImgI = sAdj.asImages[sPair.i];
+        const ImageState& sImgJ = sAdj.asImages[sPair.j];
+        const MeasurementRows sRi = RowsOf(sImgI, sI, dfZ);
+        const MeasurementRows sRj = RowsOf(sImgJ, sJ, dfZ);
+        const Displacement ai = DisplacementOf(sImgI, sI.dfXc);
+        const Displacement aj = DisplacementOf(sImgJ, sJ.dfXc);
+        const double dx = ai.ax - aj.ax, dy = ai.ay - aj.ay;
+        const double n = std::max(std::sqrt(dx * dx + dy * dy), 1e-06);
+        double adfI[kMaxUnknowns], adfJ[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfI[p] = (dy * sRi.adfX[p] - dx * sRi.adfY[p]) / n;
+            adfJ[p] = (dx * sRj.adfY[p] - dy * sRj.adfX[p]) / n;
+        }
+        const double dfMisclosure =
+            (dy * (sRi.s.dfX - sRj.s.dfX) - dx * (sRi.s.dfY - sRj.s.dfY)) / n;
+        const double w = sPoint.cType == 'H' || sAdj.dfLastRowWeight == 0.0
+                             ? sAdj.dfMinControlWeight
+                             : sAdj.dfLastRowWeight;
+        AddPairRow(sAdj, sNormal, sPair, adfI, adfJ, dfMisclosure, w);
+    }
+}
+
+// Rows of a control point without elevation: across the direction in which
+// its image position moves with the elevation.
+void AddNoElevationRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const PointSlot& sSlot = sPoint.asSlots[k];
+        if (sSlot.nFlag != 1) continue;
+        const ImageState& sImg = sAdj.asImages[k];
+        const MeasurementRows sR = RowsOf(sImg, sSlot, sPoint.dfEstZ);
+        const Displacement a = DisplacementOf(sImg, sSlot.dfXc);
+        const double n = std::sqrt(a.ax * a.ax + a.ay * a.ay);
+        if (!(n > 0.0)) continue;
+        double adfCoef[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfCoef[p] = (a.ay * sR.adfX[p] - a.ax * sR.adfY[p]) / n;
+        }
+        const double dfMisclosure =
+            (a.ay * (sR.s.dfX - sPoint.dfX) - a.ax * (sR.s.dfY - sPoint.dfY)) / n;
+        const double dfPlan = PlanimetricSd(sPoint);
+        const double dfSigma = sImg.sSetup.dfAccuracy;
+        const double w = 1.0 / std::sqrt(dfPlan * dfPlan + dfSigma * dfSigma);
+        sNormal.ClearRow();
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(dfMisclosure, w);
+        sAdj.dfLastRowWeight = w;
+    }
+}
+
+// Observation rows of every point in use: control rows, then the rows that
+// bind the images of a block together.
+void AddObservationRows(Adjustment& sAdj, NormalEquations& sNormal) {
+    for (const PointRecord& sPoint : sAdj.asPoints) {
+        if (sPoint.nInUse != 1) continue;
+        if (sPoint.cType == 'X') AddControlRows(sAdj, sNormal, sPoint);
+        if (sAdj.asPairs.empty() && sPoint.cType != 'P') continue;
+        AddPairRows(sAdj, sNormal, sPoint);
+        AddCrossRows(sAdj, sNormal, sPoint);
+        if (sPoint.cType == 'P') AddNoElevationRows(sAdj, sNormal, sPoint);
     }
 }
 
@@ -842,15 +1136,36 @@ void UpdateParameters(Adjustment& sAdj, const double* pdfX) {
     }
 }
 
+// Packed normal equations for nUnknowns unknowns; sizes the machine cannot
+// hold are a clear error rather than a crash.
+std::unique_ptr<NormalEquations> MakeNormalEquations(int nUnknowns) {
+    const unsigned long long nSize = static_cast<unsigned long long>(nUnknowns) + 1ULL;
+    const unsigned long long nElements = nSize * (nSize + 1ULL) / 2ULL;
+    try {
+        return std::make_unique<NormalEquations>(nUnknowns);
+    } catch (const std::bad_alloc&) {
+    } catch (const std::length_error&) {
+    }
+    IMPError(kComputationFailed, 1,
+             MkName(_("SRIT adjustment: the normal matrix of %d unknowns (%llu values) cannot be "
+                      "allocated.\n"),
+                    nUnknowns, nElements));
+    throw std::logic_error("fatal host error returned");
+}
+
+// The fixed seven iterations: rows, constraints, solution, update, and the
+// elevations of points without one re-estimated after each.
 void RunIterations(Adjustment& sAdj) {
     int nUnknowns = 0;
     for (const ImageState& sImg : sAdj.asImages) nUnknowns += sImg.sSetup.nUnknowns;
-    NormalEquations sNormal(nUnknowns);
+    const std::unique_ptr<NormalEquations> psNormal = MakeNormalEquations(nUnknowns);
+    NormalEquations& sNormal = *psNormal;
     std::vector<double> adfX(static_cast<std::size_t>(nUnknowns), 0.0);
     for (int nIteration = 0; nIteration < kIterations; ++nIteration) {
         sNormal.Clear();
         sAdj.dfMinControlWeight = 0.0;
-        AddControlPointRows(sAdj, sNormal);
+        sAdj.dfLastRowWeight = 0.0;
+        AddObservationRows(sAdj, sNormal);
         AddConstraintRows(sAdj, sNormal);
         if (!sNormal.Solve(adfX.data())) {
             if (nova::diag::Debugger::GetDebugLevel() != 0) {
@@ -861,6 +1176,7 @@ void RunIterations(Adjustment& sAdj) {
             }
         }
         UpdateParameters(sAdj, adfX.data());
+        EstimateElevations(sAdj, false);
     }
 }
 
@@ -969,10 +1285,9 @@ void SetupImage(ImageState& sImg) {
     sImg.bFormosatPan = ShortNameContains(s, "FORMOSAT_PAN");
 }
 
-// Writes image 0's result into the model record, which adopts the segment.
-void FillRecord(const Adjustment& sAdj, SRITInfo_t* psModel, EphemerisSeg_t* psEphemeris,
+// Writes an image's result into its model record, which adopts the segment.
+void FillRecord(const ImageState& sImg, SRITInfo_t* psModel, EphemerisSeg_t* psEphemeris,
                 const ProjInfo_t& sProj) {
-    const ImageState& sImg = sAdj.asImages[0];
     const double* P = sImg.P;
     double* c = psModel->adfCoef;
     c[0] = sImg.c0;
@@ -1064,6 +1379,58 @@ void SetNull(double* pdfA, double* pdfB) {
     if (pdfB != nullptr) *pdfB = kNull;
 }
 
+// The elevation terms need at least two different elevations among the
+// first nControlPoints points (those of them with an elevation).
+void SpreadElevations(Adjustment& sAdj, std::size_t nControlPoints) {
+    PointRecord* psFirst = nullptr;
+    bool bSpread = false;
+    for (std::size_t p = 0; p < nControlPoints; ++p) {
+        PointRecord& sPoint = sAdj.asPoints[p];
+        if (sPoint.cType != 'X') continue;
+        if (psFirst == nullptr) psFirst = &sPoint;
+        if (sPoint.dfZ != psFirst->dfZ) bSpread = true;
+    }
+    if (psFirst != nullptr && !bSpread) psFirst->dfZ += 1.0;
+}
+
+// Segment values, sensor rows, block positions and centred image coordinates.
+void PrepareImages(Adjustment& sAdj) {
+    int nStart = 0;
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        ImageState& sImg = sAdj.asImages[k];
+        LoadImage(sImg, static_cast<int>(k));
+        SetupImage(sImg);
+        sImg.nBlockStart = nStart;
+        nStart += sImg.sSetup.nUnknowns;
+    }
+    for (PointRecord& sPoint : sAdj.asPoints) {
+        for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+            PointSlot& sSlot = sPoint.asSlots[k];
+            if (sSlot.nFlag != 1 && sSlot.nFlag != 2) continue;
+            sSlot.dfXc = sAdj.asImages[k].c4 - sSlot.dfPixel;
+            sSlot.dfYc = sSlot.dfLine - sAdj.asImages[k].c10;
+        }
+    }
+}
+
+// Starting values, first elevations, the iterations, and a check that every
+// image's parameters stayed numbers.
+void Adjust(Adjustment& sAdj, const char* pszFunction) {
+    ComputeStartingValues(sAdj);
+    for (ImageState& sImage : sAdj.asImages) sImage.UpdateDerived();
+    EstimateElevations(sAdj, true);
+    RunIterations(sAdj);
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            if (std::isfinite(sAdj.asImages[k].P[p])) continue;
+            IMPError(kComputationFailed, 1,
+                     MkName(_("%s: the adjustment of image %d diverged (parameter %d is not a "
+                              "number); check the control points.\n"),
+                            pszFunction, static_cast<int>(k), p));
+        }
+    }
+}
+
 }  // namespace
 
 // ---------------------------------------------------------------------------
@@ -1122,59 +1489,393 @@ int SRITCalculate_imp(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psE
         }
     }
     sImg.nObservations = nGCP;
-
-    // The elevation terms need at least two different elevations.
-    bool bSpread = false;
-    for (const PointRecord& sPoint : sAdj.asPoints) {
-        if (sPoint.dfZ != sAdj.asPoints[0].dfZ) bSpread = true;
-    }
-    if (!bSpread) sAdj.asPoints[0].dfZ += 1.0;
-
-    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
-        LoadImage(sAdj.asImages[k], static_cast<int>(k));
-        SetupImage(sAdj.asImages[k]);
-    }
-    for (PointRecord& sPoint : sAdj.asPoints) {
-        for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
-            PointSlot& sSlot = sPoint.asSlots[k];
-            if (sSlot.nFlag != 1 && sSlot.nFlag != 2) continue;
-            sSlot.dfXc = sAdj.asImages[k].c4 - sSlot.dfPixel;
-            sSlot.dfYc = sSlot.dfLine - sAdj.asImages[k].c10;
-        }
-    }
-    ComputeStartingValues(sAdj);
-    for (ImageState& sImage : sAdj.asImages) sImage.UpdateDerived();
-    RunIterations(sAdj);
-    for (std::size_t p = 0; p < kMaxUnknowns; ++p) {
-        if (!std::isfinite(sAdj.asImages[0].P[p])) {
-            IMPError(kComputationFailed, 1,
-                     MkName(_("SRITCalculate: the adjustment diverged (parameter %d is not a "
-                              "number); check the control points.\n"),
-                            static_cast<int>(p)));
-        }
-    }
-    FillRecord(sAdj, psModel, psEphemeris, *psProjInfo);
+    SpreadElevations(sAdj, sAdj.asPoints.size());
+    PrepareImages(sAdj);
+    Adjust(sAdj, "SRITCalculate");
+    FillRecord(sAdj.asImages[0], psModel, psEphemeris, *psProjInfo);
     return 1;
 }
 
-int SRITCalculateMulti(
-    int /*nImages*/, const char* /*pszImageIds*/, SRITInfo_t** /*papsModels*/, bool /*bImageFirst*/,
-    EphemerisSeg_t** /*papsEphemeris*/, const ProjInfo_t* /*psProjInfo*/, int nGCP,
-    const char* /*pszGcpImageIds*/, const char* /*pszGcpPointIds*/, const char* /*pszGcpUsage*/,
-    const double* /*padfA*/, const double* /*padfB*/, const double* /*padfZ*/,
-    const double* /*padfSdA*/, const double* /*padfSdB*/, const double* /*padfSdZ*/,
-    const double* /*padfC*/, const double* /*padfD*/, const double* /*padfSdC*/,
-    const double* /*padfSdD*/, int /*nTie*/, const char* /*pszTieImageIds*/,
-    const char* /*pszTiePointIds*/, const double* /*padfTiePixel*/, const double* /*padfTieLine*/,
-    double* /*padfTieZ*/, const double* /*padfTieSdPixel*/, const double* /*padfTieSdLine*/,
-    const double* /*padfTieSdZ*/, double* /*padfTieX*/, double* /*padfTieY*/, int* /*pnReported*/,
-    char* /*pszReportedIds*/, int* /*panReportedImages*/, double* /*padfGivenX*/,
-    double* /*padfGivenY*/, double* /*padfGivenZ*/, double* /*padfEstimatedX*/,
-    double* /*padfEstimatedY*/, double* /*padfEstimatedZ*/, double* /*padfResidualX*/,
-    double* /*padfResidualY*/, double* /*padfResidualZ*/) {
+namespace {
+
+constexpr int kTooManyImages = 11;
+// Line tags of the block adjustment's debug messages.
+constexpr int kNotEnoughPointsLine = 1100;
+constexpr int kSensorLine = 1268;
+
+// An identifier of SRIT_ID_SIZE characters as a case-insensitive key.
+std::string IdKey(const char* pszIds, int nIndex) {
+    const char* psz = pszIds + static_cast<std::size_t>(nIndex) * SRIT_ID_SIZE;
+    std::string osKey(psz, SRIT_ID_SIZE);
+    for (char& c : osKey) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    return osKey;
+}
+
+// The identifier as printable text (up to its first terminator, blanks trimmed).
+std::string IdText(const char* pszIds, int nIndex) {
+    const char* psz = pszIds + static_cast<std::size_t>(nIndex) * SRIT_ID_SIZE;
+    std::size_t n = 0;
+    while (n < SRIT_ID_SIZE && psz[n] != '\0') ++n;
+    while (n > 0 && psz[n - 1] == ' ') --n;
+    return std::string(psz, n);
+}
+
+double Optional(const double* padf, int i) {
+    return padf != nullptr ? padf[i] : kNull;
+}
+
+// A coordinate must be a number; the null value means "not given" where the
+// caller allows it.
+void RequireCoordinate(double dfValue, bool bNullAllowed, const char* pszWhat, int nObservation,
+                       const char* pszName) {
+    if (std::isfinite(dfValue) && (bNullAllowed || dfValue != kNull)) return;
+    IMPError(kComputationFailed, 1,
+             MkName(_("SRITCalculateN: %s observation %d has an invalid %s (%.17g).\n"), pszWhat,
+                    nObservation, pszName, dfValue));
+}
+
+// The caller's arrays of one block adjustment.
+struct BlockInput {
+    int nImages;
+    const char* pszImageIds;
+    bool bImageFirst;
+    EphemerisSeg_t** papsEphemeris;
+    int nGCP;
+    const char *pszGcpImageIds, *pszGcpPointIds, *pszGcpUsage;
+    const double *padfA, *padfB, *padfZ, *padfSdA, *padfSdB, *padfSdZ;
+    const double *padfC, *padfD, *padfSdC, *padfSdD;
+    int nTie;
+    const char *pszTieImageIds, *pszTiePointIds;
+    const double *padfTiePixel, *padfTieLine;
+    double* padfTieZ;
+    const double *padfTieSdPixel, *padfTieSdLine, *padfTieSdZ;
+};
+
+// Image number of an observation's image identifier; an unknown identifier is
+// a clear error.
+std::size_t FindImage(const std::unordered_map<std::string, std::size_t>& mapImages,
+                      const char* pszIds, int nIndex, const char* pszWhat) {
+    const auto it = mapImages.find(IdKey(pszIds, nIndex));
+    if (it != mapImages.end()) return it->second;
+    IMPError(kComputationFailed, 1,
+             MkName(_("SRITCalculateN: %s observation %d names image \"%s\", which is not among "
+                      "the images of the block.\n"),
+                    pszWhat, nIndex + 1, IdText(pszIds, nIndex).c_str()));
+    throw std::logic_error("fatal host error returned");
+}
+
+// Point record of an identifier, made on its first appearance.
+PointRecord& FindPoint(Adjustment& sAdj, std::unordered_map<std::string, std::size_t>& mapPoints,
+                       std::vector<int>& anFirstObservation, const std::string& osKey,
+                       int nObservation) {
+    const auto it = mapPoints.find(osKey);
+    if (it != mapPoints.end()) return sAdj.asPoints[it->second];
+    mapPoints.emplace(osKey, sAdj.asPoints.size());
+    anFirstObservation.push_back(nObservation);
+    sAdj.asPoints.emplace_back();
+    PointRecord& sPoint = sAdj.asPoints.back();
+    sPoint.asSlots.resize(sAdj.asImages.size());
+    return sPoint;
+}
+
+// Control-point observations: points 0 ... G-1, with their types.
+void AddControlObservations(Adjustment& sAdj, const BlockInput& in,
+                            const std::unordered_map<std::string, std::size_t>& mapImages,
+                            std::vector<int>& anFirstObservation) {
+    std::unordered_map<std::string, std::size_t> mapPoints;
+    const bool bF = in.bImageFirst;
+    for (int i = 0; i < in.nGCP; ++i) {
+        const int n = i + 1;
+        const std::size_t k = FindImage(mapImages, in.pszGcpImageIds, i, "control-point");
+        PointRecord& sPoint =
+            FindPoint(sAdj, mapPoints, anFirstObservation, IdKey(in.pszGcpPointIds, i), i);
+        ImageState& sImg = sAdj.asImages[k];
+        PointSlot& sSlot = sPoint.asSlots[k];
+        sPoint.nInUse = 1;
+        sSlot.nFlag = in.pszGcpUsage[i] == 'A' ? 1 : 2;
+        ++sImg.nObservations;
+        sSlot.dfPixel = bF ? in.padfA[i] : in.padfC[i];
+        sSlot.dfLine = bF ? in.padfB[i] : in.padfD[i];
+        sPoint.dfX = bF ? in.padfC[i] : in.padfA[i];
+        sPoint.dfY = bF ? in.padfD[i] : in.padfB[i];
+        sPoint.dfZ = in.padfZ[i];
+        RequireCoordinate(sSlot.dfPixel, false, "control-point", n, "pixel");
+        RequireCoordinate(sSlot.dfLine, false, "control-point", n, "line");
+        RequireCoordinate(sPoint.dfX, true, "control-point", n, "X");
+        RequireCoordinate(sPoint.dfY, true, "control-point", n, "Y");
+        RequireCoordinate(sPoint.dfZ, true, "control-point", n, "Z");
+        const double dfSdPixel = Optional(bF ? in.padfSdA : in.padfSdC, i);
+        const double dfSdLine = Optional(bF ? in.padfSdB : in.padfSdD, i);
+        // Image standard deviations are given in pixels and kept in ground units.
+        sSlot.dfSdPixel = dfSdPixel == kNull ? kNull : dfSdPixel * sImg.psSeg->dfPixelRes;
+        sSlot.dfSdLine = dfSdLine == kNull ? kNull : dfSdLine * sImg.psSeg->dfLineRes;
+        sPoint.dfSdX = Optional(bF ? in.padfSdC : in.padfSdA, i);
+        sPoint.dfSdY = Optional(bF ? in.padfSdD : in.padfSdB, i);
+        sPoint.dfSdZ = Optional(in.padfSdZ, i);
+        const bool bPlan = sPoint.dfX != kNull && sPoint.dfY != kNull;
+        if (bPlan && sPoint.dfZ != kNull) {
+            sPoint.cType = 'X';
+        } else if (bPlan) {
+            sPoint.cType = 'P';
+        } else {
+            IMPError(kComputationFailed, 1, MkName(_("GCP number %d has invalid type.\n"), n));
+        }
+        if (sImg.psSeg->nLevelConvForm > 0) {
+            SPOT1BTo1AControlPoint_imp(in.papsEphemeris, static_cast<int>(k), &sSlot.dfPixel,
+                                       &sSlot.dfLine);
+        }
+    }
+}
+
+// Tie observations: points G ... G+T-1. A tie point keeps an elevation once
+// one of its observations has given it.
+void AddTieObservations(Adjustment& sAdj, const BlockInput& in,
+                        const std::unordered_map<std::string, std::size_t>& mapImages,
+                        std::vector<std::size_t>& anTiePoint) {
+    std::unordered_map<std::string, std::size_t> mapPoints;
+    std::vector<int> anFirst;
+    for (int i = 0; i < in.nTie; ++i) {
+        const int n = i + 1;
+        const std::size_t k = FindImage(mapImages, in.pszTieImageIds, i, "tie");
+        const std::string osKey = IdKey(in.pszTiePointIds, i);
+        const bool bNew = mapPoints.find(osKey) == mapPoints.end();
+        PointRecord& sPoint = FindPoint(sAdj, mapPoints, anFirst, osKey, i);
+        anTiePoint.push_back(static_cast<std::size_t>(&sPoint - sAdj.asPoints.data()));
+        PointSlot& sSlot = sPoint.asSlots[k];
+        if (bNew) sPoint.cType = 'H';
+        sPoint.nInUse = 1;
+        sSlot.nFlag = 1;
+        sSlot.dfPixel = in.padfTiePixel[i];
+        sSlot.dfLine = in.padfTieLine[i];
+        RequireCoordinate(sSlot.dfPixel, false, "tie", n, "pixel");
+        RequireCoordinate(sSlot.dfLine, false, "tie", n, "line");
+        RequireCoordinate(in.padfTieZ[i], true, "tie", n, "elevation");
+        sSlot.dfSdPixel = Optional(in.padfTieSdPixel, i);
+        sSlot.dfSdLine = Optional(in.padfTieSdLine, i);
+        if (in.padfTieZ[i] != kNull) {
+            sPoint.dfZ = in.padfTieZ[i];
+            sPoint.cType = 'A';
+            const double dfSdZ = Optional(in.padfTieSdZ, i);
+            if (dfSdZ != kNull) sPoint.dfSdZ = dfSdZ;
+        }
+        if (sAdj.asImages[k].psSeg->nLevelConvForm > 0) {
+            SPOT1BTo1AControlPoint_imp(in.papsEphemeris, static_cast<int>(k), &sSlot.dfPixel,
+                                       &sSlot.dfLine);
+        }
+    }
+}
+
+// Every image needs 4 control-point observations (5 for radar).
+bool EnoughPoints(const Adjustment& sAdj) {
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const ImageState& sImg = sAdj.asImages[k];
+        const int nNeeded = SegmentStartsWith(*sImg.psSeg, "SAR") ? 5 : 4;
+        if (sImg.nObservations >= nNeeded) continue;
+        if (nova::diag::Debugger::GetDebugLevel() != 0) {
+            nova::diag::Debugger::Debug(
+                nova::FormatString("Not enough points in image %d! no model calculated\n",
+                                   static_cast<int>(k)),
+                1, "lumokit", "mathmodel/lumo/sritcalc_imp", kNotEnoughPointsLine);
+        }
+        return false;
+    }
+    return true;
+}
+
+// Pairs of images whose viewing-angle tangents differ by at least half the
+// largest difference in the block.
+void BuildPairs(Adjustment& sAdj) {
+    const std::size_t n = sAdj.asImages.size();
+    if (n < 2) return;
+    double dfMax = 0.0;
+    for (std::size_t i = 0; i < n; ++i) {
+        for (std::size_t j = i + 1; j < n; ++j) {
+            dfMax = std::max(dfMax, std::abs(std::tan(sAdj.asImages[i].psSeg->dfViewAngle) -
+                                             std::tan(sAdj.asImages[j].psSeg->dfViewAngle)));
+        }
+    }
+    for (std::size_t i = 0; i < n; ++i) {
+        for (std::size_t j = i + 1; j < n; ++j) {
+            const double dfDiff = std::abs(std::tan(sAdj.asImages[i].psSeg->dfViewAngle) -
+                                           std::tan(sAdj.asImages[j].psSeg->dfViewAngle));
+            if (dfDiff >= 0.5 * dfMax) sAdj.asPairs.push_back({i, j, dfDiff});
+        }
+    }
+}
+
+void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
+    RequireArgument(in.pszImageIds, "pszImageIds");
+    RequireArgument(papsModels, "papsModels");
+    RequireArgument(in.papsEphemeris, "papsEphemeris");
+    RequireArgument(in.pszGcpImageIds, "pszGcpImageIds");
+    RequireArgument(in.pszGcpPointIds, "pszGcpPointIds");
+    RequireArgument(in.pszGcpUsage, "pszGcpUsage");
+    RequireArgument(in.padfA, "padfA");
+    RequireArgument(in.padfB, "padfB");
+    RequireArgument(in.padfZ, "padfZ");
+    RequireArgument(in.padfC, "padfC");
+    RequireArgument(in.padfD, "padfD");
+    if (in.nTie < 0) IMPErrReal(kComputationFailed, 1, "Number of tie observations", in.nTie, 0);
+    if (in.nTie == 1) {
+        IMPError(kComputationFailed, 1,
+                 _("SRITCalculateN: a single tie observation ties nothing; a tie point needs "
+                   "observations in at least two images.\n"));
+    }
+    if (in.nTie > 0) {
+        RequireArgument(in.pszTieImageIds, "pszTieImageIds");
+        RequireArgument(in.pszTiePointIds, "pszTiePointIds");
+        RequireArgument(in.padfTiePixel, "padfTiePixel");
+        RequireArgument(in.padfTieLine, "padfTieLine");
+        RequireArgument(in.padfTieZ, "padfTieZ");
+    }
+    for (int k = 0; k < in.nImages; ++k) {
+        RequireArgument(papsModels[k], "papsModels[k]");
+        RequireArgument(in.papsEphemeris[k], "papsEphemeris[k]");
+        for (int j = 0; j < k; ++j) {
+            // Each record adopts its segment and releases the one it held:
+            // a shared segment, or a record holding another image's new
+            // segment, would be released while still in use.
+            const bool bCrossed = papsModels[j]->psEphemeris == in.papsEphemeris[k] ||
+                                  papsModels[k]->psEphemeris == in.papsEphemeris[j];
+            if (papsModels[j] == papsModels[k] || in.papsEphemeris[j] == in.papsEphemeris[k] ||
+                bCrossed) {
+                IMPError(kComputationFailed, 1,
+                         MkName(_("SRITCalculateN: images %d and %d share a model record or a "
+                                  "segment; each image needs its own.\n"),
+                                j, k));
+            }
+        }
+    }
+}
+
+// Report of the control points measured in more than one image.
+struct ReportOutputs {
+    int* pnReported;
+    char* pszIds;
+    int* panImages;
+    double *padfGivenX, *padfGivenY, *padfGivenZ;
+    double *padfEstX, *padfEstY, *padfEstZ;
+    double *padfResX, *padfResY, *padfResZ;
+};
+
+template <typename T>
+void Put(T* pa, int i, T value) {
+    if (pa != nullptr) pa[i] = value;
+}
+
+void WriteReport(const Adjustment& sAdj, std::size_t nControlPoints, const BlockInput& in,
+                 const std::vector<int>& anFirstObservation, const ReportOutputs& out) {
+    int nReported = 0;
+    for (std::size_t p = 0; p < nControlPoints; ++p) {
+        const PointRecord& sPoint = sAdj.asPoints[p];
+        int nCount = 0;
+        for (const PointSlot& sSlot : sPoint.asSlots) nCount += sSlot.nFlag != 0 ? 1 : 0;
+        if (nCount <= 1) continue;
+        if (out.pszIds != nullptr) {
+            std::memcpy(
+                out.pszIds + static_cast<std::size_t>(nReported) * SRIT_ID_SIZE,
+                in.pszGcpPointIds + static_cast<std::size_t>(anFirstObservation[p]) * SRIT_ID_SIZE,
+                SRIT_ID_SIZE);
+        }
+        Put(out.panImages, nReported, nCount);
+        Put(out.padfGivenX, nReported, sPoint.dfX);
+        Put(out.padfGivenY, nReported, sPoint.dfY);
+        Put(out.padfGivenZ, nReported, sPoint.dfZ);
+        Put(out.padfEstX, nReported, sPoint.dfEstX);
+        Put(out.padfEstY, nReported, sPoint.dfEstY);
+        Put(out.padfEstZ, nReported, sPoint.dfEstZ);
+        Put(out.padfResX, nReported, sPoint.dfResX);
+        Put(out.padfResY, nReported, sPoint.dfResY);
+        Put(out.padfResZ, nReported, sPoint.dfResZ);
+        ++nReported;
+    }
+    if (out.pnReported != nullptr) *out.pnReported = nReported;
+}
+
+}  // namespace
+
+int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsModels,
+                       bool bImageFirst, EphemerisSeg_t** papsEphemeris,
+                       const ProjInfo_t* psProjInfo, int nGCP, const char* pszGcpImageIds,
+                       const char* pszGcpPointIds, const char* pszGcpUsage, const double* padfA,
+                       const double* padfB, const double* padfZ, const double* padfSdA,
+                       const double* padfSdB, const double* padfSdZ, const double* padfC,
+                       const double* padfD, const double* padfSdC, const double* padfSdD, int nTie,
+                       const char* pszTieImageIds, const char* pszTiePointIds,
+                       const double* padfTiePixel, const double* padfTieLine, double* padfTieZ,
+                       const double* padfTieSdPixel, const double* padfTieSdLine,
+                       const double* padfTieSdZ, double* padfTieX, double* padfTieY,
+                       int* pnReported, char* pszReportedIds, int* panReportedImages,
+                       double* padfGivenX, double* padfGivenY, double* padfGivenZ,
+                       double* padfEstimatedX, double* padfEstimatedY, double* padfEstimatedZ,
+                       double* padfResidualX, double* padfResidualY, double* padfResidualZ) {
     if (nGCP < 3) return 0;
-    ReportNotAvailable("SRITCalculateN");
-    return 0;
+    // Checked before anything is allocated for the images.
+    if (nImages > SRIT_MAX_IMAGES) {
+        IMPError(kTooManyImages, 1, _("Number of images has exceeded limit.\n"));
+    }
+    if (nImages < 1) IMPErrReal(kComputationFailed, 1, "Number of images", nImages, 0);
+    RequireArgument(psProjInfo, "psProjInfo");
+    const BlockInput in{nImages,        pszImageIds,    bImageFirst, papsEphemeris, nGCP,
+                        pszGcpImageIds, pszGcpPointIds, pszGcpUsage, padfA,         padfB,
+                        padfZ,          padfSdA,        padfSdB,     padfSdZ,       padfC,
+                        padfD,          padfSdC,        padfSdD,     nTie,          pszTieImageIds,
+                        pszTiePointIds, padfTiePixel,   padfTieLine, padfTieZ,      padfTieSdPixel,
+                        padfTieSdLine,  padfTieSdZ};
+    RequireInput(in, papsModels);
+
+    char szDecoded[NOVA_GEOSYS_LEN] = {};
+    RequireConformal(*psProjInfo, szDecoded);
+    Adjustment sAdj;
+    sAdj.sEllipsoid = EllipsoidOf(*psProjInfo, szDecoded);
+
+    sAdj.asImages.resize(static_cast<std::size_t>(nImages));
+    std::unordered_map<std::string, std::size_t> mapImages;
+    for (int k = 0; k < nImages; ++k) {
+        sAdj.asImages[static_cast<std::size_t>(k)].psSeg = papsEphemeris[k];
+        mapImages.emplace(IdKey(pszImageIds, k), static_cast<std::size_t>(k));  // first wins
+    }
+    std::vector<int> anFirstObservation;
+    AddControlObservations(sAdj, in, mapImages, anFirstObservation);
+    const std::size_t nControlPoints = sAdj.asPoints.size();
+    std::vector<std::size_t> anTiePoint;
+    AddTieObservations(sAdj, in, mapImages, anTiePoint);
+    if (!EnoughPoints(sAdj)) return 0;
+
+    SpreadElevations(sAdj, nControlPoints);
+    PrepareImages(sAdj);
+    BuildPairs(sAdj);
+    Adjust(sAdj, "SRITCalculateN");
+    EstimatePoints(sAdj);
+
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        FillRecord(sAdj.asImages[k], papsModels[k], papsEphemeris[k], *psProjInfo);
+        if (nova::diag::Debugger::GetDebugLevel() != 0) {
+            const std::string osSensor(papsModels[k]->Sensor,
+                                       strnlen(papsModels[k]->Sensor, SRIT_SENSOR_SIZE));
+            nova::diag::Debugger::Debug(
+                nova::FormatString("SRITModel[i]->Sensor=%s\n", osSensor.c_str()), 1, "lumokit",
+                "mathmodel/lumo/sritcalc_imp", kSensorLine);
+        }
+    }
+    for (int i = 0; i < nTie; ++i) {
+        const PointRecord& sPoint = sAdj.asPoints[anTiePoint[static_cast<std::size_t>(i)]];
+        if (padfTieX != nullptr) padfTieX[i] = sPoint.dfEstX;
+        if (padfTieY != nullptr) padfTieY[i] = sPoint.dfEstY;
+        padfTieZ[i] = sPoint.dfEstZ;
+    }
+    // Check observations join for the reported estimates.
+    for (std::size_t p = 0; p < nControlPoints; ++p) {
+        for (PointSlot& sSlot : sAdj.asPoints[p].asSlots) {
+            if (sSlot.nFlag == 2) sSlot.nFlag = 1;
+        }
+    }
+    EstimatePoints(sAdj);
+    const ReportOutputs out{pnReported,     pszReportedIds, panReportedImages, padfGivenX,
+                            padfGivenY,     padfGivenZ,     padfEstimatedX,    padfEstimatedY,
+                            padfEstimatedZ, padfResidualX,  padfResidualY,     padfResidualZ};
+    WriteReport(sAdj, nControlPoints, in, anFirstObservation, out);
+    return 1;
 }
 
 // ---------------------------------------------------------------------------

@@ -22,6 +22,7 @@ constexpr AddCommandFn kCommands[] = {
     &AddDemoCommand, &AddTransformCommand, &AddPolyCommand,
     &AddRpcCommand,  &AddFitCommand,       &AddResidualsCommand,
     &AddGcpsCommand, &AddSegmentCommand,   &AddSimulateCommand,
+    &AddBlockCommand,
 };
 
 std::string VersionText() {

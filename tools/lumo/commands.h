@@ -32,6 +32,10 @@ void AddResidualsCommand(CLI::App& app, CommandContext& context);
 void AddGcpsCommand(CLI::App& app, CommandContext& context);
 void AddSegmentCommand(CLI::App& app, CommandContext& context);
 void AddSimulateCommand(CLI::App& app, CommandContext& context);
+void AddBlockCommand(CLI::App& app, CommandContext& context);
+// `lumo demo`'s last part: the block adjustment of the bundled stereo pair
+// with tie points (examples/block_stereo.json).
+void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 
 // `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
 // from the control points (with heights) of `gcpsPath`, ground coordinates in

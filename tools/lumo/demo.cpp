@@ -171,6 +171,7 @@ void PrintDemo(const std::string& examplesDir, std::ostream& out) {
                       Pair(r.sGroundRoundTrip).c_str(), Pair(r.sImageRoundTrip).c_str());
         out << line;
     }
+    PrintBlockDemo(examplesDir, out);
 }
 
 void AddDemoCommand(CLI::App& app, CommandContext& context) {

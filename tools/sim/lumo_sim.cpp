@@ -341,6 +341,51 @@ void AddImageNoise(std::vector<SimPoint>* pasPoints, double dfSigma, std::uint32
     }
 }
 
+SceneParams AimAt(const SceneParams& sBase, double dfLatDeg, double dfLonDeg, double dfRollDeg,
+                  double dfPitchDeg) {
+    Require(std::isfinite(dfLatDeg) && std::abs(dfLatDeg) < 85.0, "dfLatDeg", dfLatDeg,
+            "must lie within +-85 degrees");
+    Require(std::isfinite(dfLonDeg) && std::abs(dfLonDeg) <= 180.0, "dfLonDeg", dfLonDeg,
+            "must lie within +-180 degrees");
+    SceneParams sParams = sBase;
+    sParams.dfRollDeg = dfRollDeg;
+    sParams.dfPitchDeg = dfPitchDeg;
+    sParams.dfNadirLatitudeDeg = dfLatDeg;
+    sParams.dfNadirLongitudeDeg = dfLonDeg;
+    // The image centre moves almost one for one with the nadir point, so a
+    // few corrections by the remaining miss converge.
+    for (int nRound = 0; nRound < 20; ++nRound) {
+        const Scene sScene(sParams);
+        double dfLat = 0.0, dfLon = 0.0;
+        sScene.CentreGeodetic(&dfLat, &dfLon);
+        const double dfMissLat = dfLatDeg - dfLat / kDeg;
+        const double dfMissLon = dfLonDeg - dfLon / kDeg;
+        if (std::abs(dfMissLat) < 1e-9 && std::abs(dfMissLon) < 1e-9) return sParams;
+        sParams.dfNadirLatitudeDeg += dfMissLat;
+        sParams.dfNadirLongitudeDeg += dfMissLon;
+    }
+    throw std::runtime_error("no view of the point with roll " + std::to_string(dfRollDeg) +
+                             " and pitch " + std::to_string(dfPitchDeg) + " degrees was found");
+}
+
+bool ProjectInto(const Scene& sScene, const SimPoint& sGround, SimPoint* psOut, double dfMargin) {
+    double dfPixel = 0.0, dfLine = 0.0;
+    if (!sScene.GroundToImage(sGround.dfX, sGround.dfY, sGround.dfZ, &dfPixel, &dfLine)) {
+        return false;
+    }
+    const SceneParams& p = sScene.Params();
+    const double dfMinPixel = p.nPixels * dfMargin, dfMaxPixel = p.nPixels * (1.0 - dfMargin);
+    const double dfMinLine = p.nLines * dfMargin, dfMaxLine = p.nLines * (1.0 - dfMargin);
+    if (!(dfPixel >= dfMinPixel && dfPixel <= dfMaxPixel && dfLine >= dfMinLine &&
+          dfLine <= dfMaxLine)) {
+        return false;
+    }
+    *psOut = sGround;
+    psOut->dfPixel = dfPixel;
+    psOut->dfLine = dfLine;
+    return true;
+}
+
 EphemerisSeg_t* Scene::MakeSegment() const {
     const SceneParams& p = m_sParams;
     auto* psSeg = static_cast<EphemerisSeg_t*>(HCalloc(1, sizeof(EphemerisSeg_t)));

@@ -107,6 +107,20 @@ class Scene {
     ProjInfo_t m_sGeo{};
 };
 
+// Parameters of a view of one ground point (geodetic, degrees) from the orbit
+// of sBase with the given roll and pitch: the nadir point is moved until the
+// image centre looks at the point, so that several views with different
+// angles (and dates) cover one area. Throws std::invalid_argument naming the
+// bad value, or std::runtime_error when no such view exists.
+SceneParams AimAt(const SceneParams& sBase, double dfLatDeg, double dfLonDeg, double dfRollDeg,
+                  double dfPitchDeg);
+
+// The image position of the ground point sGround (X, Y, Z used) in a scene,
+// into psOut; false when it falls outside the image (a fraction dfMargin of
+// the image kept free at every edge) or cannot be mapped.
+bool ProjectInto(const Scene& sScene, const SimPoint& sGround, SimPoint* psOut,
+                 double dfMargin = 0.0);
+
 // Geodetic (radians, metres) to Earth-fixed and back, WGS 84.
 Ecef GeodeticToEcef(double dfLat, double dfLon, double dfHeight);
 void EcefToGeodetic(const Ecef& sPoint, double* pdfLat, double* pdfLon, double* pdfHeight);

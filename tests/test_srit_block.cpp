@@ -1,0 +1,635 @@
+// Block adjustment of several rigorous models: simulated stereo pairs and
+// strips with control, tie and check points, and every failure path.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include <nlohmann/json.hpp>
+
+#include "cli.h"
+#include "lumo_ephemeris.h"
+#include "lumo_sim.h"
+#include "lumo_srit.h"
+#include "model_io.h"
+#include "runtime.h"
+
+namespace {
+
+using lumo::sim::AimAt;
+using lumo::sim::ProjectInto;
+using lumo::sim::Scene;
+using lumo::sim::SceneParams;
+using lumo::sim::SimPoint;
+
+// Identifier of SRIT_ID_SIZE characters, blank padded.
+std::string Id(const std::string& osText) {
+    std::string os = osText;
+    os.resize(SRIT_ID_SIZE, ' ');
+    return os;
+}
+
+// The arrays of one SRITCalculateN call, filled observation by observation;
+// it owns the models and the segments until the models adopt them.
+struct Block {
+    std::vector<Scene> asScenes;
+    std::string osImageIds;
+    std::vector<SRITInfo_t*> apsModels;
+    std::vector<EphemerisSeg_t*> apsSegments;
+    bool bAdopted = false;
+
+    std::string osGcpImage, osGcpPoint, osGcpUsage;
+    std::vector<double> adfPixel, adfLine, adfX, adfY, adfZ;
+    std::string osTieImage, osTiePoint;
+    std::vector<double> adfTiePixel, adfTieLine, adfTieZ, adfTieX, adfTieY;
+
+    int nReported = 0;
+    std::string osReportedIds;
+    std::vector<int> anReportedImages;
+    std::vector<double> adfOut[9];  // given, estimated, residual X Y Z
+
+    Block() = default;
+    Block(const Block&) = delete;
+    Block& operator=(const Block&) = delete;
+    ~Block() {
+        for (SRITInfo_t* p : apsModels) LumoFreeSRITInfo(p);
+        if (!bAdopted) {
+            for (EphemerisSeg_t* p : apsSegments) LumoSatEphemerisFree(p);
+        }
+    }
+
+    int AddImage(const SceneParams& sParams) {
+        asScenes.emplace_back(sParams);
+        osImageIds += Id("IMG" + std::to_string(asScenes.size() - 1));
+        apsModels.push_back(SRITAllocate());
+        apsSegments.push_back(asScenes.back().MakeSegment());
+        return static_cast<int>(asScenes.size()) - 1;
+    }
+    void AddGcp(int k, const std::string& osId, const SimPoint& s, char cUsage = 'A') {
+        osGcpImage += Id("img" + std::to_string(k));  // identifiers ignore case
+        osGcpPoint += Id(osId);
+        osGcpUsage += cUsage;
+        adfPixel.push_back(s.dfPixel);
+        adfLine.push_back(s.dfLine);
+        adfX.push_back(s.dfX);
+        adfY.push_back(s.dfY);
+        adfZ.push_back(s.dfZ);
+    }
+    void AddTie(int k, const std::string& osId, const SimPoint& s, double dfZ = LUMO_NULL_VALUE) {
+        osTieImage += Id("IMG" + std::to_string(k));
+        osTiePoint += Id(osId);
+        adfTiePixel.push_back(s.dfPixel);
+        adfTieLine.push_back(s.dfLine);
+        adfTieZ.push_back(dfZ);
+    }
+    int Run(int nImages = -1) {
+        if (nImages < 0) nImages = static_cast<int>(asScenes.size());
+        const int nGcp = static_cast<int>(adfX.size());
+        const int nTie = static_cast<int>(adfTiePixel.size());
+        adfTieX.assign(adfTiePixel.size(), 0.0);
+        adfTieY.assign(adfTiePixel.size(), 0.0);
+        osReportedIds.assign((static_cast<std::size_t>(nGcp) + 1) * SRIT_ID_SIZE, '\0');
+        anReportedImages.assign(static_cast<std::size_t>(nGcp) + 1, 0);
+        for (auto& adf : adfOut) adf.assign(static_cast<std::size_t>(nGcp) + 1, 0.0);
+        const int nResult = SRITCalculateN(
+            nImages, osImageIds.data(), apsModels.data(), true, apsSegments.data(),
+            &asScenes[0].Projection(), nGcp, osGcpImage.data(), osGcpPoint.data(),
+            osGcpUsage.data(), adfPixel.data(), adfLine.data(), adfZ.data(), nullptr, nullptr,
+            nullptr, adfX.data(), adfY.data(), nullptr, nullptr, nTie, osTieImage.data(),
+            osTiePoint.data(), adfTiePixel.data(), adfTieLine.data(), adfTieZ.data(), nullptr,
+            nullptr, nullptr, adfTieX.data(), adfTieY.data(), &nReported, &osReportedIds[0],
+            anReportedImages.data(), adfOut[0].data(), adfOut[1].data(), adfOut[2].data(),
+            adfOut[3].data(), adfOut[4].data(), adfOut[5].data(), adfOut[6].data(),
+            adfOut[7].data(), adfOut[8].data());
+        if (nResult == 1) bAdopted = true;
+        return nResult;
+    }
+};
+
+// RMS distance in pixels between the model's image position of the points
+// and their true one.
+double CheckRms(const SRITInfo_t* psModel, const std::vector<SimPoint>& asPoints) {
+    double dfSum = 0.0;
+    for (const SimPoint& s : asPoints) {
+        double dfPixel = 0.0, dfLine = 0.0;
+        SRITGeo2Img(psModel, s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine);
+        dfSum += (dfPixel - s.dfPixel) * (dfPixel - s.dfPixel) +
+                 (dfLine - s.dfLine) * (dfLine - s.dfLine);
+    }
+    return std::sqrt(dfSum / static_cast<double>(asPoints.size()));
+}
+
+SceneParams BaseParams() {
+    SceneParams s;
+    s.nUtmZone = 31;
+    return s;
+}
+
+// Ground points of the area seen by a nadir view of (lat, lon).
+std::vector<SimPoint> GroundPoints(double dfLat, double dfLon, int nPoints, std::uint32_t nSeed) {
+    const Scene sNadir(AimAt(BaseParams(), dfLat, dfLon, 0.0, 0.0));
+    return sNadir.SamplePoints(nPoints, nSeed, 0.0, 1500.0, 0.1);
+}
+
+struct StereoResult {
+    double adfCheckRms[2] = {0.0, 0.0};
+    double dfTieZRms = 0.0;
+};
+
+// Stereo pair at +-20 degrees across track on different dates: 6 GCPs in
+// both images, 30 tie points of unknown elevation, check points apart.
+StereoResult RunStereo(Block& sBlock, double dfNoise, bool bCheckObservations, std::size_t nGcp = 6,
+                       std::size_t nTie = 30) {
+    SceneParams sLeft = AimAt(BaseParams(), 45.0, 3.0, -20.0, 0.0);
+    SceneParams sRight = AimAt(BaseParams(), 45.0, 3.0, 20.0, 0.0);
+    sRight.osAcquisitionDate = "2026-08-02T10:41:00.000000Z";
+    sBlock.AddImage(sLeft);
+    sBlock.AddImage(sRight);
+    // Control, tie and check points each spread over the whole area.
+    std::vector<SimPoint> asCheck[2];
+    std::vector<double> adfTrueTieZ;
+    const auto fnBoth = [&](const SimPoint& sGround, SimPoint* psObs) {
+        return ProjectInto(sBlock.asScenes[0], sGround, &psObs[0]) &&
+               ProjectInto(sBlock.asScenes[1], sGround, &psObs[1]);
+    };
+    const auto fnNoisy = [&](SimPoint s, std::uint32_t nSeed) {
+        std::vector<SimPoint> asOne{s};
+        lumo::sim::AddImageNoise(&asOne, dfNoise, nSeed);
+        return asOne[0];
+    };
+    std::uint32_t nSeed = 1;
+    for (const SimPoint& sGround : GroundPoints(45.0, 3.0, static_cast<int>(nGcp), 7)) {
+        SimPoint s[2];
+        if (!fnBoth(sGround, s)) continue;
+        const std::string osId = "pt" + std::to_string(nSeed);
+        for (int k = 0; k < 2; ++k) sBlock.AddGcp(k, osId, fnNoisy(s[k], ++nSeed));
+    }
+    EXPECT_EQ(sBlock.adfX.size(), 2 * nGcp);
+    for (const SimPoint& sGround : GroundPoints(45.0, 3.0, static_cast<int>(nTie), 8)) {
+        SimPoint s[2];
+        if (!fnBoth(sGround, s)) continue;
+        const std::string osId = "TIE" + std::to_string(nSeed);
+        for (int k = 0; k < 2; ++k) sBlock.AddTie(k, osId, fnNoisy(s[k], ++nSeed));
+        adfTrueTieZ.push_back(sGround.dfZ);
+    }
+    int nCheck = 0;
+    for (const SimPoint& sGround : GroundPoints(45.0, 3.0, 50, 9)) {
+        SimPoint s[2];
+        if (!fnBoth(sGround, s)) continue;
+        ++nCheck;
+        for (int k = 0; k < 2; ++k) {
+            asCheck[k].push_back(s[k]);
+            if (bCheckObservations) {
+                SimPoint sWrong = s[k];
+                sWrong.dfPixel += 50.0;  // check observations must not pull the fit
+                sBlock.AddGcp(k, "chk" + std::to_string(nCheck), sWrong, 'C');
+            }
+        }
+    }
+    EXPECT_EQ(nCheck, 50);
+    EXPECT_EQ(adfTrueTieZ.size(), nTie);
+    StereoResult sOut;
+    EXPECT_EQ(sBlock.Run(), 1);
+    for (int k = 0; k < 2; ++k) sOut.adfCheckRms[k] = CheckRms(sBlock.apsModels[k], asCheck[k]);
+    double dfSum = 0.0;
+    for (std::size_t t = 0; t < adfTrueTieZ.size(); ++t) {
+        // Both observations of a tie point carry its estimated elevation.
+        EXPECT_EQ(sBlock.adfTieZ[2 * t], sBlock.adfTieZ[2 * t + 1]);
+        const double dfErr = sBlock.adfTieZ[2 * t] - adfTrueTieZ[t];
+        dfSum += dfErr * dfErr;
+    }
+    sOut.dfTieZRms =
+        std::sqrt(dfSum / static_cast<double>(std::max<std::size_t>(1, adfTrueTieZ.size())));
+    return sOut;
+}
+
+TEST(SRITBlock, StereoPairMeetsTheAccuracyTargets) {
+    Block sBlock;
+    const StereoResult sExact = RunStereo(sBlock, 0.0, false);
+    std::printf("stereo pair, exact measurements: check RMS %.3f / %.3f px, tie Z RMS %.3f m\n",
+                sExact.adfCheckRms[0], sExact.adfCheckRms[1], sExact.dfTieZRms);
+    EXPECT_LE(sExact.adfCheckRms[0], 0.5);
+    EXPECT_LE(sExact.adfCheckRms[1], 0.5);
+    EXPECT_LE(sExact.dfTieZRms, 2.0);
+    // Both records adopted their segments and name the sensor.
+    for (int k = 0; k < 2; ++k) {
+        EXPECT_EQ(sBlock.apsModels[k]->psEphemeris, sBlock.apsSegments[k]);
+        EXPECT_EQ(std::string(sBlock.apsModels[k]->Sensor), "SPOT5_PAN_5");
+        EXPECT_EQ(sBlock.apsModels[k]->nSensor, 55);
+    }
+    // The six control points are reported, each seen in both images, with
+    // an intersection that lands near the given position.
+    ASSERT_EQ(sBlock.nReported, 6);
+    for (int p = 0; p < 6; ++p) {
+        EXPECT_EQ(sBlock.anReportedImages[p], 2);
+        EXPECT_EQ(sBlock.osReportedIds.substr(p * SRIT_ID_SIZE, 2), "pt");
+        for (int c = 0; c < 3; ++c) {
+            EXPECT_NEAR(sBlock.adfOut[c][p] - sBlock.adfOut[3 + c][p], sBlock.adfOut[6 + c][p],
+                        1e-6);
+            EXPECT_LT(std::abs(sBlock.adfOut[6 + c][p]), 5.0);
+        }
+    }
+
+    Block sNoisy;
+    const StereoResult sNoise = RunStereo(sNoisy, 0.3, false);
+    std::printf("stereo pair, 0.3 px noise: check RMS %.3f / %.3f px, tie Z RMS %.3f m\n",
+                sNoise.adfCheckRms[0], sNoise.adfCheckRms[1], sNoise.dfTieZRms);
+    // Six control points fix the twelve parameters of each image exactly,
+    // so their noise reaches the check points almost undamped.
+    EXPECT_LE(sNoise.adfCheckRms[0], 1.2);
+    EXPECT_LE(sNoise.adfCheckRms[1], 1.2);
+    EXPECT_LE(sNoise.dfTieZRms, 15.0);
+}
+
+TEST(SRITBlock, CheckObservationsDoNotChangeTheSolution) {
+    Block sPlain, sChecked;
+    RunStereo(sPlain, 0.0, false);
+    RunStereo(sChecked, 0.0, true);
+    // The check observations enter only the mean elevation that the tie
+    // points start from: the models agree to far below a pixel.
+    const std::vector<SimPoint> asProbe = GroundPoints(45.0, 3.0, 20, 5);
+    for (int k = 0; k < 2; ++k) {
+        for (const SimPoint& s : asProbe) {
+            double dfP1 = 0.0, dfL1 = 0.0, dfP2 = 0.0, dfL2 = 0.0;
+            SRITGeo2Img(sPlain.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP1, &dfL1);
+            SRITGeo2Img(sChecked.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP2, &dfL2);
+            EXPECT_NEAR(dfP1, dfP2, 1e-4);
+            EXPECT_NEAR(dfL1, dfL2, 1e-4);
+        }
+    }
+    // Check points measured in both images are reported too, with the 50 px
+    // error showing in their residuals.
+    EXPECT_GT(sChecked.nReported, 6);
+    double dfLargest = 0.0;
+    for (int p = 6; p < sChecked.nReported; ++p) {
+        dfLargest = std::max(dfLargest, std::hypot(sChecked.adfOut[6][p], sChecked.adfOut[7][p]));
+    }
+    EXPECT_GT(dfLargest, 50.0);
+}
+
+// One image through the block adjustment is the one-image computation.
+TEST(SRITBlock, OneImageEqualsTheOneImageComputation) {
+    Block sBlock;
+    sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, 12.0, 0.0));
+    const std::vector<SimPoint> asPoints = sBlock.asScenes[0].SamplePoints(9, 3, 0.0, 900.0, 0.05);
+    std::vector<double> adfPixel, adfLine, adfX, adfY, adfZ;
+    for (std::size_t i = 0; i < asPoints.size(); ++i) {
+        sBlock.AddGcp(0, "g" + std::to_string(i), asPoints[i]);
+    }
+    SRITInfo_t* psSingle = SRITAllocate();
+    EphemerisSeg_t* psSeg = sBlock.asScenes[0].MakeSegment();
+    ASSERT_EQ(SRITCalculate(psSingle, true, psSeg, 9, &sBlock.asScenes[0].Projection(),
+                            sBlock.adfPixel.data(), sBlock.adfLine.data(), sBlock.adfZ.data(),
+                            sBlock.adfX.data(), sBlock.adfY.data()),
+              1);
+    ASSERT_EQ(sBlock.Run(), 1);
+    for (int c = 0; c < SRIT_NUM_COEFS; ++c) {
+        EXPECT_EQ(psSingle->adfCoef[c], sBlock.apsModels[0]->adfCoef[c]) << c;
+    }
+    EXPECT_EQ(psSingle->nModelClass, sBlock.apsModels[0]->nModelClass);
+    EXPECT_EQ(sBlock.nReported, 0);  // no point is seen in two images
+    LumoFreeSRITInfo(psSingle);
+}
+
+// A strip of ten images along track with alternating roll, four control
+// points each and tie points between neighbours.
+TEST(SRITBlock, StripOfTenImages) {
+    Block sBlock;
+    std::vector<std::vector<SimPoint>> aasCheck;
+    for (int k = 0; k < 10; ++k) {
+        SceneParams s = AimAt(BaseParams(), 46.5 - 0.4 * k, 3.0, k % 2 == 0 ? -10.0 : 10.0, 0.0);
+        s.osAcquisitionDate = "2026-0" + std::to_string(1 + k % 9) + "-10T10:30:00.000000Z";
+        sBlock.AddImage(s);
+    }
+    for (int k = 0; k < 10; ++k) {
+        const Scene& sScene = sBlock.asScenes[static_cast<std::size_t>(k)];
+        const std::vector<SimPoint> asGcp =
+            sScene.SamplePoints(4, static_cast<std::uint32_t>(100 + k), 0.0, 1200.0, 0.1);
+        for (std::size_t i = 0; i < asGcp.size(); ++i) {
+            sBlock.AddGcp(k, "G" + std::to_string(k) + "_" + std::to_string(i), asGcp[i]);
+        }
+        aasCheck.push_back(
+            sScene.SamplePoints(25, static_cast<std::uint32_t>(200 + k), 0.0, 1200.0, 0.02));
+        // The check points go in as check observations: they raise the
+        // image's observation count, so its sensor row adjusts twelve
+        // parameters, without pulling the fit.
+        {
+            for (std::size_t i = 0; i < aasCheck.back().size(); ++i) {
+                sBlock.AddGcp(k, "C" + std::to_string(k) + "_" + std::to_string(i),
+                              aasCheck.back()[i], 'C');
+            }
+        }
+        if (k == 9) break;
+        // Tie points in the overlap with the next image.
+        const std::vector<SimPoint> asCandidates =
+            sScene.SamplePoints(400, static_cast<std::uint32_t>(300 + k), 0.0, 1200.0, 0.02);
+        int nTies = 0;
+        for (std::size_t i = 0; i < asCandidates.size() && nTies < 10; ++i) {
+            SimPoint sNext;
+            if (!ProjectInto(sBlock.asScenes[static_cast<std::size_t>(k) + 1], asCandidates[i],
+                             &sNext, 0.02)) {
+                continue;
+            }
+            const std::string osId = "T" + std::to_string(k) + "_" + std::to_string(i);
+            sBlock.AddTie(k, osId, asCandidates[i], sNext.dfZ);  // known elevation
+            sBlock.AddTie(k + 1, osId, sNext, sNext.dfZ);
+            ++nTies;
+        }
+        EXPECT_EQ(nTies, 10) << "overlap of images " << k << " and " << k + 1;
+    }
+    ASSERT_EQ(sBlock.Run(), 1);
+    for (int k = 0; k < 10; ++k) {
+        const double dfRms = CheckRms(sBlock.apsModels[k], aasCheck[k]);
+        std::printf("strip image %d: check RMS %.3f px\n", k, dfRms);
+        EXPECT_LE(dfRms, 1.0) << "image " << k;
+    }
+}
+
+// Runs fn and returns the numbered error it raises (0 when none).
+template <typename F>
+int ErrorOf(F fn, std::string* posText) {
+    try {
+        fn();
+    } catch (const nova::NumberedError& e) {
+        *posText = e.what();
+        return e.GetCode();
+    }
+    return 0;
+}
+
+// Two images at -15 and +15 degrees, four control points in both.
+void FillTwoImages(Block& sBlock) {
+    sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, -15.0, 0.0));
+    sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, 15.0, 0.0));
+    const std::vector<SimPoint> asGround = GroundPoints(45.0, 3.0, 4, 11);
+    for (std::size_t i = 0; i < asGround.size(); ++i) {
+        for (int k = 0; k < 2; ++k) {
+            SimPoint s;
+            ASSERT_TRUE(ProjectInto(sBlock.asScenes[static_cast<std::size_t>(k)], asGround[i], &s));
+            sBlock.AddGcp(k, "P" + std::to_string(i), s);
+        }
+    }
+}
+
+// The debug log names each image's sensor, and the image without enough
+// points.
+TEST(SRITBlock, DebugMessages) {
+    std::vector<nova::diag::DebugRecord> asRecords;
+    const int nOldLevel = nova::diag::Debugger::moDebugLevel;
+    nova::diag::Debugger::SetDebugLevel(1);
+    auto oldSink = nova::diag::Debugger::SetSink(
+        [&asRecords](const nova::diag::DebugRecord& r) { asRecords.push_back(r); });
+    {
+        Block sBlock;
+        FillTwoImages(sBlock);
+        EXPECT_EQ(sBlock.Run(), 1);
+    }
+    {
+        Block sBlock;
+        FillTwoImages(sBlock);
+        sBlock.osGcpImage.replace(7 * SRIT_ID_SIZE, SRIT_ID_SIZE, Id("IMG0"));
+        EXPECT_EQ(sBlock.Run(), 0);  // image 1 keeps three observations
+    }
+    nova::diag::Debugger::SetSink(oldSink);
+    nova::diag::Debugger::SetDebugLevel(nOldLevel);
+    std::vector<std::string> asSensor;
+    std::string osNotEnough;
+    for (const auto& r : asRecords) {
+        if (r.nLine == 1268) asSensor.push_back(r.osMessage);
+        if (r.nLine == 1100) osNotEnough = r.osMessage;
+        if (r.nLine == 1268 || r.nLine == 1100) {
+            EXPECT_EQ(r.osModule, "lumokit");
+            EXPECT_EQ(r.osFile, "mathmodel/lumo/sritcalc_imp");
+            EXPECT_EQ(r.nLevel, 1);
+        }
+    }
+    EXPECT_EQ(asSensor, std::vector<std::string>(2, "SRITModel[i]->Sensor=SPOT5_PAN_5\n"));
+    EXPECT_EQ(osNotEnough, "Not enough points in image 1! no model calculated\n");
+}
+
+TEST(SRITBlock, FailurePaths) {
+    std::string osText;
+    // More than 250 images: error 11 before any array is looked at.
+    EXPECT_EQ(ErrorOf(
+                  [] {
+                      SRITCalculateN(251, nullptr, nullptr, true, nullptr, nullptr, 3, nullptr,
+                                     nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr,
+                                     nullptr, nullptr, nullptr, nullptr, nullptr, 0, nullptr,
+                                     nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr,
+                                     nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr,
+                                     nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr);
+                  },
+                  &osText),
+              11);
+    EXPECT_NE(osText.find("Number of images has exceeded limit."), std::string::npos);
+
+    // Two images, four control points each, plus variations.
+    const auto fnFill = FillTwoImages;
+    {
+        Block sBlock;
+        fnFill(sBlock);
+        EXPECT_EQ(sBlock.Run(), 1);  // two images with four points each
+        EXPECT_EQ(sBlock.nReported, 4);
+    }
+    {
+        // An image with three observations: 0 and nothing adopted.
+        Block sBlock;
+        fnFill(sBlock);
+        sBlock.osGcpUsage.pop_back();
+        sBlock.osGcpImage.resize(sBlock.osGcpImage.size() - SRIT_ID_SIZE);
+        sBlock.osGcpPoint.resize(sBlock.osGcpPoint.size() - SRIT_ID_SIZE);
+        for (auto* pv :
+             {&sBlock.adfPixel, &sBlock.adfLine, &sBlock.adfX, &sBlock.adfY, &sBlock.adfZ}) {
+            pv->pop_back();
+        }
+        const std::vector<double> adfCoef(sBlock.apsModels[0]->adfCoef,
+                                          sBlock.apsModels[0]->adfCoef + SRIT_NUM_COEFS);
+        EXPECT_EQ(sBlock.Run(), 0);
+        EXPECT_NE(sBlock.apsModels[0]->psEphemeris, sBlock.apsSegments[0]);
+        EXPECT_EQ(adfCoef, std::vector<double>(sBlock.apsModels[0]->adfCoef,
+                                               sBlock.apsModels[0]->adfCoef + SRIT_NUM_COEFS));
+    }
+    {
+        // An observation naming an unknown image.
+        Block sBlock;
+        fnFill(sBlock);
+        std::memcpy(&sBlock.osGcpImage[3 * SRIT_ID_SIZE], "NOSUCH", 6);
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("observation 4 names image \"NOSUCH"), std::string::npos) << osText;
+    }
+    {
+        // A single tie observation.
+        Block sBlock;
+        fnFill(sBlock);
+        SimPoint s{100.0, 100.0, 0.0, 0.0, 0.0};
+        sBlock.AddTie(0, "T", s);
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("single tie observation"), std::string::npos) << osText;
+    }
+    {
+        // A control point with X but without Y has no valid type.
+        Block sBlock;
+        fnFill(sBlock);
+        sBlock.adfY[2] = LUMO_NULL_VALUE;
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("GCP number 3 has invalid type."), std::string::npos) << osText;
+    }
+    {
+        // A tie pixel that is not a number.
+        Block sBlock;
+        fnFill(sBlock);
+        SimPoint s{std::nan(""), 100.0, 0.0, 0.0, 0.0};
+        sBlock.AddTie(0, "T", s);
+        sBlock.AddTie(1, "T", s);
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("tie observation 1 has an invalid pixel"), std::string::npos)
+            << osText;
+    }
+    {
+        // Two images sharing one segment would release it twice.
+        Block sBlock;
+        fnFill(sBlock);
+        EphemerisSeg_t* psSecond = sBlock.apsSegments[1];
+        sBlock.apsSegments[1] = sBlock.apsSegments[0];
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("share"), std::string::npos) << osText;
+        sBlock.apsSegments[1] = psSecond;
+    }
+    {
+        // A record still holding another image's new segment would release
+        // it on adopting its own.
+        Block sBlock;
+        fnFill(sBlock);
+        EphemerisSeg_t* psOwn = sBlock.apsModels[0]->psEphemeris;
+        sBlock.apsModels[0]->psEphemeris = sBlock.apsSegments[1];
+        EXPECT_EQ(ErrorOf([&] { sBlock.Run(); }, &osText), 100);
+        EXPECT_NE(osText.find("images 0 and 1 share"), std::string::npos) << osText;
+        sBlock.apsModels[0]->psEphemeris = psOwn;
+    }
+}
+
+// Control points without elevation ('P') and tie points with a known
+// elevation ('A') take part; the elevation of a 'P' point is estimated.
+TEST(SRITBlock, PointTypesWithoutElevationAndKnownTieElevation) {
+    Block sBlock;
+    sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, -20.0, 0.0));
+    sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, 20.0, 0.0));
+    const std::vector<SimPoint> asGround = GroundPoints(45.0, 3.0, 30, 21);
+    std::vector<SimPoint> asCheck;
+    int nUsed = 0;
+    double dfTruePZ = 0.0;
+    for (std::size_t i = 0; i < asGround.size(); ++i) {
+        SimPoint s[2];
+        if (!ProjectInto(sBlock.asScenes[0], asGround[i], &s[0]) ||
+            !ProjectInto(sBlock.asScenes[1], asGround[i], &s[1])) {
+            continue;
+        }
+        // Every third point is control, the last of them without elevation;
+        // every third a tie of known elevation; the rest check points.
+        const std::string osId = "p" + std::to_string(i);
+        for (int k = 0; k < 2; ++k) {
+            SimPoint sObs = s[k];
+            if (i % 3 == 0) {
+                if (i == 27) {
+                    sObs.dfZ = LUMO_NULL_VALUE;  // planimetric control only
+                    dfTruePZ = asGround[i].dfZ;
+                }
+                sBlock.AddGcp(k, osId, sObs);
+            } else if (i % 3 == 1) {
+                sBlock.AddTie(k, osId, sObs, asGround[i].dfZ);  // known elevation
+            } else {
+                asCheck.push_back(s[k]);
+            }
+        }
+        ++nUsed;
+    }
+    ASSERT_EQ(nUsed, 30);
+    const std::vector<double> adfGivenTieZ = sBlock.adfTieZ;
+    ASSERT_EQ(sBlock.Run(), 1);
+    // The 'P' point is reported with an estimated elevation near the truth
+    // and no elevation residual.
+    ASSERT_EQ(sBlock.nReported, 10);
+    EXPECT_EQ(sBlock.adfOut[2][9], LUMO_NULL_VALUE);
+    EXPECT_EQ(sBlock.adfOut[8][9], 0.0);
+    EXPECT_NEAR(sBlock.adfOut[5][9], dfTruePZ, 2.0);
+    // Known tie elevations come back as the intersection's, close to the given.
+    ASSERT_EQ(sBlock.adfTieZ.size(), 20u);
+    for (std::size_t t = 0; t < sBlock.adfTieZ.size(); ++t) {
+        EXPECT_NEAR(sBlock.adfTieZ[t], adfGivenTieZ[t], 2.0) << t;
+        EXPECT_TRUE(std::isfinite(sBlock.adfTieX[t]) && std::isfinite(sBlock.adfTieY[t]));
+    }
+    for (int k = 0; k < 2; ++k) {
+        std::vector<SimPoint> asMine;
+        for (std::size_t i = k; i < asCheck.size(); i += 2) asMine.push_back(asCheck[i]);
+        EXPECT_LE(CheckRms(sBlock.apsModels[k], asMine), 0.5) << k;
+    }
+}
+
+// `lumo block` on the bundled stereo project: models and report written, the
+// estimated tie-point ground positions project back onto their measurements,
+// and project errors name the bad value.
+TEST(SRITBlockCli, BundledStereoProject) {
+    namespace fs = std::filesystem;
+    const fs::path dir =
+        fs::temp_directory_path() / ("lumo_block_cli_" + std::to_string(::getpid()));
+    const std::string project = std::string(LUMO_SOURCE_DIR) + "/examples/block_stereo.json";
+    const auto fnRun = [](std::vector<std::string> args, std::string* posErr) {
+        args.insert(args.begin(), "lumo");
+        std::vector<char*> argv;
+        argv.reserve(args.size());
+        for (auto& a : args) argv.push_back(a.data());
+        std::ostringstream out, err;
+        const int nCode = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
+        *posErr = err.str();
+        return nCode;
+    };
+    std::string osErr;
+    ASSERT_EQ(fnRun({"block", project, "-o", dir.string()}, &osErr), 0) << osErr;
+    nlohmann::json report;
+    std::ifstream((dir / "report.json").string()) >> report;
+    ASSERT_EQ(report["images"].size(), 2u);
+    nlohmann::json projectDoc;
+    std::ifstream(project) >> projectDoc;
+    for (const auto& image : report["images"]) {
+        EXPECT_LT(image["checkResiduals"]["rmsPixel"].get<double>(), 0.5);
+        EXPECT_LT(image["checkResiduals"]["rmsLine"].get<double>(), 0.5);
+        const lumo::cli::LoadedModel model =
+            lumo::cli::ReadModelFile(image["model"].get<std::string>());
+        const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
+        // Every tie measurement in this image against its point's estimate.
+        for (const auto& tie : projectDoc["ties"]) {
+            if (tie["image"] != image["id"]) continue;
+            for (const auto& point : report["tiePoints"]) {
+                if (point["point"] != tie["point"]) continue;
+                double dfPixel = 0.0, dfLine = 0.0;
+                SRITGeo2Img(psModel, point["ground"][0].get<double>(),
+                            point["ground"][1].get<double>(), point["ground"][2].get<double>(),
+                            &dfPixel, &dfLine);
+                EXPECT_NEAR(dfPixel, tie["pixel"].get<double>(), 0.5) << tie["point"];
+                EXPECT_NEAR(dfLine, tie["line"].get<double>(), 0.5) << tie["point"];
+            }
+        }
+    }
+    EXPECT_EQ(report["tiePoints"].size(), 12u);
+    EXPECT_EQ(report["controlPoints"].size(), 12u);
+
+    // A tie naming an image the project does not list.
+    projectDoc["ties"][3]["image"] = "middle";
+    for (auto& image : projectDoc["images"]) {
+        image["segment"] =
+            std::string(LUMO_SOURCE_DIR) + "/examples/" + image["segment"].get<std::string>();
+    }
+    const std::string bad = (dir / "bad.json").string();
+    std::ofstream(bad) << projectDoc.dump();
+    EXPECT_NE(fnRun({"block", bad, "-o", dir.string()}, &osErr), 0);
+    EXPECT_NE(osErr.find("ties[3] names image \"middle\""), std::string::npos) << osErr;
+    fs::remove_all(dir);
+}
+
+}  // namespace

@@ -1,0 +1,314 @@
+// `lumo block PROJECT --output-dir DIR`: the rigorous models of several
+// images adjusted together from control and tie points, one model file per
+// image and a report of the points' ground estimates.
+#include <cctype>
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+#include <nlohmann/json.hpp>
+
+#include "block_io.h"
+#include "cli_error.h"
+#include "commands.h"
+#include "model_io.h"
+#include "nova/projection.h"
+#include "segment_io.h"
+#include "srit_io.h"
+
+namespace lumo::cli {
+namespace {
+
+struct BlockOptions {
+    std::string osProject;
+    std::string osOutputDir;
+};
+
+// Identifier padded with blanks to the library's fixed width.
+std::string Padded(const std::string& text) {
+    std::string padded = text;
+    padded.resize(SRIT_ID_SIZE, ' ');
+    return padded;
+}
+
+std::string Upper(std::string text) {
+    for (char& c : text) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    return text;
+}
+
+std::string Trimmed(const char* psz) {
+    std::size_t n = strnlen(psz, SRIT_ID_SIZE);
+    while (n > 0 && psz[n - 1] == ' ') --n;
+    return std::string(psz, n);
+}
+
+// A file name for an image identifier: letters, digits, '-' and '_' kept.
+std::string FileStem(const std::string& id) {
+    std::string stem = id;
+    for (char& c : stem) {
+        if (!std::isalnum(static_cast<unsigned char>(c)) && c != '-' && c != '_') c = '_';
+    }
+    return stem;
+}
+
+double NullToNan(double value) {
+    return value == LUMO_NULL_VALUE ? std::nan("") : value;
+}
+
+nlohmann::json Triple(double a, double b, double c) {
+    nlohmann::json values = nlohmann::json::array();
+    for (double v : {a, b, c}) {
+        if (std::isnan(NullToNan(v))) {
+            values.push_back(nullptr);
+        } else {
+            values.push_back(v);
+        }
+    }
+    return values;
+}
+
+// The library's parallel arrays for a project.
+struct BlockArrays {
+    std::string osImageIds, osGcpImage, osGcpPoint, osGcpUsage, osTieImage, osTiePoint;
+    std::vector<double> p, l, x, y, z, sdX, sdY, sdZ, tp, tl, tz, tx, ty;
+};
+
+BlockArrays MakeArrays(const BlockProject& project) {
+    BlockArrays a;
+    std::map<std::string, std::string> ids;  // upper-cased identifier -> as written
+    for (const BlockImage& image : project.asImages) {
+        if (!ids.emplace(Upper(image.osId), image.osId).second) {
+            LUMO_CLI_FAIL(project.osSource + ": image identifier " + Quoted(image.osId) +
+                          " is used twice (identifiers ignore case)");
+        }
+        a.osImageIds += Padded(image.osId);
+    }
+    const auto requireImage = [&](const std::string& id, const std::string& field) {
+        if (ids.count(Upper(id)) == 0) {
+            LUMO_CLI_FAIL(project.osSource + ": " + field + " names image " + Quoted(id) +
+                          ", which the project does not list");
+        }
+    };
+    for (std::size_t i = 0; i < project.asGcps.size(); ++i) {
+        const BlockGcp& g = project.asGcps[i];
+        requireImage(g.osImage, "gcps[" + std::to_string(i) + "]");
+        a.osGcpImage += Padded(g.osImage);
+        a.osGcpPoint += Padded(g.osPoint);
+        a.osGcpUsage += g.bCheck ? 'C' : 'A';
+        a.p.push_back(g.dfPixel);
+        a.l.push_back(g.dfLine);
+        a.x.push_back(g.dfX);
+        a.y.push_back(g.dfY);
+        a.z.push_back(g.dfZ);
+        a.sdX.push_back(g.dfSdX);
+        a.sdY.push_back(g.dfSdY);
+        a.sdZ.push_back(g.dfSdZ);
+    }
+    for (std::size_t i = 0; i < project.asTies.size(); ++i) {
+        const BlockTie& t = project.asTies[i];
+        requireImage(t.osImage, "ties[" + std::to_string(i) + "]");
+        a.osTieImage += Padded(t.osImage);
+        a.osTiePoint += Padded(t.osPoint);
+        a.tp.push_back(t.dfPixel);
+        a.tl.push_back(t.dfLine);
+        a.tz.push_back(t.dfZ);
+    }
+    a.tx.assign(a.tp.size(), 0.0);
+    a.ty.assign(a.tp.size(), 0.0);
+    return a;
+}
+
+// Root mean square image residual of a project's control observations of
+// one kind (used or check) in one image.
+nlohmann::json ImageResiduals(const BlockProject& project, const std::string& id,
+                              const SRITInfo_t& model, bool bCheck) {
+    double sumPixel = 0.0, sumLine = 0.0;
+    int count = 0;
+    for (const BlockGcp& g : project.asGcps) {
+        if (g.bCheck != bCheck || Upper(g.osImage) != Upper(id) || g.dfZ == LUMO_NULL_VALUE) {
+            continue;
+        }
+        double pixel = 0.0, line = 0.0;
+        SRITGeo2Img(&model, g.dfX, g.dfY, g.dfZ, &pixel, &line);
+        sumPixel += (pixel - g.dfPixel) * (pixel - g.dfPixel);
+        sumLine += (line - g.dfLine) * (line - g.dfLine);
+        ++count;
+    }
+    nlohmann::json result{{"count", count}};
+    if (count > 0) {
+        result["rmsPixel"] = std::sqrt(sumPixel / count);
+        result["rmsLine"] = std::sqrt(sumLine / count);
+    }
+    return result;
+}
+
+// The adjusted block: one model per image, the report arrays and the tie
+// outputs.
+struct BlockResult {
+    BlockArrays a;
+    std::vector<SritPtr> models;
+    int nReported = 0;
+    std::vector<char> reportedIds;
+    std::vector<int> reportedImages;
+    std::vector<double> out[9];  // given, estimated, residual X Y Z
+};
+
+BlockResult ComputeBlock(const BlockProject& project) {
+    std::vector<SegmentPtr> segments;
+    for (const BlockImage& image : project.asImages) {
+        segments.push_back(ReadSegmentFile(image.osSegmentPath));
+    }
+    const EphemerisSeg_t& first = *segments.front();
+    const std::string geosys =
+        !project.osGeosys.empty()
+            ? project.osGeosys
+            : std::string(first.szGeosys, strnlen(first.szGeosys, sizeof first.szGeosys));
+    if (geosys.empty()) {
+        LUMO_CLI_FAIL(project.osSource +
+                      ": neither the project (geosys) nor the first segment "
+                      "names the projection of the ground coordinates");
+    }
+    ProjInfo_t proj{};
+    if (Geosys2ProjInfo(&proj, geosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
+        LUMO_CLI_FAIL("projection " + Quoted(geosys) + " is not a known georeferencing text");
+    }
+    BlockResult r;
+    r.a = MakeArrays(project);
+    BlockArrays& a = r.a;
+    const std::size_t nImages = project.asImages.size();
+    std::vector<SRITInfo_t*> modelPointers;
+    std::vector<EphemerisSeg_t*> segmentPointers;
+    for (std::size_t k = 0; k < nImages; ++k) {
+        r.models.emplace_back(SRITAllocate());
+        modelPointers.push_back(r.models.back().get());
+        segmentPointers.push_back(segments[k].get());
+    }
+    const std::size_t nGcp = a.x.size();
+    r.reportedIds.assign((nGcp + 1) * SRIT_ID_SIZE, '\0');
+    r.reportedImages.assign(nGcp + 1, 0);
+    for (auto& values : r.out) values.assign(nGcp + 1, 0.0);
+    const int result = SRITCalculateN(
+        static_cast<int>(nImages), a.osImageIds.data(), modelPointers.data(), true,
+        segmentPointers.data(), &proj, static_cast<int>(nGcp), a.osGcpImage.data(),
+        a.osGcpPoint.data(), a.osGcpUsage.data(), a.p.data(), a.l.data(), a.z.data(), nullptr,
+        nullptr, a.sdZ.data(), a.x.data(), a.y.data(), a.sdX.data(), a.sdY.data(),
+        static_cast<int>(a.tp.size()), a.osTieImage.data(), a.osTiePoint.data(), a.tp.data(),
+        a.tl.data(), a.tz.data(), nullptr, nullptr, nullptr, a.tx.data(), a.ty.data(), &r.nReported,
+        r.reportedIds.data(), r.reportedImages.data(), r.out[0].data(), r.out[1].data(),
+        r.out[2].data(), r.out[3].data(), r.out[4].data(), r.out[5].data(), r.out[6].data(),
+        r.out[7].data(), r.out[8].data());
+    if (result != 1) {
+        LUMO_CLI_FAIL(project.osSource +
+                      ": no block model could be computed (the block needs at least 3 control "
+                      "observations and every image 4, 5 for radar)");
+    }
+    for (SegmentPtr& segment : segments) static_cast<void>(segment.release());  // adopted
+    return r;
+}
+
+// Distinct tie points in order of first observation, with the index of that
+// observation.
+std::vector<std::size_t> FirstTieObservations(const BlockProject& project) {
+    std::vector<std::size_t> first;
+    std::map<std::string, bool> seen;
+    for (std::size_t i = 0; i < project.asTies.size(); ++i) {
+        if (seen.emplace(Upper(project.asTies[i].osPoint), true).second) first.push_back(i);
+    }
+    return first;
+}
+
+void RunBlock(const BlockOptions& options, CommandContext& context) {
+    const BlockProject project = ReadBlockProject(options.osProject);
+    BlockResult r = ComputeBlock(project);
+    const BlockArrays& a = r.a;
+    const auto& models = r.models;
+    const auto& out = r.out;
+    const int nReported = r.nReported;
+    const std::size_t nImages = project.asImages.size();
+    const std::size_t nGcp = a.x.size();
+    std::filesystem::create_directories(options.osOutputDir);
+    nlohmann::json report{{"format", "lumo-block-report"}, {"version", 1}};
+    report["images"] = nlohmann::json::array();
+    for (std::size_t k = 0; k < nImages; ++k) {
+        const std::string& id = project.asImages[k].osId;
+        const std::string path =
+            (std::filesystem::path(options.osOutputDir) / (FileStem(id) + ".model.json")).string();
+        WriteModelFile(path, SritToJson(*models[k]));
+        const SRITInfo_t& model = *models[k];
+        report["images"].push_back(
+            {{"id", id},
+             {"model", path},
+             {"sensor", std::string(model.Sensor, strnlen(model.Sensor, SRIT_SENSOR_SIZE))},
+             {"controlResiduals", ImageResiduals(project, id, model, false)},
+             {"checkResiduals", ImageResiduals(project, id, model, true)}});
+        context.out << "image " << id << ": wrote " << path << "\n";
+    }
+    report["controlPoints"] = nlohmann::json::array();
+    for (int i = 0; i < nReported; ++i) {
+        report["controlPoints"].push_back(
+            {{"point", Trimmed(r.reportedIds.data() + static_cast<std::size_t>(i) * SRIT_ID_SIZE)},
+             {"images", r.reportedImages[i]},
+             {"given", Triple(out[0][i], out[1][i], out[2][i])},
+             {"estimated", Triple(out[3][i], out[4][i], out[5][i])},
+             {"residual", Triple(out[6][i], out[7][i], out[8][i])}});
+    }
+    report["tiePoints"] = nlohmann::json::array();
+    for (std::size_t i : FirstTieObservations(project)) {
+        const BlockTie& tie = project.asTies[i];
+        report["tiePoints"].push_back({{"point", tie.osPoint},
+                                       {"elevationGiven", tie.dfZ != LUMO_NULL_VALUE},
+                                       {"ground", Triple(a.tx[i], a.ty[i], a.tz[i])}});
+    }
+    const std::string reportPath =
+        (std::filesystem::path(options.osOutputDir) / "report.json").string();
+    WriteFileReplacing(reportPath, report.dump(2) + "\n");
+    context.out << "block of " << nImages << " images: " << nGcp << " control observations, "
+                << a.tp.size() << " tie observations (" << report["tiePoints"].size()
+                << " tie points), " << nReported << " control points in several images\nwrote "
+                << reportPath << "\n";
+}
+
+}  // namespace
+
+void PrintBlockDemo(const std::string& examplesDir, std::ostream& out) {
+    const BlockProject project =
+        ReadBlockProject((std::filesystem::path(examplesDir) / "block_stereo.json").string());
+    const BlockResult r = ComputeBlock(project);
+    out << "\nblock adjustment of block_stereo.json: " << project.asImages.size() << " images, "
+        << FirstTieObservations(project).size() << " tie points of unknown elevation\n";
+    char line[200];
+    for (std::size_t k = 0; k < project.asImages.size(); ++k) {
+        const nlohmann::json check =
+            ImageResiduals(project, project.asImages[k].osId, *r.models[k], true);
+        std::snprintf(line, sizeof line, "  image %-8s check points %d, rms pixel %.3f line %.3f\n",
+                      project.asImages[k].osId.c_str(), check["count"].get<int>(),
+                      check.value("rmsPixel", 0.0), check.value("rmsLine", 0.0));
+        out << line;
+    }
+    for (std::size_t i : FirstTieObservations(project)) {
+        std::snprintf(line, sizeof line, "  tie %-8s ground %.2f %.2f elevation %.2f\n",
+                      project.asTies[i].osPoint.c_str(), r.a.tx[i], r.a.ty[i], r.a.tz[i]);
+        out << line;
+    }
+}
+
+void AddBlockCommand(CLI::App& app, CommandContext& context) {
+    auto options = std::make_shared<BlockOptions>();
+    CLI::App* command = app.add_subcommand(
+        "block", "Adjust the rigorous models of several images together (control and tie points)");
+    command->add_option("project", options->osProject, "block project file (JSON)")->required();
+    command
+        ->add_option("-o,--output-dir", options->osOutputDir,
+                     "directory for the model files and report.json")
+        ->required();
+    command->callback([options, &context] { RunBlock(*options, context); });
+}
+
+}  // namespace lumo::cli
