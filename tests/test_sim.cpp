@@ -77,9 +77,9 @@ TEST(SimScene, SegmentMatchesTheGeometry) {
     EXPECT_DOUBLE_EQ(psSeg->dfCentreColumn, 6000.0);
     EXPECT_EQ(psSeg->nNumLines, 12000);
     EXPECT_EQ(psSeg->nOrbitType, 0);
-    // Circular orbit: velocity = angular speed times radius; 822 km orbit
-    // has a period near 101 minutes.
-    EXPECT_DOUBLE_EQ(psSeg->dfSatVelocity, psSeg->dfAngularSpeed * psSeg->dfOrbitRadius);
+    // Circular orbit: no radial velocity; 822 km orbit has a period near
+    // 101 minutes.
+    EXPECT_EQ(psSeg->dfSatVelocity, 0.0);
     EXPECT_NEAR(2 * 3.14159265358979 / psSeg->dfAngularSpeed / 60.0, 101.4, 0.2);
     // Off nadir the pixel is the slant range times the IFOV over the cosine
     // of the incidence angle (spherical Earth of the centre's radius).

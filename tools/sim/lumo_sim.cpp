@@ -402,7 +402,11 @@ EphemerisSeg_t* Scene::MakeSegment() const {
     psSeg->dfCentreColumn = CentreColumn();
     psSeg->dfCentreLine = CentreLine();
     psSeg->dfAngularSpeed = m_dfMeanMotion;
-    psSeg->dfSatVelocity = m_dfMeanMotion * p.dfOrbitRadius;
+    // The velocity term is the satellite's radial velocity (rate of change of
+    // its distance from the Earth's centre): zero on a circular orbit. The
+    // model subtracts the slope of the ellipsoid under the track from it to
+    // get the rate at which the height above the scene changes.
+    psSeg->dfSatVelocity = 0.0;
     psSeg->dfInclination = p.dfInclinationDeg * kDeg;
     psSeg->dfLineInterval = m_dfLineInterval;
     psSeg->dfAscNodeLongitude = m_dfNode;
