@@ -271,6 +271,23 @@ TEST(SRITBlock, CheckObservationsDoNotChangeTheSolution) {
         dfLargest = std::max(dfLargest, std::hypot(sChecked.adfOut[6][p], sChecked.adfOut[7][p]));
     }
     EXPECT_GT(dfLargest, 50.0);
+
+    // With four control points per image the sensor row gives eight
+    // unknowns; the fifty check observations must not raise that to twelve,
+    // which the control points could not determine.
+    Block sPlain4, sChecked4;
+    RunStereo(sPlain4, 0.0, false, 4);
+    RunStereo(sChecked4, 0.0, true, 4);
+    for (int k = 0; k < 2; ++k) {
+        EXPECT_EQ(sChecked4.apsModels[k]->adfCoef[19], 0.0);  // P11 not adjusted
+        for (const SimPoint& s : asProbe) {
+            double dfP1 = 0.0, dfL1 = 0.0, dfP2 = 0.0, dfL2 = 0.0;
+            SRITGeo2Img(sPlain4.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP1, &dfL1);
+            SRITGeo2Img(sChecked4.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP2, &dfL2);
+            EXPECT_NEAR(dfP1, dfP2, 1e-4);
+            EXPECT_NEAR(dfL1, dfL2, 1e-4);
+        }
+    }
 }
 
 // One image through the block adjustment is the one-image computation.
@@ -298,8 +315,9 @@ TEST(SRITBlock, OneImageEqualsTheOneImageComputation) {
 }
 
 // A strip of ten images along track with alternating roll, four control
-// points each and tie points between neighbours.
-TEST(SRITBlock, StripOfTenImages) {
+// points each and ten tie points between neighbours, of known or of unknown
+// elevation; returns the check RMS of every image.
+std::vector<double> RunStrip(bool bKnownTieElevation) {
     Block sBlock;
     std::vector<std::vector<SimPoint>> aasCheck;
     for (int k = 0; k < 10; ++k) {
@@ -310,20 +328,19 @@ TEST(SRITBlock, StripOfTenImages) {
     for (int k = 0; k < 10; ++k) {
         const Scene& sScene = sBlock.asScenes[static_cast<std::size_t>(k)];
         const std::vector<SimPoint> asGcp =
-            sScene.SamplePoints(4, static_cast<std::uint32_t>(100 + k), 0.0, 1200.0, 0.1);
+            sScene.SamplePoints(4, static_cast<std::uint32_t>(100 + k), 0.0, 1200.0, 0.05);
         for (std::size_t i = 0; i < asGcp.size(); ++i) {
             sBlock.AddGcp(k, "G" + std::to_string(k) + "_" + std::to_string(i), asGcp[i]);
         }
         aasCheck.push_back(
             sScene.SamplePoints(25, static_cast<std::uint32_t>(200 + k), 0.0, 1200.0, 0.02));
-        // The check points go in as check observations: they raise the
-        // image's observation count, so its sensor row adjusts twelve
-        // parameters, without pulling the fit.
-        {
-            for (std::size_t i = 0; i < aasCheck.back().size(); ++i) {
-                sBlock.AddGcp(k, "C" + std::to_string(k) + "_" + std::to_string(i),
-                              aasCheck.back()[i], 'C');
-            }
+        // The check points also go in as check observations, 50 px off:
+        // they neither pull the fit nor raise the image's unknown count
+        // beyond what its four control points determine.
+        for (std::size_t i = 0; i < aasCheck.back().size(); ++i) {
+            SimPoint sWrong = aasCheck.back()[i];
+            sWrong.dfPixel += 50.0;
+            sBlock.AddGcp(k, "C" + std::to_string(k) + "_" + std::to_string(i), sWrong, 'C');
         }
         if (k == 9) break;
         // Tie points in the overlap with the next image.
@@ -337,17 +354,29 @@ TEST(SRITBlock, StripOfTenImages) {
                 continue;
             }
             const std::string osId = "T" + std::to_string(k) + "_" + std::to_string(i);
-            sBlock.AddTie(k, osId, asCandidates[i], sNext.dfZ);  // known elevation
-            sBlock.AddTie(k + 1, osId, sNext, sNext.dfZ);
+            const double dfZ = bKnownTieElevation ? sNext.dfZ : LUMO_NULL_VALUE;
+            sBlock.AddTie(k, osId, asCandidates[i], dfZ);
+            sBlock.AddTie(k + 1, osId, sNext, dfZ);
             ++nTies;
         }
         EXPECT_EQ(nTies, 10) << "overlap of images " << k << " and " << k + 1;
     }
-    ASSERT_EQ(sBlock.Run(), 1);
-    for (int k = 0; k < 10; ++k) {
-        const double dfRms = CheckRms(sBlock.apsModels[k], aasCheck[k]);
-        std::printf("strip image %d: check RMS %.3f px\n", k, dfRms);
-        EXPECT_LE(dfRms, 1.0) << "image " << k;
+    std::vector<double> adfRms;
+    EXPECT_EQ(sBlock.Run(), 1);
+    if (!sBlock.bAdopted) return adfRms;
+    for (int k = 0; k < 10; ++k) adfRms.push_back(CheckRms(sBlock.apsModels[k], aasCheck[k]));
+    return adfRms;
+}
+
+TEST(SRITBlock, StripOfTenImages) {
+    for (const bool bKnown : {false, true}) {
+        const std::vector<double> adfRms = RunStrip(bKnown);
+        ASSERT_EQ(adfRms.size(), 10u);
+        for (int k = 0; k < 10; ++k) {
+            std::printf("strip image %d, tie elevations %s: check RMS %.3f px\n", k,
+                        bKnown ? "known" : "estimated", adfRms[k]);
+            EXPECT_LE(adfRms[k], 1.0) << "image " << k;
+        }
     }
 }
 

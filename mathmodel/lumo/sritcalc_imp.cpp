@@ -434,8 +434,9 @@ struct ImageState {
     bool bFlat = false;         // no Earth-curvature term
     bool bFormosatPan = false;
     bool bConstrained = false;
-    int nObservations = 0;
-    int nBlockStart = 0;  // first position of the image's block in the unknown vector
+    int nObservations = 0;      // control-point observations, used and check
+    int nUsedObservations = 0;  // those that enter the adjustment
+    int nBlockStart = 0;        // first position of the image's block in the unknown vector
     double P[kMaxUnknowns] = {};
     double adfStart[kMaxUnknowns] = {};              // starting values (P3 ... P7 used)
     double c0 = 0.0, c2 = 0.0, c4 = 0.0, c10 = 0.0;  // 2N, IFOV, centre column and line
@@ -1277,7 +1278,10 @@ void LoadImage(ImageState& sImg, int nImage) {
 
 // Sensor row and the name-derived groups of an image.
 void SetupImage(ImageState& sImg) {
-    sImg.sSetup = SetupFromSensorTable(*sImg.psSeg, sImg.nObservations);
+    // The unknown count follows the observations that enter the adjustment:
+    // counting check observations too would let points that must not change
+    // the solution raise it to more unknowns than the image can determine.
+    sImg.sSetup = SetupFromSensorTable(*sImg.psSeg, sImg.nUsedObservations);
     const ImageSetup& s = sImg.sSetup;
     sImg.bFlat = ShortNameContains(s, "TM") || ShortNameContains(s, "ETM") ||
                  ShortNameContains(s, "IKONOS") || ShortNameContains(s, "L2");
@@ -1489,6 +1493,7 @@ int SRITCalculate_imp(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psE
         }
     }
     sImg.nObservations = nGCP;
+    sImg.nUsedObservations = nGCP;
     SpreadElevations(sAdj, sAdj.asPoints.size());
     PrepareImages(sAdj);
     Adjust(sAdj, "SRITCalculate");
@@ -1662,6 +1667,18 @@ void AddTieObservations(Adjustment& sAdj, const BlockInput& in,
             SPOT1BTo1AControlPoint_imp(in.papsEphemeris, static_cast<int>(k), &sSlot.dfPixel,
                                        &sSlot.dfLine);
         }
+    }
+}
+
+// Control points whose observation in an image enters the adjustment (a
+// point measured twice in one image counts once: its slot holds one).
+void CountUsedObservations(Adjustment& sAdj, std::size_t nControlPoints) {
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        int nUsed = 0;
+        for (std::size_t p = 0; p < nControlPoints; ++p) {
+            nUsed += sAdj.asPoints[p].asSlots[k].nFlag == 1 ? 1 : 0;
+        }
+        sAdj.asImages[k].nUsedObservations = nUsed;
     }
 }
 
@@ -1841,6 +1858,7 @@ int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsMo
     std::vector<std::size_t> anTiePoint;
     AddTieObservations(sAdj, in, mapImages, anTiePoint);
     if (!EnoughPoints(sAdj)) return 0;
+    CountUsedObservations(sAdj, nControlPoints);
 
     SpreadElevations(sAdj, nControlPoints);
     PrepareImages(sAdj);
