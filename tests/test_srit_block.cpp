@@ -247,22 +247,28 @@ TEST(SRITBlock, StereoPairMeetsTheAccuracyTargets) {
     EXPECT_LE(sNoise.dfTieZRms, 15.0);
 }
 
+// The two blocks' models put probe points of the area at the same image
+// positions, to far below a pixel.
+void ExpectSameImagePositions(const Block& sA, const Block& sB) {
+    const std::vector<SimPoint> asProbe = GroundPoints(45.0, 3.0, 20, 5);
+    for (std::size_t k = 0; k < sA.apsModels.size(); ++k) {
+        for (const SimPoint& s : asProbe) {
+            double dfP1 = 0.0, dfL1 = 0.0, dfP2 = 0.0, dfL2 = 0.0;
+            SRITGeo2Img(sA.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP1, &dfL1);
+            SRITGeo2Img(sB.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP2, &dfL2);
+            EXPECT_NEAR(dfP1, dfP2, 1e-4) << "image " << k;
+            EXPECT_NEAR(dfL1, dfL2, 1e-4) << "image " << k;
+        }
+    }
+}
+
 TEST(SRITBlock, CheckObservationsDoNotChangeTheSolution) {
     Block sPlain, sChecked;
     RunStereo(sPlain, 0.0, false);
     RunStereo(sChecked, 0.0, true);
     // The check observations enter only the mean elevation that the tie
     // points start from: the models agree to far below a pixel.
-    const std::vector<SimPoint> asProbe = GroundPoints(45.0, 3.0, 20, 5);
-    for (int k = 0; k < 2; ++k) {
-        for (const SimPoint& s : asProbe) {
-            double dfP1 = 0.0, dfL1 = 0.0, dfP2 = 0.0, dfL2 = 0.0;
-            SRITGeo2Img(sPlain.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP1, &dfL1);
-            SRITGeo2Img(sChecked.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP2, &dfL2);
-            EXPECT_NEAR(dfP1, dfP2, 1e-4);
-            EXPECT_NEAR(dfL1, dfL2, 1e-4);
-        }
-    }
+    ExpectSameImagePositions(sPlain, sChecked);
     // Check points measured in both images are reported too, with the 50 px
     // error showing in their residuals.
     EXPECT_GT(sChecked.nReported, 6);
@@ -280,14 +286,8 @@ TEST(SRITBlock, CheckObservationsDoNotChangeTheSolution) {
     RunStereo(sChecked4, 0.0, true, 4);
     for (int k = 0; k < 2; ++k) {
         EXPECT_EQ(sChecked4.apsModels[k]->adfCoef[19], 0.0);  // P11 not adjusted
-        for (const SimPoint& s : asProbe) {
-            double dfP1 = 0.0, dfL1 = 0.0, dfP2 = 0.0, dfL2 = 0.0;
-            SRITGeo2Img(sPlain4.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP1, &dfL1);
-            SRITGeo2Img(sChecked4.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfP2, &dfL2);
-            EXPECT_NEAR(dfP1, dfP2, 1e-4);
-            EXPECT_NEAR(dfL1, dfL2, 1e-4);
-        }
     }
+    ExpectSameImagePositions(sPlain4, sChecked4);
 }
 
 // One image through the block adjustment is the one-image computation.
