@@ -6,6 +6,7 @@
 #include <string>
 
 #include "cli_error.h"
+#include "json_fields.h"
 #include "lumo_srit.h"
 #include "lumo_types.h"
 #include "model_io.h"
@@ -15,90 +16,77 @@ namespace {
 
 using nlohmann::json;
 
-// A member of an object, or null when absent.
-const json* Member(const json& object, const char* pszName) {
-    const auto it = object.find(pszName);
-    return it == object.end() ? nullptr : &*it;
-}
-
-std::string Where(const std::string& source, const std::string& field) {
-    return source + ": " + field;
-}
-
-std::string Text(const json& object, const char* pszName, const std::string& source,
-                 const std::string& field) {
-    const json* pv = Member(object, pszName);
-    if (pv == nullptr || !pv->is_string()) {
-        LUMO_CLI_FAIL(Where(source, field + "." + pszName) + " must be a text");
-    }
+// An identifier of 1 to SRIT_ID_SIZE characters.
+std::string Text(const json& object, const char* pszName, const FieldContext& ctx) {
+    const json* pv = FindField(object, pszName);
+    if (pv == nullptr || !pv->is_string()) ctx.Fail(pszName, "must be a text");
     std::string text = pv->get<std::string>();
     if (text.empty() || text.size() > static_cast<std::size_t>(SRIT_ID_SIZE)) {
-        LUMO_CLI_FAIL(Where(source, field + "." + pszName) + " " + Quoted(text) +
-                      " must have 1 to " + std::to_string(SRIT_ID_SIZE) + " characters");
+        ctx.Fail(pszName,
+                 Quoted(text) + " must have 1 to " + std::to_string(SRIT_ID_SIZE) + " characters");
     }
     return text;
 }
 
 // A finite number; when bOptional, an absent member or null gives the null value.
-double Number(const json& object, const char* pszName, const std::string& source,
-              const std::string& field, bool bOptional) {
-    const json* pv = Member(object, pszName);
+double Number(const json& object, const char* pszName, const FieldContext& ctx, bool bOptional) {
+    const json* pv = FindField(object, pszName);
     if (bOptional && (pv == nullptr || pv->is_null())) return LUMO_NULL_VALUE;
-    if (pv == nullptr || !pv->is_number()) {
-        LUMO_CLI_FAIL(Where(source, field + "." + pszName) + " must be a number");
-    }
+    if (pv == nullptr || !pv->is_number()) ctx.Fail(pszName, "must be a number");
     const double value = pv->get<double>();
-    if (!std::isfinite(value)) {
-        LUMO_CLI_FAIL(Where(source, field + "." + pszName) + " must be a finite number");
-    }
+    if (!std::isfinite(value)) ctx.Fail(pszName, "must be a finite number");
     return value;
 }
 
-const json& Array(const json& document, const char* pszName, const std::string& source,
+const json& Array(const json& document, const char* pszName, const FieldContext& ctx,
                   bool bOptional) {
     static const json empty = json::array();
-    const json* pv = Member(document, pszName);
+    const json* pv = FindField(document, pszName);
     if (pv == nullptr && bOptional) return empty;
-    if (pv == nullptr || !pv->is_array()) {
-        LUMO_CLI_FAIL(Where(source, pszName) + " must be an array");
-    }
+    if (pv == nullptr || !pv->is_array()) ctx.Fail(pszName, "must be an array");
     return *pv;
 }
 
-void RequireObject(const json& value, const std::string& source, const std::string& field) {
-    if (!value.is_object()) LUMO_CLI_FAIL(Where(source, field) + " must be an object");
+// The context of item i of a list, which must be an object.
+FieldContext ListItem(const json& list, const char* pszList, std::size_t i,
+                      const FieldContext& ctx) {
+    const std::string field = std::string(pszList) + "[" + std::to_string(i) + "]";
+    if (!list[i].is_object()) ctx.Fail(field, "must be an object");
+    return ctx.Child(field);
 }
 
 }  // namespace
 
 BlockProject BlockProjectFromJson(const json& document, const std::string& source,
                                   const std::string& baseDirectory) {
-    RequireObject(document, source, "the document");
-    const json* pFormat = Member(document, "format");
+    // Project messages name a field without the word "field" or quotes:
+    // `file: gcps[3].pixel must be a number`.
+    const FieldContext ctx{source, "", true};
+    if (!document.is_object()) ctx.Fail("the document", "must be an object");
+    const json* pFormat = FindField(document, "format");
     if (pFormat == nullptr || !pFormat->is_string() ||
         pFormat->get<std::string>() != kBlockFormat) {
-        LUMO_CLI_FAIL(Where(source, "format") + " must be " + Quoted(kBlockFormat));
+        ctx.Fail("format", "must be " + Quoted(kBlockFormat));
     }
-    const json* pVersion = Member(document, "version");
+    const json* pVersion = FindField(document, "version");
     if (pVersion == nullptr || !pVersion->is_number_integer() ||
         pVersion->get<int>() != kBlockFormatVersion) {
-        LUMO_CLI_FAIL(Where(source, "version") + " must be " + std::to_string(kBlockFormatVersion));
+        ctx.Fail("version", "must be " + std::to_string(kBlockFormatVersion));
     }
     BlockProject project;
     project.osSource = source;
-    if (const json* pGeosys = Member(document, "geosys")) {
-        if (!pGeosys->is_string()) LUMO_CLI_FAIL(Where(source, "geosys") + " must be a text");
+    if (const json* pGeosys = FindField(document, "geosys")) {
+        if (!pGeosys->is_string()) ctx.Fail("geosys", "must be a text");
         project.osGeosys = pGeosys->get<std::string>();
     }
-    const json& images = Array(document, "images", source, false);
+    const json& images = Array(document, "images", ctx, false);
     for (std::size_t i = 0; i < images.size(); ++i) {
-        const std::string field = "images[" + std::to_string(i) + "]";
-        RequireObject(images[i], source, field);
+        const FieldContext item = ListItem(images, "images", i, ctx);
         BlockImage image;
-        image.osId = Text(images[i], "id", source, field);
-        const json* pSegment = Member(images[i], "segment");
+        image.osId = Text(images[i], "id", item);
+        const json* pSegment = FindField(images[i], "segment");
         if (pSegment == nullptr || !pSegment->is_string() || pSegment->get<std::string>().empty()) {
-            LUMO_CLI_FAIL(Where(source, field + ".segment") + " must name a segment file");
+            item.Fail("segment", "must name a segment file");
         }
         std::filesystem::path path(pSegment->get<std::string>());
         if (path.is_relative() && !baseDirectory.empty()) path = baseDirectory / path;
@@ -107,42 +95,38 @@ BlockProject BlockProjectFromJson(const json& document, const std::string& sourc
     }
     if (project.asImages.empty() ||
         project.asImages.size() > static_cast<std::size_t>(SRIT_MAX_IMAGES)) {
-        LUMO_CLI_FAIL(Where(source, "images") + " must list 1 to " +
-                      std::to_string(SRIT_MAX_IMAGES) + " images, found " +
-                      std::to_string(project.asImages.size()));
+        ctx.Fail("images", "must list 1 to " + std::to_string(SRIT_MAX_IMAGES) + " images, found " +
+                               std::to_string(project.asImages.size()));
     }
-    const json& gcps = Array(document, "gcps", source, false);
+    const json& gcps = Array(document, "gcps", ctx, false);
     for (std::size_t i = 0; i < gcps.size(); ++i) {
-        const std::string field = "gcps[" + std::to_string(i) + "]";
-        RequireObject(gcps[i], source, field);
+        const FieldContext item = ListItem(gcps, "gcps", i, ctx);
         BlockGcp gcp;
-        gcp.osImage = Text(gcps[i], "image", source, field);
-        gcp.osPoint = Text(gcps[i], "point", source, field);
-        gcp.dfPixel = Number(gcps[i], "pixel", source, field, false);
-        gcp.dfLine = Number(gcps[i], "line", source, field, false);
-        gcp.dfX = Number(gcps[i], "x", source, field, false);
-        gcp.dfY = Number(gcps[i], "y", source, field, false);
-        gcp.dfZ = Number(gcps[i], "z", source, field, true);
-        gcp.dfSdX = Number(gcps[i], "sdX", source, field, true);
-        gcp.dfSdY = Number(gcps[i], "sdY", source, field, true);
-        gcp.dfSdZ = Number(gcps[i], "sdZ", source, field, true);
-        if (const json* pCheck = Member(gcps[i], "check")) {
-            if (!pCheck->is_boolean())
-                LUMO_CLI_FAIL(Where(source, field + ".check") + " must be true or false");
+        gcp.osImage = Text(gcps[i], "image", item);
+        gcp.osPoint = Text(gcps[i], "point", item);
+        gcp.dfPixel = Number(gcps[i], "pixel", item, false);
+        gcp.dfLine = Number(gcps[i], "line", item, false);
+        gcp.dfX = Number(gcps[i], "x", item, false);
+        gcp.dfY = Number(gcps[i], "y", item, false);
+        gcp.dfZ = Number(gcps[i], "z", item, true);
+        gcp.dfSdX = Number(gcps[i], "sdX", item, true);
+        gcp.dfSdY = Number(gcps[i], "sdY", item, true);
+        gcp.dfSdZ = Number(gcps[i], "sdZ", item, true);
+        if (const json* pCheck = FindField(gcps[i], "check")) {
+            if (!pCheck->is_boolean()) item.Fail("check", "must be true or false");
             gcp.bCheck = pCheck->get<bool>();
         }
         project.asGcps.push_back(gcp);
     }
-    const json& ties = Array(document, "ties", source, true);
+    const json& ties = Array(document, "ties", ctx, true);
     for (std::size_t i = 0; i < ties.size(); ++i) {
-        const std::string field = "ties[" + std::to_string(i) + "]";
-        RequireObject(ties[i], source, field);
+        const FieldContext item = ListItem(ties, "ties", i, ctx);
         BlockTie tie;
-        tie.osImage = Text(ties[i], "image", source, field);
-        tie.osPoint = Text(ties[i], "point", source, field);
-        tie.dfPixel = Number(ties[i], "pixel", source, field, false);
-        tie.dfLine = Number(ties[i], "line", source, field, false);
-        tie.dfZ = Number(ties[i], "z", source, field, true);
+        tie.osImage = Text(ties[i], "image", item);
+        tie.osPoint = Text(ties[i], "point", item);
+        tie.dfPixel = Number(ties[i], "pixel", item, false);
+        tie.dfLine = Number(ties[i], "line", item, false);
+        tie.dfZ = Number(ties[i], "z", item, true);
         project.asTies.push_back(tie);
     }
     return project;

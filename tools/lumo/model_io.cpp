@@ -1,14 +1,13 @@
 #include "model_io.h"
 
-#include <cmath>
 #include <cstdio>
-#include <cstring>
 #include <fstream>
 #include <limits>
 #include <sstream>
 
 #include "ap_io.h"
 #include "cli_error.h"
+#include "json_fields.h"
 #include "nova/projection.h"
 #include "rf_io.h"
 #include "srit_io.h"
@@ -19,80 +18,21 @@ namespace {
 
 using nlohmann::json;
 
-// The section of a document being read, for messages: the file and the path
-// of the enclosing object ("poly").
-struct JsonContext {
-    const std::string& osSource;
-    std::string osPath;
-
-    std::string Field(const char* name) const {
-        return osPath.empty() ? std::string(name) : osPath + "." + name;
-    }
-    [[noreturn]] void Fail(const char* name, const std::string& problem) const {
-        LUMO_CLI_FAIL(osSource + ": field " + Quoted(Field(name)) + " " + problem);
-    }
-};
-
-const json& RequireField(const json& object, const char* name, const JsonContext& ctx) {
-    const auto it = object.find(name);
-    if (it == object.end()) ctx.Fail(name, "is missing");
-    return *it;
-}
-
-std::string GetString(const json& object, const char* name, const JsonContext& ctx) {
-    const json& value = RequireField(object, name, ctx);
-    if (!value.is_string()) ctx.Fail(name, "must be a text, found " + value.dump());
-    return value.get<std::string>();
-}
-
-int GetInt(const json& object, const char* name, int minimum, int maximum, const JsonContext& ctx) {
-    const json& value = RequireField(object, name, ctx);
-    if (!value.is_number_integer()) ctx.Fail(name, "must be an integer, found " + value.dump());
-    const bool fitsSigned = !value.is_number_unsigned() ||
-                            value.get<std::uint64_t>() <= std::numeric_limits<std::int64_t>::max();
-    const std::int64_t n = fitsSigned ? value.get<std::int64_t>() : maximum + std::int64_t{1};
-    if (n < minimum || n > maximum) {
-        ctx.Fail(name, "must lie in " + std::to_string(minimum) + ".." + std::to_string(maximum) +
-                           ", found " + value.dump());
-    }
-    return static_cast<int>(n);
-}
-
-void GetCoefficients(const json& object, const char* name, int count, double* target,
-                     const JsonContext& ctx) {
-    const json& value = RequireField(object, name, ctx);
-    if (!value.is_array()) ctx.Fail(name, "must be an array of numbers, found " + value.dump());
-    if (value.size() != static_cast<std::size_t>(count)) {
-        ctx.Fail(name, "must hold " + std::to_string(count) + " numbers (nCoeffs), found " +
-                           std::to_string(value.size()));
-    }
-    for (int k = 0; k < count; ++k) {
-        const json& item = value[static_cast<std::size_t>(k)];
-        const double number = item.is_number() ? item.get<double>() : std::nan("");
-        if (!std::isfinite(number)) {
-            ctx.Fail(name, "item " + std::to_string(k) + " must be a finite number, found " +
-                               item.dump());
-        }
-        target[k] = number;
-    }
-}
-
 ModelEnvelope ReadEnvelope(const json& document, const std::string& source) {
-    const JsonContext ctx{source, ""};
+    const FieldContext ctx{source, ""};
     if (!document.is_object()) {
         LUMO_CLI_FAIL(source + ": a model file must hold a JSON object");
     }
-    const std::string format = GetString(document, "format", ctx);
+    const std::string format = GetText(document, "format", ctx);
     if (format != kModelFormat) {
         ctx.Fail("format", "must be " + Quoted(kModelFormat) + ", found " + Quoted(format));
     }
     GetInt(document, "version", kModelFormatVersion, kModelFormatVersion, ctx);
     ModelEnvelope envelope;
     envelope.osSource = source;
-    envelope.osFamily = GetString(document, "family", ctx);
-    envelope.osGeosys = GetString(document, "geosys", ctx);
-    if (document.contains("projParms"))
-        envelope.osProjParms = GetString(document, "projParms", ctx);
+    envelope.osFamily = GetText(document, "family", ctx);
+    envelope.osGeosys = GetText(document, "geosys", ctx);
+    if (document.contains("projParms")) envelope.osProjParms = GetText(document, "projParms", ctx);
     envelope.nPixels = GetInt(document, "pixels", 0, std::numeric_limits<int>::max(), ctx);
     envelope.nLines = GetInt(document, "lines", 0, std::numeric_limits<int>::max(), ctx);
     return envelope;
@@ -100,18 +40,6 @@ ModelEnvelope ReadEnvelope(const json& document, const std::string& source) {
 
 std::shared_ptr<void> ReadPolyRecord(const ModelEnvelope& envelope, const json& section) {
     return SharePolyRecord(PolyFromJson(envelope, section));
-}
-
-json CoefficientArray(const double* coeffs, int count, const char* name) {
-    json array = json::array();
-    for (int k = 0; k < count; ++k) {
-        if (!std::isfinite(coeffs[k])) {
-            LUMO_CLI_FAIL(std::string("cannot write model: coefficient ") + std::to_string(k) +
-                          " of " + Quoted(name) + " is not finite");
-        }
-        array.push_back(coeffs[k]);
-    }
-    return array;
 }
 
 }  // namespace
@@ -146,9 +74,8 @@ LoadedModel ReadModel(const json& document, const std::string& source) {
     model.sEnvelope = ReadEnvelope(document, source);
     for (const ModelFamilyCodec& codec : ModelFamilies()) {
         if (model.sEnvelope.osFamily != codec.pszFamily) continue;
-        const JsonContext ctx{source, ""};
-        const json& section = RequireField(document, codec.pszFamily, ctx);
-        if (!section.is_object()) ctx.Fail(codec.pszFamily, "must be a JSON object");
+        const FieldContext ctx{source, ""};
+        const json& section = RequireObjectField(document, codec.pszFamily, ctx);
         model.nModelCode = codec.nModelCode;
         model.poRecord = codec.pfnRead(model.sEnvelope, section);
         return model;
@@ -178,21 +105,20 @@ void EnvelopeToProjInfo(const ModelEnvelope& envelope, ProjInfo_t* psProjInfo) {
 }
 
 PolyPtr PolyFromJson(const ModelEnvelope& envelope, const json& section) {
-    const JsonContext ctx{envelope.osSource, "poly"};
-    // The record keeps the text in a fixed buffer; a longer one would be cut.
-    if (envelope.osGeosys.size() >= static_cast<std::size_t>(POLY_GEOSYS_SIZE)) {
-        LUMO_CLI_FAIL(envelope.osSource + ": field \"geosys\": " + Quoted(envelope.osGeosys) +
-                      " is longer than " + std::to_string(POLY_GEOSYS_SIZE - 1) + " characters");
-    }
+    const FieldContext ctx{envelope.osSource, "poly"};
     PolyPtr poly(POLYAllocate());
+    // The record keeps the text in a fixed buffer; a longer one would be cut.
+    CopyText(envelope.osGeosys, poly->pszGeosys, POLY_GEOSYS_SIZE, "geosys",
+             FieldContext{envelope.osSource, ""});
     poly->nCoeffs = GetInt(section, "nCoeffs", 1, POLY_MAX_COEFFS, ctx);
     poly->nPixels = envelope.nPixels;
     poly->nLines = envelope.nLines;
-    GetCoefficients(section, "pixelCoeffs", poly->nCoeffs, poly->padfPixelCoeffs, ctx);
-    GetCoefficients(section, "lineCoeffs", poly->nCoeffs, poly->padfLineCoeffs, ctx);
-    GetCoefficients(section, "xCoeffs", poly->nCoeffs, poly->padfXCoeffs, ctx);
-    GetCoefficients(section, "yCoeffs", poly->nCoeffs, poly->padfYCoeffs, ctx);
-    std::memcpy(poly->pszGeosys, envelope.osGeosys.c_str(), envelope.osGeosys.size() + 1);
+    const auto count = static_cast<std::size_t>(poly->nCoeffs);
+    const ArrayFormat format{ArrayWording::kTypeThenLength, ItemWording::kItemWord, " (nCoeffs)"};
+    GetFiniteArray(section, "pixelCoeffs", count, poly->padfPixelCoeffs, ctx, format);
+    GetFiniteArray(section, "lineCoeffs", count, poly->padfLineCoeffs, ctx, format);
+    GetFiniteArray(section, "xCoeffs", count, poly->padfXCoeffs, ctx, format);
+    GetFiniteArray(section, "yCoeffs", count, poly->padfYCoeffs, ctx, format);
     EnvelopeToProjInfo(envelope, poly->psProjInfo);
     return poly;
 }
@@ -218,16 +144,19 @@ json PolyToJson(const POLYInfo_t& poly) {
         LUMO_CLI_FAIL("cannot write model: nCoeffs " + std::to_string(poly.nCoeffs) +
                       " lies outside 1.." + std::to_string(POLY_MAX_COEFFS));
     }
-    // The buffer need not be terminated within its size; never read past it.
-    const std::string geosys(poly.pszGeosys, strnlen(poly.pszGeosys, POLY_GEOSYS_SIZE - 1));
+    const std::string geosys = BufferText(poly.pszGeosys, POLY_GEOSYS_SIZE - 1);
     json document =
         MakeEnvelope("poly", geosys.c_str(), poly.psProjInfo, poly.nPixels, poly.nLines);
     json section = json::object();
     section["nCoeffs"] = poly.nCoeffs;
-    section["pixelCoeffs"] = CoefficientArray(poly.padfPixelCoeffs, poly.nCoeffs, "pixelCoeffs");
-    section["lineCoeffs"] = CoefficientArray(poly.padfLineCoeffs, poly.nCoeffs, "lineCoeffs");
-    section["xCoeffs"] = CoefficientArray(poly.padfXCoeffs, poly.nCoeffs, "xCoeffs");
-    section["yCoeffs"] = CoefficientArray(poly.padfYCoeffs, poly.nCoeffs, "yCoeffs");
+    section["pixelCoeffs"] =
+        FiniteNumberArray(poly.padfPixelCoeffs, poly.nCoeffs, ItemOf("coefficient", "pixelCoeffs"));
+    section["lineCoeffs"] =
+        FiniteNumberArray(poly.padfLineCoeffs, poly.nCoeffs, ItemOf("coefficient", "lineCoeffs"));
+    section["xCoeffs"] =
+        FiniteNumberArray(poly.padfXCoeffs, poly.nCoeffs, ItemOf("coefficient", "xCoeffs"));
+    section["yCoeffs"] =
+        FiniteNumberArray(poly.padfYCoeffs, poly.nCoeffs, ItemOf("coefficient", "yCoeffs"));
     document["poly"] = std::move(section);
     return document;
 }
@@ -239,9 +168,8 @@ PolyPtr ReadPolyModelFile(const std::string& path) {
         LUMO_CLI_FAIL(path + ": holds a " + Quoted(envelope.osFamily) +
                       " model, not a polynomial model");
     }
-    const JsonContext ctx{path, ""};
-    const json& section = RequireField(document, "poly", ctx);
-    if (!section.is_object()) ctx.Fail("poly", "must be a JSON object");
+    const FieldContext ctx{path, ""};
+    const json& section = RequireObjectField(document, "poly", ctx);
     return PolyFromJson(envelope, section);
 }
 

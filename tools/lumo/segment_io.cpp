@@ -12,6 +12,7 @@
 #include <sstream>
 
 #include "cli_error.h"
+#include "json_fields.h"
 #include "model_io.h"
 #include "nova/runtime.h"
 
@@ -276,24 +277,15 @@ int HexDigit(char c) {
 
 // Reading: every failure names the file and the field.
 struct Reader {
-    const std::string& osSource;
+    FieldContext sContext;  // top level: fields are named by their full path
 
     [[noreturn]] void Fail(const std::string& osField, const std::string& osProblem) const {
-        LUMO_CLI_FAIL(osSource + ": field " + Quoted(osField) + " " + osProblem);
+        sContext.Fail(osField, osProblem);
     }
 
     std::int64_t Integer(const Json& value, const std::string& osField, std::int64_t nMin,
                          std::int64_t nMax) const {
-        if (!value.is_number_integer()) Fail(osField, "must be an integer, found " + value.dump());
-        const bool bFits = !value.is_number_unsigned() ||
-                           value.get<std::uint64_t>() <=
-                               static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max());
-        const std::int64_t n = bFits ? value.get<std::int64_t>() : nMax;
-        if (!bFits || n < nMin || n > nMax) {
-            Fail(osField, "must lie in " + std::to_string(nMin) + ".." + std::to_string(nMax) +
-                              ", found " + value.dump());
-        }
-        return n;
+        return IntegerValue(value, osField, nMin, nMax, sContext);
     }
 
     double Number(const Json& value, const std::string& osField) const {
@@ -514,17 +506,15 @@ void ReadOrbitData(const Json& object, const Reader& sReader, EphemerisSeg_t* ps
 }
 
 void CheckEnvelope(const Json& document, const Reader& sReader) {
-    const auto itFormat = document.find("format");
-    if (itFormat == document.end()) sReader.Fail("format", "is missing");
-    if (*itFormat != kSegmentFormat) {
-        sReader.Fail("format", std::string("must be ") + Quoted(kSegmentFormat) + ", found " +
-                                   itFormat->dump());
+    const Json& format = RequireField(document, "format", sReader.sContext);
+    if (format != kSegmentFormat) {
+        sReader.Fail("format",
+                     std::string("must be ") + Quoted(kSegmentFormat) + ", found " + format.dump());
     }
-    const auto itVersion = document.find("version");
-    if (itVersion == document.end()) sReader.Fail("version", "is missing");
-    if (sReader.Integer(*itVersion, "version", 1, 1000) != kSegmentFormatVersion) {
+    const Json& version = RequireField(document, "version", sReader.sContext);
+    if (sReader.Integer(version, "version", 1, 1000) != kSegmentFormatVersion) {
         sReader.Fail("version", "must be " + std::to_string(kSegmentFormatVersion) + ", found " +
-                                    itVersion->dump());
+                                    version.dump());
     }
 }
 
@@ -688,7 +678,7 @@ void AppendFormatted(const Json& value, int nIndent, std::string* posOut) {
 }  // namespace
 
 SegmentPtr SegmentFromJson(const Json& document, const std::string& source) {
-    const Reader sReader{source};
+    const Reader sReader{FieldContext{source, ""}};
     if (!document.is_object()) LUMO_CLI_FAIL(source + ": a segment file must hold a JSON object");
     CheckEnvelope(document, sReader);
     SegmentPtr poSeg(static_cast<EphemerisSeg_t*>(HCalloc(1, sizeof(EphemerisSeg_t))));
@@ -739,15 +729,13 @@ std::string DescribeSegment(const EphemerisSeg_t& segment) {
     EphemerisSeg_t sCopy = segment;  // GetSensor takes a non-const record
     const int nSensor = GetSensor(&sCopy);
     std::ostringstream os;
-    const std::string osName(segment.szSensorName,
-                             strnlen(segment.szSensorName, sizeof(segment.szSensorName)));
+    const std::string osName = BufferText(segment.szSensorName, sizeof(segment.szSensorName));
     os << "sensor: " << Quoted(osName) << ", sensor code " << nSensor << ", model class "
        << GetModel(nSensor) << '\n';
     os << "image: " << segment.nNumPixels << " pixels x " << segment.nNumLines << " lines";
     os << ", pixel " << segment.dfPixelRes << " m, line " << segment.dfLineRes << " m\n";
-    const std::string osGeosys(segment.szGeosys, strnlen(segment.szGeosys, EPH_GEOSYS_SIZE));
-    const std::string osDate(segment.szAcquisitionDate,
-                             strnlen(segment.szAcquisitionDate, EPH_DATE_SIZE));
+    const std::string osGeosys = BufferText(segment.szGeosys, EPH_GEOSYS_SIZE);
+    const std::string osDate = BufferText(segment.szAcquisitionDate, EPH_DATE_SIZE);
     os << "acquired: " << Quoted(osDate) << ", georeferencing " << Quoted(osGeosys) << '\n';
     const int nKind = segment.nOrbitType;
     os << "orbit data: kind " << nKind;
