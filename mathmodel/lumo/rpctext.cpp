@@ -177,7 +177,9 @@ void RequireComplete(const RpcValues& values, const std::string& osSource, bool 
             if (values.aanCoeffLine[nList][i] != 0) continue;
             std::string osKey = bTxt ? kTxtListPrefixes[nList] : kRpbListKeys[nList];
             if (bTxt) osKey += std::to_string(i + 1);
-            RPC_FAIL(osSource + ": key \"" + osKey + "\" is missing");
+            std::string osMessage = osSource;
+            osMessage.append(": key \"").append(osKey).append("\" is missing");
+            RPC_FAIL(osMessage);
         }
     }
 }
