@@ -9,22 +9,16 @@
 #include <vector>
 
 #include "lumo.h"
+#include "support/model_records.h"
 
 namespace {
 
-struct ApDeleter {
-    void operator()(APInfo_t* p) const { APDeallocate(p); }
-};
-using ApPtr = std::unique_ptr<APInfo_t, ApDeleter>;
+using lumo::support::ApPtr;
 
 constexpr int kPoints = 4096;
 
 ApPtr FramePhoto() {
     ApPtr ap(APAllocate());
-    ap->dfFocalLength = 153.0;
-    ap->dfCameraX = 500000.0;
-    ap->dfCameraY = 4000000.0;
-    ap->dfCameraZ = 1650.0;
     // omega 0.4 deg, phi -0.7 deg, kappa 1.9 deg
     const double R[9] = {0.99939199761134556,   0.032365470765528086,   0.012965778516156804,
                          -0.032454788105201943, 0.99945048866845776,    0.0067385035005881281,
@@ -34,19 +28,11 @@ ApPtr FramePhoto() {
     const double det = d[1] * d[6] - d[2] * d[5];
     const double a = d[6] / det, b = -d[2] / det, c = -d[5] / det, e = d[1] / det;
     const double inv[8] = {-(a * d[0] + b * d[4]), a, b, 0.0, -(c * d[0] + e * d[4]), c, e, 0.0};
-    for (int i = 0; i < 8; ++i) {
-        ap->adfPhotoToImage[i] = d[i];
-        ap->adfImageToPhoto[i] = inv[i];
-    }
-    ap->dfPrincipalX = 0.012;
-    ap->dfPrincipalY = -0.008;
-    ap->adfRadial[3] = 5.2e-9;
-    ap->adfRadial[5] = -1.55e-13;
-    ap->adfDecentering[0] = 4.8e-8;
-    ap->adfDecentering[1] = -3.1e-8;
-    ap->dfEarthRadius = 6371000.0;
-    ap->bPrincipalPoint = ap->bRadialDistortion = ap->bDecentering = 1;
-    ap->bEarthCurvature = ap->bRefraction = 1;
+    lumo::support::SetFiducials(*ap, d, inv);
+    // f, camera X/Y/Z, principal point, k3, k5, p1, p2, Earth radius; every
+    // correction on.
+    lumo::support::SetFrameCamera(*ap, {153.0, 500000.0, 4000000.0, 1650.0, 0.012, -0.008, 5.2e-9,
+                                        -1.55e-13, 4.8e-8, -3.1e-8, 6371000.0, 31u});
     return ap;
 }
 

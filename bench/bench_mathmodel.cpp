@@ -10,18 +10,15 @@
 
 #include "lumo.h"
 #include "nova/projection.h"
+#include "support/model_records.h"
 
 namespace {
 
 constexpr std::size_t kPoints = 4096;
 constexpr const char* kGeosys = "UTM 31 U D000";
 
-struct PolyDeleter {
-    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
-};
-struct TpsDeleter {
-    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
-};
+using lumo::support::PolyPtr;
+using lumo::support::TpsPtr;
 
 struct Points {
     std::vector<double> x, y;
@@ -39,8 +36,8 @@ Points GroundPoints(std::size_t n, unsigned seed) {
 }
 
 // A third-order polynomial over a UTM 31 scene (the bundled example's size).
-std::unique_ptr<POLYInfo_t, PolyDeleter> MakePoly() {
-    std::unique_ptr<POLYInfo_t, PolyDeleter> p(POLYAllocate());
+PolyPtr MakePoly() {
+    PolyPtr p(POLYAllocate());
     p->nCoeffs = 10;
     p->nPixels = p->nLines = 6000;
     const double pixel[10] = {-44000.0, 0.1, 1e-3, 1e-12, 1e-12, 1e-12, 0, 0, 0, 0};
@@ -53,8 +50,8 @@ std::unique_ptr<POLYInfo_t, PolyDeleter> MakePoly() {
 }
 
 // A spline through `n` control points spread over the same scene.
-std::unique_ptr<TPSMInfo_t, TpsDeleter> MakeTps(int n) {
-    std::unique_ptr<TPSMInfo_t, TpsDeleter> t(TPSAllocate(nullptr));
+TpsPtr MakeTps(int n) {
+    TpsPtr t(TPSAllocate(nullptr));
     Points g = GroundPoints(static_cast<std::size_t>(n), 11);
     std::vector<double> pixel, line;
     for (int i = 0; i < n; ++i) {

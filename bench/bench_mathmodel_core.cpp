@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "nova/mathmodel_core.h"
+#include "support/model_stubs.h"
 
 namespace nm = nova::mathmodel;
 
@@ -19,31 +20,12 @@ constexpr int kSize = 1000;
 
 // Smooth analytic image -> ground mapping; nRepeat > 1 makes each point cost
 // about as much as a rigorous sensor model.
-class AnalyticModel : public nm::IMathModel {
+class AnalyticModel : public lumo::support::PointDrivenModel {
   public:
-    explicit AnalyticModel(int nRepeat) : mnRepeat(nRepeat) {}
+    explicit AnalyticModel(int nRepeat)
+        : PointDrivenModel("Analytic", nm::MM_TYPE_USER, kSize, kSize, true), mnRepeat(nRepeat) {}
 
-    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
-    nm::MathModelType GetModelType() const override { return nm::MM_TYPE_USER; }
-    std::string GetModelName() const override { return "Analytic"; }
-    int GetNumColumns() const override { return kSize; }
-    int GetNumRows() const override { return kSize; }
-    int GetDownsampleFactor() const override { return 1; }
-    int GetMinValidHeight(double&) const override { return -1; }
-    int GetMaxValidHeight(double&) const override { return -1; }
-    bool IsHeightDependent() const override { return true; }
-    bool IsEqual(const IMathModel* poOther) const override { return poOther == this; }
-    int ImageToGround(int nCols, int nRows, int nStep, const float* pafA, const float* pafB,
-                      const float* pafZ, float* pafOut1, float* pafOut2, unsigned char* pabyValid,
-                      double dfO1, double dfO2, double dfS1, double dfS2, double dfTol,
-                      bool bFlag) const override {
-        return nm::ImageToGround(this, nCols, nRows, nStep, pafA, pafB, pafZ, pafOut1, pafOut2,
-                                 pabyValid, dfO1, dfO2, dfS1, dfS2, dfTol, bFlag);
-    }
-    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfIn, double* padfX,
-                      double* padfY, int* panValid, bool bFlag) const override {
-        return nm::ImageToGround(this, dfLine, dfZ, nCount, padfIn, padfX, padfY, panValid, bFlag);
-    }
+    using PointDrivenModel::ImageToGround;
     int ImageToGround(double u, double v, double z, double& x, double& y, bool) const override {
         double dfWobble = 0.0;
         for (int i = 0; i < mnRepeat; ++i) dfWobble += std::sin(u / (250.0 + i)) * 1e-3;
@@ -52,29 +34,15 @@ class AnalyticModel : public nm::IMathModel {
         y = 9000.0 - 2.0 * v + 0.2 * u + 2e-5 * u * u + 4.0 * std::cos(v / 300.0) - 0.003 * z;
         return 0;
     }
-    int GroundToImage(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double, bool) const override {
-        return -1;
-    }
-    int GroundToImage(double, double, int, const double*, double*, double*, int*,
-                      bool) const override {
-        return -1;
-    }
-    int GroundToImage(double, double, double, double&, double&, bool) const override { return -1; }
-    IMathModel* Clone() const override { return new AnalyticModel(mnRepeat); }
-    void SetDownsampleFactor(int) override {}
+    IMathModel* Clone() const override { return new AnalyticModel(*this); }
 
   private:
     int mnRepeat;
 };
 
+// Smooth hills without a step.
 std::vector<float> Terrain() {
-    std::vector<float> afZ(static_cast<std::size_t>(kSize) * kSize);
-    for (int r = 0; r < kSize; ++r)
-        for (int c = 0; c < kSize; ++c)
-            afZ[static_cast<std::size_t>(r) * kSize + c] =
-                static_cast<float>(300.0 + 200.0 * std::sin(c / 37.0) * std::cos(r / 53.0));
-    return afZ;
+    return lumo::support::HillTerrain(kSize, kSize, 0.0);
 }
 
 // Arguments: repeat count of the model, then whether a terrain is given.

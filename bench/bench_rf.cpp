@@ -10,24 +10,16 @@
 #include <vector>
 
 #include "lumo_rf.h"
+#include "support/model_records.h"
 
 namespace {
 
-using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
+using lumo::support::RfPtr;
 
 // A scene model with every term in use and first-order denominators.
-RecordPtr SceneModel() {
-    RecordPtr psRF(RFAllocate(nullptr, RF_MAX_TERMS), &RFDeallocate);
-    psRF->dfXOffset = 7.45;
-    psRF->dfXScale = 0.16;
-    psRF->dfYOffset = 46.95;
-    psRF->dfYScale = 0.11;
-    psRF->dfZOffset = 800.0;
-    psRF->dfZScale = 500.0;
-    psRF->dfPixelOffset = 5074.5;
-    psRF->dfPixelScale = 5000.0;
-    psRF->dfLineOffset = 4961.5;
-    psRF->dfLineScale = 5000.0;
+RfPtr SceneModel() {
+    RfPtr psRF = lumo::support::AllocateRf(RF_MAX_TERMS);
+    lumo::support::SetRfSceneFrame(*psRF);
     for (int i = 0; i < RF_MAX_TERMS; ++i) {
         psRF->padfPixelNum[i] = 1e-4 / (i + 1);
         psRF->padfLineNum[i] = -1e-4 / (i + 2);
@@ -60,7 +52,7 @@ std::vector<GroundPoint> CubePoints(const RFInfo_t& rf, std::size_t count) {
 constexpr std::size_t kPoints = 4096;
 
 void BM_RFGeo2Img(benchmark::State& state) {
-    RecordPtr psRF = SceneModel();
+    RfPtr psRF = SceneModel();
     const std::vector<GroundPoint> points = CubePoints(*psRF, kPoints);
     for (auto _ : state) {
         for (const GroundPoint& p : points) {
@@ -79,7 +71,7 @@ struct ImagePoint {
 };
 
 void BM_RFImg2Geo(benchmark::State& state) {
-    RecordPtr psRF = SceneModel();
+    RfPtr psRF = SceneModel();
     std::vector<ImagePoint> images;
     for (const GroundPoint& p : CubePoints(*psRF, kPoints)) {
         ImagePoint i{0.0, 0.0, p.z};
@@ -101,7 +93,7 @@ BENCHMARK(BM_RFImg2Geo);
 // Largest ground error of ground -> image -> ground over the cube, reported
 // as a counter (degrees).
 void BM_RFRoundTripError(benchmark::State& state) {
-    RecordPtr psRF = SceneModel();
+    RfPtr psRF = SceneModel();
     const std::vector<GroundPoint> points = CubePoints(*psRF, kPoints);
     double worst = 0.0;
     for (auto _ : state) {

@@ -21,6 +21,7 @@
 #include "points_io.h"
 #include "projection.h"
 #include "runtime.h"
+#include "support/model_records.h"
 
 namespace {
 
@@ -30,10 +31,7 @@ using nlohmann::json;
 const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 constexpr double kNull = LUMO_NULL_VALUE;
 
-void SetFiducials(APInfo_t& ap, const double (&d)[8], const double (&e)[8]) {
-    std::memcpy(ap.adfPhotoToImage, d, sizeof d);
-    std::memcpy(ap.adfImageToPhoto, e, sizeof e);
-}
+using lumo::support::SetFiducials;
 
 // The vertical photo of the simplest case: R = I, camera at (0, 0, 1000),
 // f = 0.15, identity fiducial transforms, no corrections.
@@ -57,10 +55,6 @@ Eigen::Matrix3d Rotation(double omega, double phi, double kappa) {
 // slightly rotated, affine fiducial transforms that invert each other.
 ApPtr FramePhoto(unsigned nFlags) {
     ApPtr ap(APAllocate());
-    ap->dfFocalLength = 153.0;
-    ap->dfCameraX = 500000.0;
-    ap->dfCameraY = 4000000.0;
-    ap->dfCameraZ = 1650.0;
     const Eigen::Matrix3d R = Rotation(0.012, -0.02, 0.4);
     for (int i = 0; i < 9; ++i) ap->adfRotation[i] = R(i / 3, i % 3);
     Eigen::Matrix2d A;
@@ -70,18 +64,9 @@ ApPtr FramePhoto(unsigned nFlags) {
     const Eigen::Vector2d b = -B * c;
     SetFiducials(*ap, {c(0), A(0, 0), A(0, 1), 0, c(1), A(1, 0), A(1, 1), 0},
                  {b(0), B(0, 0), B(0, 1), 0, b(1), B(1, 0), B(1, 1), 0});
-    ap->dfPrincipalX = 0.015;
-    ap->dfPrincipalY = -0.01;
-    ap->adfRadial[3] = 5e-9;
-    ap->adfRadial[5] = -1.5e-13;
-    ap->adfDecentering[0] = 5e-8;
-    ap->adfDecentering[1] = -3e-8;
-    ap->dfEarthRadius = 6371000.0;
-    ap->bPrincipalPoint = (nFlags & 1u) ? 1 : 0;
-    ap->bRadialDistortion = (nFlags & 2u) ? 1 : 0;
-    ap->bDecentering = (nFlags & 4u) ? 1 : 0;
-    ap->bEarthCurvature = (nFlags & 8u) ? 1 : 0;
-    ap->bRefraction = (nFlags & 16u) ? 1 : 0;
+    // f, camera X/Y/Z, principal point, k3, k5, p1, p2, Earth radius.
+    lumo::support::SetFrameCamera(*ap, {153.0, 500000.0, 4000000.0, 1650.0, 0.015, -0.01, 5e-9,
+                                        -1.5e-13, 5e-8, -3e-8, 6371000.0, nFlags});
     return ap;
 }
 

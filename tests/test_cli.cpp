@@ -20,6 +20,7 @@
 #include "nova/projection.h"
 #include "nova/runtime.h"
 #include "points_io.h"
+#include "support/cli_runner.h"
 
 namespace fs = std::filesystem;
 using lumo::cli::PointKind;
@@ -31,47 +32,14 @@ const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 const std::string kModel = kExamples + "/poly_utm31.json";
 const std::string kGcps = kExamples + "/poly_utm31_gcps.csv";
 
-// A scratch directory removed with the fixture.
-class CliTest : public ::testing::Test {
+using lumo::support::ReadText;
+using lumo::support::RunResult;
+using lumo::support::RunTool;
+
+class CliTest : public lumo::support::ScratchDirTest {
   protected:
-    void SetUp() override {
-        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
-        mDir = fs::temp_directory_path() /
-               ("lumo_cli_" + std::string(info->name()) + "_" + std::to_string(::getpid()));
-        fs::create_directories(mDir);
-    }
-    void TearDown() override { fs::remove_all(mDir); }
-
-    std::string Write(const std::string& name, const std::string& text) const {
-        std::string path = (mDir / name).string();
-        std::ofstream(path, std::ios::binary) << text;
-        return path;
-    }
-    fs::path mDir;
+    CliTest() : ScratchDirTest("lumo_cli_") {}
 };
-
-struct RunResult {
-    int nCode;
-    std::string osOut;
-    std::string osErr;
-};
-
-RunResult RunTool(std::vector<std::string> args) {
-    args.insert(args.begin(), "lumo");
-    std::vector<char*> argv;
-    argv.reserve(args.size());
-    for (auto& a : args) argv.push_back(a.data());
-    std::ostringstream out, err;
-    const int code = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
-    return {code, out.str(), err.str()};
-}
-
-std::string ReadText(const std::string& path) {
-    std::ifstream in(path);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
 
 // The message of the nova::DataException that `action` throws.
 std::string FailureOf(const std::function<void()>& action) {

@@ -22,6 +22,7 @@
 #include "model_io.h"
 #include "nova/runtime.h"
 #include "points_io.h"
+#include "support/cli_runner.h"
 #include "tps_io.h"
 
 namespace fs = std::filesystem;
@@ -34,45 +35,14 @@ const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 const std::string kGcps = kExamples + "/poly_utm31_gcps.csv";
 constexpr const char* kGeosys = "UTM 31 U D000";
 
-class FitTest : public ::testing::Test {
+using lumo::support::ReadText;
+using lumo::support::RunResult;
+using lumo::support::RunTool;
+
+class FitTest : public lumo::support::ScratchDirTest {
   protected:
-    void SetUp() override {
-        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
-        mDir = fs::temp_directory_path() /
-               ("lumo_fit_" + std::string(info->name()) + "_" + std::to_string(::getpid()));
-        fs::create_directories(mDir);
-    }
-    void TearDown() override { fs::remove_all(mDir); }
-    std::string Path(const std::string& name) const { return (mDir / name).string(); }
-    std::string Write(const std::string& name, const std::string& text) const {
-        std::ofstream(Path(name), std::ios::binary) << text;
-        return Path(name);
-    }
-    fs::path mDir;
+    FitTest() : ScratchDirTest("lumo_fit_") {}
 };
-
-struct RunResult {
-    int nCode;
-    std::string osOut;
-    std::string osErr;
-};
-
-RunResult RunTool(std::vector<std::string> args) {
-    args.insert(args.begin(), "lumo");
-    std::vector<char*> argv;
-    argv.reserve(args.size());
-    for (auto& a : args) argv.push_back(a.data());
-    std::ostringstream out, err;
-    const int code = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
-    return {code, out.str(), err.str()};
-}
-
-std::string ReadText(const std::string& path) {
-    std::ifstream in(path);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
 
 // A number that follows `label` in the text (e.g. "rms dpixel 1.2e-05").
 double NumberAfter(const std::string& text, const std::string& label) {

@@ -5,39 +5,24 @@
 
 #include "lumo.h"
 #include "mathmodel_core.h"
+#include "support/model_stubs.h"
 
 namespace {
 
 using nova::mathmodel::IMathModel;
 
 // A model object that records its point calls and fails on request.
-class RecordingModel : public IMathModel {
+class RecordingModel : public lumo::support::StubModel {
   public:
+    RecordingModel() : StubModel("recording", nova::mathmodel::MM_TYPE_USER, 0, 0, true) {}
+
     mutable int mnImageToGround = 0;
     mutable int mnGroundToImage = 0;
     mutable double mdfLastZ = 0.0;
     int mnResult = 0;
 
-    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
-    nova::mathmodel::MathModelType GetModelType() const override {
-        return nova::mathmodel::MM_TYPE_USER;
-    }
-    std::string GetModelName() const override { return "recording"; }
-    int GetNumColumns() const override { return 0; }
-    int GetNumRows() const override { return 0; }
-    int GetDownsampleFactor() const override { return 1; }
-    int GetMinValidHeight(double&) const override { return -1; }
-    int GetMaxValidHeight(double&) const override { return -1; }
-    bool IsHeightDependent() const override { return true; }
-    bool IsEqual(const IMathModel* p) const override { return p == this; }
-    int ImageToGround(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double, bool) const override {
-        return -1;
-    }
-    int ImageToGround(double, double, int, const double*, double*, double*, int*,
-                      bool) const override {
-        return -1;
-    }
+    using StubModel::GroundToImage;
+    using StubModel::ImageToGround;
     int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
                       bool) const override {
         ++mnImageToGround;
@@ -45,14 +30,6 @@ class RecordingModel : public IMathModel {
         dfX = dfPixel * 2.0;
         dfY = dfLine * 3.0;
         return mnResult;
-    }
-    int GroundToImage(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double, bool) const override {
-        return -1;
-    }
-    int GroundToImage(double, double, int, const double*, double*, double*, int*,
-                      bool) const override {
-        return -1;
     }
     int GroundToImage(double dfX, double dfY, double dfZ, double& dfPixel, double& dfLine,
                       bool) const override {
@@ -63,7 +40,6 @@ class RecordingModel : public IMathModel {
         return mnResult;
     }
     IMathModel* Clone() const override { return new RecordingModel(*this); }
-    void SetDownsampleFactor(int) override {}
 };
 
 TEST(Dispatch, UnknownCodesFailWithoutTouchingAnything) {

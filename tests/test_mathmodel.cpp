@@ -15,6 +15,8 @@
 #include "nova/crs.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
+#include "support/model_records.h"
+#include "support/model_stubs.h"
 
 namespace nova {
 namespace mathmodel {
@@ -61,14 +63,8 @@ constexpr const char* kUnknownModel =
 constexpr const char* kNotThreadSafe =
     "Internal error: math model marked as non-threadsafe, but implementation not defined";
 
-struct PolyDeleter {
-    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
-};
-using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
-struct TpsDeleter {
-    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
-};
-using TpsPtr = std::unique_ptr<TPSMInfo_t, TpsDeleter>;
+using lumo::support::PolyPtr;
+using lumo::support::TpsPtr;
 
 // An affine UTM model: about 10 m pixels over a 6000 x 5000 image.
 PolyPtr MakePoly(const char* pszGeosys = "UTM 31 U D000") {
@@ -156,42 +152,10 @@ constexpr const char* kFnInitModel =
     "void __cdecl nova::mathmodel::LumoMathModel::InitModel(int,const void *)";
 
 // A model of another family that reports the lumo type value.
-class ForeignModel : public nm::IMathModel {
+class ForeignModel : public lumo::support::StubModel {
   public:
-    explicit ForeignModel(nm::MathModelType eType) : meType(eType) {}
-    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
-    nm::MathModelType GetModelType() const override { return meType; }
-    std::string GetModelName() const override { return "Foreign"; }
-    int GetNumColumns() const override { return 1; }
-    int GetNumRows() const override { return 1; }
-    int GetDownsampleFactor() const override { return 1; }
-    int GetMinValidHeight(double&) const override { return -1; }
-    int GetMaxValidHeight(double&) const override { return -1; }
-    bool IsHeightDependent() const override { return false; }
-    bool IsEqual(const IMathModel* o) const override { return o == this; }
-    int ImageToGround(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double, bool) const override {
-        return -1;
-    }
-    int ImageToGround(double, double, int, const double*, double*, double*, int*,
-                      bool) const override {
-        return -1;
-    }
-    int ImageToGround(double, double, double, double&, double&, bool) const override { return -1; }
-    int GroundToImage(int, int, int, const float*, const float*, const float*, float*, float*,
-                      unsigned char*, double, double, double, double, double, bool) const override {
-        return -1;
-    }
-    int GroundToImage(double, double, int, const double*, double*, double*, int*,
-                      bool) const override {
-        return -1;
-    }
-    int GroundToImage(double, double, double, double&, double&, bool) const override { return -1; }
-    IMathModel* Clone() const override { return new ForeignModel(meType); }
-    void SetDownsampleFactor(int) override {}
-
-  private:
-    nm::MathModelType meType;
+    explicit ForeignModel(nm::MathModelType eType) : StubModel("Foreign", eType, 1, 1, false) {}
+    IMathModel* Clone() const override { return new ForeignModel(*this); }
 };
 
 TEST(LumoMathModel, ConstructorsWrapOwnCopyWithCompoundCrs) {

@@ -13,6 +13,7 @@
 
 #include "nova/mathmodel_core.h"
 #include "nova/runtime.h"
+#include "support/model_stubs.h"
 
 namespace nm = nova::mathmodel;
 
@@ -22,30 +23,11 @@ constexpr float kNullF = static_cast<float>(nm::kMathModelNullValue);
 
 // Smooth analytic distortion: pixel/line/height -> X/Y, with a Newton inverse.
 // Counts point calls so tests can tell interpolation from exact evaluation.
-class SmoothModel : public nm::IMathModel {
+class SmoothModel : public lumo::support::PointDrivenModel {
   public:
-    const nova::ogc::cs::ICRS* GetCRS() const override { return nullptr; }
-    nm::MathModelType GetModelType() const override { return nm::MM_TYPE_USER; }
-    std::string GetModelName() const override { return "Smooth"; }
-    int GetNumColumns() const override { return 4000; }
-    int GetNumRows() const override { return 3000; }
-    int GetDownsampleFactor() const override { return 1; }
-    int GetMinValidHeight(double&) const override { return -1; }
-    int GetMaxValidHeight(double&) const override { return -1; }
-    bool IsHeightDependent() const override { return true; }
-    bool IsEqual(const IMathModel* poOther) const override { return poOther == this; }
+    using PointDrivenModel::GroundToImage;
+    using PointDrivenModel::ImageToGround;
 
-    int ImageToGround(int nCols, int nRows, int nStep, const float* pafA, const float* pafB,
-                      const float* pafZ, float* pafOut1, float* pafOut2, unsigned char* pabyValid,
-                      double dfO1, double dfO2, double dfS1, double dfS2, double dfTol,
-                      bool bFlag) const override {
-        return nm::ImageToGround(this, nCols, nRows, nStep, pafA, pafB, pafZ, pafOut1, pafOut2,
-                                 pabyValid, dfO1, dfO2, dfS1, dfS2, dfTol, bFlag);
-    }
-    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfIn, double* padfX,
-                      double* padfY, int* panValid, bool bFlag) const override {
-        return nm::ImageToGround(this, dfLine, dfZ, nCount, padfIn, padfX, padfY, panValid, bFlag);
-    }
     int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
                       bool) const override {
         ++mnCalls;
@@ -54,17 +36,6 @@ class SmoothModel : public nm::IMathModel {
         if (ReturnsNaN(dfPixel)) dfX = std::nan("");
         return 0;
     }
-    int GroundToImage(int nCols, int nRows, int nStep, const float* pafA, const float* pafB,
-                      const float* pafZ, float* pafOut1, float* pafOut2, unsigned char* pabyValid,
-                      double dfO1, double dfO2, double dfS1, double dfS2, double dfTol,
-                      bool bFlag) const override {
-        return nm::GroundToImage(this, nCols, nRows, nStep, pafA, pafB, pafZ, pafOut1, pafOut2,
-                                 pabyValid, dfO1, dfO2, dfS1, dfS2, dfTol, bFlag);
-    }
-    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfIn, double* padfP,
-                      double* padfL, int* panValid, bool bFlag) const override {
-        return nm::GroundToImage(this, dfY, dfZ, nCount, padfIn, padfP, padfL, panValid, bFlag);
-    }
     int GroundToImage(double dfX, double dfY, double dfZ, double& dfPixel, double& dfLine,
                       bool) const override {
         ++mnCalls;
@@ -72,7 +43,6 @@ class SmoothModel : public nm::IMathModel {
         return Fails(dfPixel, dfLine) ? -1 : 0;
     }
     IMathModel* Clone() const override { return new SmoothModel(*this); }
-    void SetDownsampleFactor(int) override {}
 
     static void Forward(double u, double v, double z, double& x, double& y) {
         x = 1000.0 + 2.0 * u + 0.3 * v + 4e-5 * u * v + 6.0 * std::sin(u / 250.0) +
@@ -106,9 +76,11 @@ class SmoothModel : public nm::IMathModel {
     double mdfNaNFromPixel = 1e30;   // forward gives NaN X (with success) at or beyond
     mutable std::atomic<long> mnCalls{0};
 
-    SmoothModel() = default;
+    SmoothModel() : PointDrivenModel("Smooth", nm::MM_TYPE_USER, 4000, 3000, true) {}
     SmoothModel(const SmoothModel& o)
-        : IMathModel(o), mdfFailFromPixel(o.mdfFailFromPixel), mdfNaNFromPixel(o.mdfNaNFromPixel) {}
+        : PointDrivenModel(o),
+          mdfFailFromPixel(o.mdfFailFromPixel),
+          mdfNaNFromPixel(o.mdfNaNFromPixel) {}
 
   private:
     bool Fails(double dfPixel, double) const { return dfPixel >= mdfFailFromPixel; }
@@ -125,14 +97,9 @@ class ThrowingModel : public SmoothModel {
     using SmoothModel::ImageToGround;
 };
 
-// A terrain of smooth hills and a sharp step, in metres.
+// A terrain of smooth hills and a sharp step of 150 m, in metres.
 std::vector<float> Terrain(int nCols, int nRows) {
-    std::vector<float> afZ(static_cast<std::size_t>(nCols) * nRows);
-    for (int r = 0; r < nRows; ++r)
-        for (int c = 0; c < nCols; ++c)
-            afZ[static_cast<std::size_t>(r) * nCols + c] = static_cast<float>(
-                300.0 + 200.0 * std::sin(c / 37.0) * std::cos(r / 53.0) + (c > 400 ? 150.0 : 0.0));
-    return afZ;
+    return lumo::support::HillTerrain(nCols, nRows, 150.0);
 }
 
 // Largest spacing between adjacent floats near v: the output's own precision.

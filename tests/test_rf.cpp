@@ -10,14 +10,12 @@
 #include "lumo.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
+#include "support/model_records.h"
 
 namespace {
 
-using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
-
-RecordPtr Allocate(int nTerms) {
-    return RecordPtr(RFAllocate(nullptr, nTerms), &RFDeallocate);
-}
+using RecordPtr = lumo::support::RfPtr;
+using lumo::support::AllocateRf;
 
 // Silences and counts warnings for the life of the object.
 class QuietWarnings {
@@ -36,17 +34,8 @@ class QuietWarnings {
 // A frame-like scene near 7.45 E 46.95 N: mostly linear, with cubic terms
 // and a first-order denominator as a perspective view has.
 RecordPtr SceneModel() {
-    RecordPtr psRF = Allocate(20);
-    psRF->dfXOffset = 7.45;
-    psRF->dfXScale = 0.16;
-    psRF->dfYOffset = 46.95;
-    psRF->dfYScale = 0.11;
-    psRF->dfZOffset = 800.0;
-    psRF->dfZScale = 500.0;
-    psRF->dfPixelOffset = 5074.5;
-    psRF->dfPixelScale = 5000.0;
-    psRF->dfLineOffset = 4961.5;
-    psRF->dfLineScale = 5000.0;
+    RecordPtr psRF = AllocateRf(20);
+    lumo::support::SetRfSceneFrame(*psRF);
     const std::array<double, 20> adfPixelNum = {0.002, 1.2,   0.05, 0.012, 0.003, 1e-4,  2e-4,
                                                 4e-3,  -2e-3, 1e-5, 1e-6,  3e-4,  -2e-4, 1e-6,
                                                 2e-4,  1e-4,  2e-6, -1e-6, 3e-6,  1e-7};
@@ -88,7 +77,7 @@ void ExpectedImage(const RFInfo_t& m, double x, double y, double z, double* p, d
 }
 
 TEST(RFAllocate, DefaultsAndPlacementIntoExistingRecord) {
-    RecordPtr psRF = Allocate(10);
+    RecordPtr psRF = AllocateRf(10);
     EXPECT_EQ(psRF->nTerms, 10);
     EXPECT_EQ(psRF->nHalfPixelShift, 1);
     EXPECT_EQ(psRF->nDownsample, 1);
@@ -138,7 +127,7 @@ TEST(RFGeo2Img, MatchesIndependentEvaluationWithShiftAndTermCounts) {
     EXPECT_DOUBLE_EQ(p, 5075.0);
     EXPECT_DOUBLE_EQ(l, 4962.0);
     // More than 20 terms evaluates the 20 that exist.
-    RecordPtr psWide = Allocate(25);
+    RecordPtr psWide = AllocateRf(25);
     psWide->dfXScale = psWide->dfYScale = psWide->dfZScale = 1.0;
     psWide->dfPixelScale = psWide->dfLineScale = 1.0;
     psWide->padfPixelNum[1] = psWide->padfLineNum[2] = 1.0;
@@ -256,7 +245,7 @@ TEST(RFNewton, StepSingularJacobianAndZeroDenominator) {
     ASSERT_EQ(Newton(psRF.get(), 0.3, -0.2, u, v, 0.1, &u2, &v2), 1);
     EXPECT_LT(std::fabs(u2 - u), 0.05);
     // A model without first-order terms has a zero Jacobian at the centre.
-    RecordPtr psFlat = Allocate(20);
+    RecordPtr psFlat = AllocateRf(20);
     psFlat->dfXScale = psFlat->dfYScale = psFlat->dfZScale = 1.0;
     psFlat->dfPixelScale = psFlat->dfLineScale = 1.0;
     psFlat->padfPixelDen[0] = psFlat->padfLineDen[0] = 1.0;

@@ -18,6 +18,8 @@
 #include "lumo_srit.h"
 #include "lumo_trn.h"
 #include "runtime.h"
+#include "support/model_records.h"
+#include "support/sim_gcps.h"
 
 namespace {
 
@@ -25,29 +27,9 @@ using lumo::sim::Scene;
 using lumo::sim::SceneParams;
 using lumo::sim::SimPoint;
 
-struct ModelDeleter {
-    void operator()(SRITInfo_t* p) const { LumoFreeSRITInfo(p); }
-};
-using ModelPtr = std::unique_ptr<SRITInfo_t, ModelDeleter>;
-struct SegmentDeleter {
-    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
-};
-using SegmentPtr = std::unique_ptr<EphemerisSeg_t, SegmentDeleter>;
-
-// Control points of a scene as parallel arrays.
-struct Gcps {
-    std::vector<double> p, l, x, y, z;
-    explicit Gcps(const std::vector<SimPoint>& as) {
-        for (const SimPoint& s : as) {
-            p.push_back(s.dfPixel);
-            l.push_back(s.dfLine);
-            x.push_back(s.dfX);
-            y.push_back(s.dfY);
-            z.push_back(s.dfZ);
-        }
-    }
-    int Count() const { return static_cast<int>(p.size()); }
-};
+using ModelPtr = lumo::support::SritPtr;
+using lumo::support::SegmentPtr;
+using Gcps = lumo::support::SimGcps;
 
 int Calculate(SRITInfo_t* psModel, EphemerisSeg_t* psSeg, const ProjInfo_t& sProj, const Gcps& g) {
     return SRITCalculate(psModel, true, psSeg, g.Count(), &sProj, g.p.data(), g.l.data(),
@@ -271,10 +253,13 @@ TEST(SRITCalculate, ComputationsRunSideBySide) {
     ModelPtr psSerial(SRITAllocate());
     ASSERT_EQ(Calculate(psSerial.get(), sScene.MakeSegment(), sScene.Projection(), g), 1);
     std::vector<ModelPtr> apsModels;
+    apsModels.reserve(4);
     for (int i = 0; i < 4; ++i) apsModels.emplace_back(SRITAllocate());
     std::vector<EphemerisSeg_t*> apsSegs;
+    apsSegs.reserve(4);
     for (int i = 0; i < 4; ++i) apsSegs.push_back(sScene.MakeSegment());
     std::vector<std::thread> aoThreads;
+    aoThreads.reserve(4);
     for (int i = 0; i < 4; ++i) {
         aoThreads.emplace_back([&, i] {
             for (int n = 0; n < 20; ++n) {

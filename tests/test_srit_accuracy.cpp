@@ -9,6 +9,8 @@
 #include "lumo_ephemeris.h"
 #include "lumo_sim.h"
 #include "lumo_srit.h"
+#include "support/model_records.h"
+#include "support/sim_gcps.h"
 
 namespace {
 
@@ -16,10 +18,7 @@ using lumo::sim::Scene;
 using lumo::sim::SceneParams;
 using lumo::sim::SimPoint;
 
-struct ModelDeleter {
-    void operator()(SRITInfo_t* p) const { LumoFreeSRITInfo(p); }
-};
-using ModelPtr = std::unique_ptr<SRITInfo_t, ModelDeleter>;
+using ModelPtr = lumo::support::SritPtr;
 
 struct Fit {
     ModelPtr psModel;
@@ -35,19 +34,12 @@ Fit FitScene(const SceneParams& sParams, int nGcp, int nCheck, double dfNoise,
     std::vector<SimPoint> asGcp = sScene.SamplePoints(nGcp, nSeed, 0.0, 2000.0, 0.03);
     if (dfNoise > 0.0) lumo::sim::AddImageNoise(&asGcp, dfNoise, nSeed + 1);
     const std::vector<SimPoint> asCheck = sScene.SamplePoints(nCheck, nSeed + 2, 0.0, 2000.0, 0.01);
-    std::vector<double> p, l, x, y, z;
-    for (const SimPoint& s : asGcp) {
-        p.push_back(s.dfPixel);
-        l.push_back(s.dfLine);
-        x.push_back(s.dfX);
-        y.push_back(s.dfY);
-        z.push_back(s.dfZ);
-    }
+    const lumo::support::SimGcps g(asGcp);
     Fit sFit;
     sFit.psModel.reset(SRITAllocate());
     EphemerisSeg_t* psSeg = sScene.MakeSegment();
-    EXPECT_EQ(SRITCalculate(sFit.psModel.get(), true, psSeg, nGcp, &sScene.Projection(), p.data(),
-                            l.data(), z.data(), x.data(), y.data()),
+    EXPECT_EQ(SRITCalculate(sFit.psModel.get(), true, psSeg, nGcp, &sScene.Projection(), g.p.data(),
+                            g.l.data(), g.z.data(), g.x.data(), g.y.data()),
               1);
     double dfSum[4] = {};
     for (const SimPoint& s : asCheck) {

@@ -16,37 +16,18 @@
 #include "points_io.h"
 #include "runtime.h"
 #include "srit_io.h"
+#include "support/cli_runner.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 
-struct RunResult {
-    int nCode;
-    std::string osOut;
-    std::string osErr;
-};
+using lumo::support::RunResult;
+using lumo::support::RunTool;
 
-RunResult RunTool(std::vector<std::string> args) {
-    args.insert(args.begin(), "lumo");
-    std::vector<char*> argv;
-    for (auto& a : args) argv.push_back(a.data());
-    std::ostringstream out, err;
-    const int code = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
-    return {code, out.str(), err.str()};
-}
-
-class SritCliTest : public ::testing::Test {
+class SritCliTest : public lumo::support::ScratchDirTest {
   protected:
-    void SetUp() override {
-        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
-        mDir = fs::temp_directory_path() /
-               ("lumo_srit_cli_" + std::string(info->name()) + "_" + std::to_string(::getpid()));
-        fs::create_directories(mDir);
-    }
-    void TearDown() override { fs::remove_all(mDir); }
-    std::string Path(const std::string& name) const { return (mDir / name).string(); }
-    fs::path mDir;
+    SritCliTest() : ScratchDirTest("lumo_srit_cli_") {}
 };
 
 // The "# rms dpixel A, dline B, ..." summary line of the residuals command.

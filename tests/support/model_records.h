@@ -1,0 +1,103 @@
+// Owning pointers for the model records of the C interface, and the small
+// record set-ups shared by tests and benchmarks.
+#pragma once
+
+#include <cstring>
+#include <memory>
+
+#include "lumo.h"
+
+namespace lumo {
+namespace support {
+
+struct PolyDeleter {
+    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
+};
+using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
+
+struct TpsDeleter {
+    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
+};
+using TpsPtr = std::unique_ptr<TPSMInfo_t, TpsDeleter>;
+
+struct RfDeleter {
+    void operator()(RFInfo_t* p) const { RFDeallocate(p); }
+};
+using RfPtr = std::unique_ptr<RFInfo_t, RfDeleter>;
+
+struct SritDeleter {
+    void operator()(SRITInfo_t* p) const { LumoFreeSRITInfo(p); }
+};
+using SritPtr = std::unique_ptr<SRITInfo_t, SritDeleter>;
+
+struct SegmentDeleter {
+    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
+};
+using SegmentPtr = std::unique_ptr<EphemerisSeg_t, SegmentDeleter>;
+
+struct ApDeleter {
+    void operator()(APInfo_t* p) const { APDeallocate(p); }
+};
+using ApPtr = std::unique_ptr<APInfo_t, ApDeleter>;
+
+// A new rational function record of nTerms terms, all coefficients zero.
+inline RfPtr AllocateRf(int nTerms) {
+    return RfPtr(RFAllocate(nullptr, nTerms));
+}
+
+// Normalisation of a frame-like scene of about 10 000 x 10 000 pixels near
+// 7.45 E 46.95 N, heights 300 to 1300 m.
+inline void SetRfSceneFrame(RFInfo_t& rf) {
+    rf.dfXOffset = 7.45;
+    rf.dfXScale = 0.16;
+    rf.dfYOffset = 46.95;
+    rf.dfYScale = 0.11;
+    rf.dfZOffset = 800.0;
+    rf.dfZScale = 500.0;
+    rf.dfPixelOffset = 5074.5;
+    rf.dfPixelScale = 5000.0;
+    rf.dfLineOffset = 4961.5;
+    rf.dfLineScale = 5000.0;
+}
+
+// Fiducial transforms of an aerial photo: photo -> image (d) and
+// image -> photo (e), eight coefficients each.
+inline void SetFiducials(APInfo_t& ap, const double (&d)[8], const double (&e)[8]) {
+    std::memcpy(ap.adfPhotoToImage, d, sizeof d);
+    std::memcpy(ap.adfImageToPhoto, e, sizeof e);
+}
+
+// The camera of a frame photo apart from its attitude and fiducials.
+struct FrameCamera {
+    double dfFocalLength;
+    double dfCameraX, dfCameraY, dfCameraZ;
+    double dfPrincipalX, dfPrincipalY;
+    double dfRadial3, dfRadial5;            // radial distortion k3 and k5
+    double dfDecentering1, dfDecentering2;  // decentering p1 and p2
+    double dfEarthRadius;
+    // Corrections switched on, one bit each: 1 principal point, 2 radial
+    // distortion, 4 decentering, 8 Earth curvature, 16 refraction.
+    unsigned nCorrections;
+};
+
+inline void SetFrameCamera(APInfo_t& ap, const FrameCamera& cam) {
+    ap.dfFocalLength = cam.dfFocalLength;
+    ap.dfCameraX = cam.dfCameraX;
+    ap.dfCameraY = cam.dfCameraY;
+    ap.dfCameraZ = cam.dfCameraZ;
+    ap.dfPrincipalX = cam.dfPrincipalX;
+    ap.dfPrincipalY = cam.dfPrincipalY;
+    ap.adfRadial[3] = cam.dfRadial3;
+    ap.adfRadial[5] = cam.dfRadial5;
+    ap.adfDecentering[0] = cam.dfDecentering1;
+    ap.adfDecentering[1] = cam.dfDecentering2;
+    ap.dfEarthRadius = cam.dfEarthRadius;
+    ap.bPrincipalPoint = (cam.nCorrections & 1u) ? 1 : 0;
+    ap.bRadialDistortion = (cam.nCorrections & 2u) ? 1 : 0;
+    ap.bDecentering = (cam.nCorrections & 4u) ? 1 : 0;
+    ap.bEarthCurvature = (cam.nCorrections & 8u) ? 1 : 0;
+    ap.bRefraction = (cam.nCorrections & 16u) ? 1 : 0;
+}
+
+}  // namespace support
+}  // namespace lumo
