@@ -648,6 +648,21 @@ TEST(SRITBlockCli, BundledStereoProject) {
     EXPECT_EQ(report["tiePoints"].size(), 12u);
     EXPECT_EQ(report["controlPoints"].size(), 12u);
 
+    // --constrain sets every segment's constraint flag: the report and the
+    // written models say so, and the bundled pair still checks well.
+    for (const auto& image : report["images"]) EXPECT_FALSE(image["constrained"].get<bool>());
+    ASSERT_EQ(fnRun({"block", project, "-o", dir.string(), "--constrain"}, &osErr), 0) << osErr;
+    std::ifstream((dir / "report.json").string()) >> report;
+    for (const auto& image : report["images"]) {
+        EXPECT_TRUE(image["constrained"].get<bool>());
+        EXPECT_LT(image["checkResiduals"]["rmsPixel"].get<double>(), 0.5);
+        EXPECT_LT(image["checkResiduals"]["rmsLine"].get<double>(), 0.5);
+        const lumo::cli::LoadedModel model =
+            lumo::cli::ReadModelFile(image["model"].get<std::string>());
+        const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
+        EXPECT_EQ(psModel->psEphemeris->nSupplementFlag, 1);
+    }
+
     // A tie naming an image the project does not list.
     projectDoc["ties"][3]["image"] = "middle";
     for (auto& image : projectDoc["images"]) {

@@ -29,6 +29,7 @@ namespace {
 struct BlockOptions {
     std::string osProject;
     std::string osOutputDir;
+    bool bConstrain = false;  // hold every image's P3 ... P7 near their orbit values
 };
 
 // Identifier padded with blanks to the library's fixed width.
@@ -160,10 +161,13 @@ struct BlockResult {
     std::vector<double> out[9];  // given, estimated, residual X Y Z
 };
 
-BlockResult ComputeBlock(const BlockProject& project) {
+BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
     std::vector<SegmentPtr> segments;
     for (const BlockImage& image : project.asImages) {
         segments.push_back(ReadSegmentFile(image.osSegmentPath));
+        // The segment's constraint flag asks the adjustment for the
+        // pseudo-observations; the written models carry it.
+        if (bConstrain) segments.back()->nSupplementFlag = 1;
     }
     const EphemerisSeg_t& first = *segments.front();
     const std::string geosys =
@@ -226,7 +230,7 @@ std::vector<std::size_t> FirstTieObservations(const BlockProject& project) {
 
 void RunBlock(const BlockOptions& options, CommandContext& context) {
     const BlockProject project = ReadBlockProject(options.osProject);
-    BlockResult r = ComputeBlock(project);
+    BlockResult r = ComputeBlock(project, options.bConstrain);
     const BlockArrays& a = r.a;
     const auto& models = r.models;
     const auto& out = r.out;
@@ -246,6 +250,8 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
             {{"id", id},
              {"model", path},
              {"sensor", std::string(model.Sensor, strnlen(model.Sensor, SRIT_SENSOR_SIZE))},
+             {"constrained",
+              model.psEphemeris != nullptr && model.psEphemeris->nSupplementFlag != 0},
              {"controlResiduals", ImageResiduals(project, id, model, false)},
              {"checkResiduals", ImageResiduals(project, id, model, true)}});
         context.out << "image " << id << ": wrote " << path << "\n";
@@ -280,7 +286,7 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out) {
     const BlockProject project =
         ReadBlockProject((std::filesystem::path(examplesDir) / "block_stereo.json").string());
-    const BlockResult r = ComputeBlock(project);
+    const BlockResult r = ComputeBlock(project, false);
     out << "\nblock adjustment of block_stereo.json: " << project.asImages.size() << " images, "
         << FirstTieObservations(project).size() << " tie points of unknown elevation\n";
     char line[200];
@@ -308,6 +314,10 @@ void AddBlockCommand(CLI::App& app, CommandContext& context) {
         ->add_option("-o,--output-dir", options->osOutputDir,
                      "directory for the model files and report.json")
         ->required();
+    command->add_flag("--constrain", options->bConstrain,
+                      "hold every image's scale, obliquity and shear terms near the values of "
+                      "its orbit (as a segment's constraint flag does); steadies images whose "
+                      "few control points cannot separate the elevation terms");
     command->callback([options, &context] { RunBlock(*options, context); });
 }
 
