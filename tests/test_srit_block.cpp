@@ -19,6 +19,7 @@
 #include "lumo_srit.h"
 #include "model_io.h"
 #include "runtime.h"
+#include "support/cli_runner.h"
 
 namespace {
 
@@ -609,14 +610,9 @@ TEST(SRITBlockCli, BundledStereoProject) {
         fs::temp_directory_path() / ("lumo_block_cli_" + std::to_string(::getpid()));
     const std::string project = std::string(LUMO_SOURCE_DIR) + "/examples/block_stereo.json";
     const auto fnRun = [](std::vector<std::string> args, std::string* posErr) {
-        args.insert(args.begin(), "lumo");
-        std::vector<char*> argv;
-        argv.reserve(args.size());
-        for (auto& a : args) argv.push_back(a.data());
-        std::ostringstream out, err;
-        const int nCode = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
-        *posErr = err.str();
-        return nCode;
+        const lumo::support::RunResult sRun = lumo::support::RunTool(std::move(args));
+        *posErr = sRun.osErr;
+        return sRun.nCode;
     };
     std::string osErr;
     ASSERT_EQ(fnRun({"block", project, "-o", dir.string()}, &osErr), 0) << osErr;
