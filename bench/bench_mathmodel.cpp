@@ -66,48 +66,51 @@ TpsPtr MakeTps(int n) {
     return t;
 }
 
-void BM_PolyFamily(benchmark::State& state) {
-    auto poly = MakePoly();
-    const Points g = GroundPoints(kPoints, 1);
+// Times fnToImage(x, y, pixel, line) on one ground point per iteration,
+// cycling through the points.
+template <typename F>
+void TimeGroundToImage(benchmark::State& state, const Points& g, F fnToImage) {
     std::size_t i = 0;
     for (auto _ : state) {
         double pixel, line;
-        POLYGeo2Img(poly.get(), g.x[i], g.y[i], &pixel, &line);
+        fnToImage(g.x[i], g.y[i], pixel, line);
         benchmark::DoNotOptimize(pixel);
         benchmark::DoNotOptimize(line);
         i = (i + 1) % kPoints;
     }
 }
+
+// The same through the host interface, as host code sees the object.
+void TimeObjectGroundToImage(benchmark::State& state, const nova::mathmodel::IMathModel& model,
+                             const Points& g) {
+    TimeGroundToImage(state, g, [&model](double x, double y, double& pixel, double& line) {
+        benchmark::DoNotOptimize(model.GroundToImage(x, y, 0.0, pixel, line, false));
+    });
+}
+
+void BM_PolyFamily(benchmark::State& state) {
+    auto poly = MakePoly();
+    TimeGroundToImage(state, GroundPoints(kPoints, 1),
+                      [&poly](double x, double y, double& pixel, double& line) {
+                          POLYGeo2Img(poly.get(), x, y, &pixel, &line);
+                      });
+}
 BENCHMARK(BM_PolyFamily);
 
-// Through the host interface, as host code sees the object.
 void BM_PolyObject(benchmark::State& state) {
     auto poly = MakePoly();
     const std::unique_ptr<nova::mathmodel::IMathModel> model(
         new nova::mathmodel::LumoMathModel(LUMO_CODE_POLY, poly.get()));
-    const Points g = GroundPoints(kPoints, 1);
-    std::size_t i = 0;
-    for (auto _ : state) {
-        double pixel, line;
-        benchmark::DoNotOptimize(model->GroundToImage(g.x[i], g.y[i], 0.0, pixel, line, false));
-        benchmark::DoNotOptimize(pixel);
-        benchmark::DoNotOptimize(line);
-        i = (i + 1) % kPoints;
-    }
+    TimeObjectGroundToImage(state, *model, GroundPoints(kPoints, 1));
 }
 BENCHMARK(BM_PolyObject);
 
 void BM_TpsFamily(benchmark::State& state) {
     auto tps = MakeTps(static_cast<int>(state.range(0)));
-    const Points g = GroundPoints(kPoints, 2);
-    std::size_t i = 0;
-    for (auto _ : state) {
-        double pixel, line;
-        TPSGeo2Img(tps.get(), g.x[i], g.y[i], &pixel, &line);
-        benchmark::DoNotOptimize(pixel);
-        benchmark::DoNotOptimize(line);
-        i = (i + 1) % kPoints;
-    }
+    TimeGroundToImage(state, GroundPoints(kPoints, 2),
+                      [&tps](double x, double y, double& pixel, double& line) {
+                          TPSGeo2Img(tps.get(), x, y, &pixel, &line);
+                      });
 }
 BENCHMARK(BM_TpsFamily)->Arg(15)->Arg(100);
 
@@ -115,15 +118,7 @@ void BM_TpsObject(benchmark::State& state) {
     auto tps = MakeTps(static_cast<int>(state.range(0)));
     const std::unique_ptr<nova::mathmodel::IMathModel> model(
         new nova::mathmodel::LumoMathModel(LUMO_CODE_TPS, tps.get()));
-    const Points g = GroundPoints(kPoints, 2);
-    std::size_t i = 0;
-    for (auto _ : state) {
-        double pixel, line;
-        benchmark::DoNotOptimize(model->GroundToImage(g.x[i], g.y[i], 0.0, pixel, line, false));
-        benchmark::DoNotOptimize(pixel);
-        benchmark::DoNotOptimize(line);
-        i = (i + 1) % kPoints;
-    }
+    TimeObjectGroundToImage(state, *model, GroundPoints(kPoints, 2));
 }
 BENCHMARK(BM_TpsObject)->Arg(15)->Arg(100);
 
