@@ -156,6 +156,7 @@ LumoModelType ModelCodeToLumoType(int nModelCode) {
 #include <cstddef>
 #include <cstring>
 
+#include "errors.h"
 #include "lumo_sensor.h"
 #include "runtime.h"
 
@@ -478,10 +479,7 @@ int GetSensor(EphemerisSeg_t* psSeg) {
 }
 
 int GetModel(int nSensor) {
-    if (nova::diag::Debugger::GetDebugLevel() != 0) {
-        nova::diag::Debugger::Debug(nova::FormatString("Get Model nSensor=%d\n", nSensor), 1,
-                                    "lumokit", "mathmodel/lumo/calcfunc", __LINE__);
-    }
+    LUMO_TRACE(1, "Get Model nSensor=%d\n", nSensor);
     if (nSensor < 0 || nSensor > LUMO_MAX_SENSOR_CODE) return LUMO_UNKNOWN_SENSOR;
     for (const ModelClassRange& sRange : kModelClasses) {
         if (nSensor >= sRange.nFirst && nSensor <= sRange.nLast) return sRange.nClass;

@@ -13,6 +13,7 @@
 #include <string>
 
 #include "crs.h"
+#include "errors.h"
 #include "lumo_poly.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
@@ -24,7 +25,6 @@ namespace mathmodel {
 namespace {
 
 constexpr const char* kFile = "mathmodel/lumo/lumokit";
-constexpr const char* kModule = "lumokit";
 
 constexpr const char* kFnConstructor =
     "__cdecl nova::mathmodel::LumoMathModel::LumoMathModel(enum "
@@ -203,8 +203,7 @@ void FillRigorousProjInfo(ProjInfo_t* psP, const SRITInfo_t& sModel) {
 
 void LogPointFailure(const std::string& osMessage, int nLine) noexcept {
     try {
-        if (diag::Debugger::GetDebugLevel() != 0)
-            diag::Debugger::Debug(osMessage, 1, kModule, kFile, nLine);
+        if (lumo::TraceOn()) lumo::Trace(1, __FILE__, nLine, "%s", osMessage.c_str());
     } catch (...) {
         // The log is best effort: a point operation never throws.
     }

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "errors.h"
 #include "lumo_poly.h"
 #include "projection.h"
 #include "runtime.h"
@@ -109,7 +110,7 @@ double Evaluate(const double* c, int nCoeffs, double u, double v) {
 
 // Term count that is valid for evaluation; warns when the record's is not.
 int UsableTermCount(int nCoeffs) {
-    if (nCoeffs < 1 || nCoeffs > POLY_MAX_COEFFS) IMPErrMsg(11, 0);
+    if (nCoeffs < 1 || nCoeffs > POLY_MAX_COEFFS) lumo::WarnMsg(lumo::Err::kBadArgument);
     if (nCoeffs > POLY_MAX_COEFFS) return POLY_MAX_COEFFS;
     return nCoeffs;
 }
@@ -120,7 +121,7 @@ bool CanEvaluate(const POLYInfo_t* psPoly, const double* pdfOut1, const double* 
         psPoly->padfYCoeffs && pdfOut1 && pdfOut2) {
         return true;
     }
-    IMPError(11, 0, _("Polynomial model or output pointer is null."));
+    lumo::Warn(lumo::Err::kBadArgument, _("Polynomial model or output pointer is null."));
     return false;
 }
 

@@ -10,6 +10,7 @@
 #include <memory>
 #include <string>
 
+#include "errors.h"
 #include "lumo_rf.h"
 #include "projection.h"
 #include "runtime.h"
@@ -96,21 +97,21 @@ bool NeedsProjParms(const std::string& osGeosys) {
 // room for, or an integer wider than its field.
 bool CanBeWritten(const RFInfo_t* psRF) {
     if (psRF->nTerms < 0 || psRF->nTerms > RF_MAX_TERMS) {
-        IMPErrReal(11, 0, "RFInfo_t.nTerms", psRF->nTerms, 0);
+        lumo::WarnReal(lumo::Err::kBadArgument, "RFInfo_t.nTerms", psRF->nTerms, 0);
         return false;
     }
     if (psRF->nDownsample < -99 || psRF->nDownsample > 999) {
-        IMPErrReal(11, 0, "RFInfo_t.nDownsample", psRF->nDownsample, 0);
+        lumo::WarnReal(lumo::Err::kBadArgument, "RFInfo_t.nDownsample", psRF->nDownsample, 0);
         return false;
     }
     // Every int but the most negative fits "%10d".
     constexpr int kMinExtra = -999999999;
     if (psRF->nExtra1 < kMinExtra) {
-        IMPErrReal(11, 0, "RFInfo_t.nExtra1", psRF->nExtra1, 0);
+        lumo::WarnReal(lumo::Err::kBadArgument, "RFInfo_t.nExtra1", psRF->nExtra1, 0);
         return false;
     }
     if (psRF->nExtra2 < kMinExtra) {
-        IMPErrReal(11, 0, "RFInfo_t.nExtra2", psRF->nExtra2, 0);
+        lumo::WarnReal(lumo::Err::kBadArgument, "RFInfo_t.nExtra2", psRF->nExtra2, 0);
         return false;
     }
     return true;
@@ -263,7 +264,8 @@ void ReadGeoreferencing(const unsigned char* pabyBlock, RFInfo_t* psRF) {
 unsigned char* LumoRFInfoToBinary(RFInfo_t* psRF, int* pnLength) {
     if (pnLength != nullptr) *pnLength = 0;
     if (psRF == nullptr || !HasCoefficientArrays(psRF)) {
-        IMPError(11, 0, _("Rational function model or its coefficient arrays are null."));
+        lumo::Warn(lumo::Err::kBadArgument,
+                   _("Rational function model or its coefficient arrays are null."));
         return nullptr;
     }
     if (!CanBeWritten(psRF)) return nullptr;

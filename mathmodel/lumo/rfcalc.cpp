@@ -7,6 +7,7 @@
 #include <cstring>
 #include <memory>
 
+#include "errors.h"
 #include "lumo_rf.h"
 #include "projection.h"
 #include "runtime.h"
@@ -158,7 +159,8 @@ bool IsEvaluable(const RFInfo_t* psRF) {
 void ReportUnusableRecord(const RFInfo_t* psRF) {
     if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
         psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
-        IMPError(11, 0, _("Rational function model or its coefficient arrays are null."));
+        lumo::Warn(lumo::Err::kBadArgument,
+                   _("Rational function model or its coefficient arrays are null."));
         return;
     }
     const struct {
@@ -180,7 +182,7 @@ void ReportUnusableRecord(const RFInfo_t* psRF) {
     for (const auto& f : asFields) {
         const bool bBad = f.bScale ? !IsUsableScale(f.dfValue) : !std::isfinite(f.dfValue);
         if (bBad) {
-            IMPErrReal(11, 0, f.pszName, f.dfValue, 0);
+            lumo::WarnReal(lumo::Err::kBadArgument, f.pszName, f.dfValue, 0);
             return;
         }
     }
@@ -289,7 +291,7 @@ LUMO_HOT_CLONES
 void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPixel,
                double* pdfLine) {
     if (pdfPixel == nullptr || pdfLine == nullptr) {
-        IMPError(11, 0, _("Rational function output pointer is null."));
+        lumo::Warn(lumo::Err::kBadArgument, _("Rational function output pointer is null."));
         return;
     }
     if (!IsEvaluable(psRF)) {
@@ -365,7 +367,7 @@ int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double d
 int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
               double* pdfZ) {
     if (pdfX == nullptr || pdfY == nullptr || pdfZ == nullptr) {
-        IMPError(11, 0, _("Rational function output pointer is null."));
+        lumo::Warn(lumo::Err::kBadArgument, _("Rational function output pointer is null."));
         return 0;
     }
     if (!IsEvaluable(psRF)) {
@@ -373,16 +375,17 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
         return 0;
     }
     if (!std::isfinite(dfPixel) || !std::isfinite(dfLine)) {
-        IMPErrReal(11, 0, std::isfinite(dfPixel) ? "line" : "pixel",
-                   std::isfinite(dfPixel) ? dfLine : dfPixel, 0);
+        lumo::WarnReal(lumo::Err::kBadArgument, std::isfinite(dfPixel) ? "line" : "pixel",
+                       std::isfinite(dfPixel) ? dfLine : dfPixel, 0);
         return 0;
     }
     const double dfHeight = *pdfZ == LUMO_NULL_VALUE ? psRF->dfZOffset : *pdfZ;
     const double dfStartX = (*pdfX == 0.0 || *pdfX == LUMO_NULL_VALUE) ? psRF->dfXOffset : *pdfX;
     const double dfStartY = (*pdfY == 0.0 || *pdfY == LUMO_NULL_VALUE) ? psRF->dfYOffset : *pdfY;
     if (!std::isfinite(dfHeight) || !std::isfinite(dfStartX) || !std::isfinite(dfStartY)) {
-        IMPErrReal(
-            11, 0, !std::isfinite(dfHeight) ? "height" : "starting ground coordinate",
+        lumo::WarnReal(
+            lumo::Err::kBadArgument,
+            !std::isfinite(dfHeight) ? "height" : "starting ground coordinate",
             !std::isfinite(dfHeight) ? dfHeight : (std::isfinite(dfStartX) ? dfStartY : dfStartX),
             0);
         return 0;

@@ -12,11 +12,11 @@
 #include <cstring>
 #include <memory>
 #include <new>
-#include <stdexcept>
 #include <string>
 #include <unordered_map>
 #include <vector>
 
+#include "errors.h"
 #include "lumo_ephemeris.h"
 #include "lumo_sensor.h"
 #include "lumo_srit.h"
@@ -25,7 +25,6 @@
 
 namespace {
 
-constexpr int kComputationFailed = 100;
 constexpr int kFormCubic = 20;  // cubic polynomials in pixel and line
 constexpr int kFormRatio = 39;  // normalised polynomials with a ratio in pixel
 
@@ -100,10 +99,11 @@ const AttitudeLine_t& LineEntry(const EphemerisSeg_t& sSeg, const AttitudeData_t
 void RequireDivisor(const EphemerisSeg_t& sSeg, int nIndex) {
     const double dfValue = sSeg.adfLevelConvCoefs[nIndex];
     if (dfValue != 0.0 && std::isfinite(dfValue)) return;
-    IMPError(kComputationFailed, 1,
-             MkName(_("Level 1A/1B conversion (form %d): coefficient %d of the segment is %.17g, "
-                      "but it divides the image coordinates.\n"),
-                    static_cast<int>(sSeg.nLevelConvForm), nIndex, dfValue));
+    lumo::Fatal(
+        lumo::Err::kComputation,
+        MkName(_("Level 1A/1B conversion (form %d): coefficient %d of the segment is %.17g, "
+                 "but it divides the image coordinates.\n"),
+               static_cast<int>(sSeg.nLevelConvForm), nIndex, dfValue));
 }
 
 ImagePoint Level1ATo1B(const EphemerisSeg_t& sSeg, ImagePoint sIn) {
@@ -181,10 +181,10 @@ void ConvertInPlace(const EphemerisSeg_t* psSeg, Direction eDirection, double* p
     }
     const bool bFiniteIn = std::isfinite(sIn.dfPixel) && std::isfinite(sIn.dfLine);
     if (bFiniteIn && !(std::isfinite(sOut.dfPixel) && std::isfinite(sOut.dfLine))) {
-        IMPError(kComputationFailed, 1,
-                 MkName(_("Level 1A/1B conversion (form %d) of pixel %.17g, line %.17g gives no "
-                          "finite result: check the segment's conversion coefficients.\n"),
-                        static_cast<int>(psSeg->nLevelConvForm), sIn.dfPixel, sIn.dfLine));
+        lumo::Fatal(lumo::Err::kComputation,
+                    MkName(_("Level 1A/1B conversion (form %d) of pixel %.17g, line %.17g gives no "
+                             "finite result: check the segment's conversion coefficients.\n"),
+                           static_cast<int>(psSeg->nLevelConvForm), sIn.dfPixel, sIn.dfLine));
     }
     *pdfPixel = sOut.dfPixel;
     *pdfLine = sOut.dfLine;
@@ -221,8 +221,6 @@ void SPOT1BTo1AControlPoint_imp(const EphemerisSeg_t* const* papsEphemeris, int 
 namespace {
 
 constexpr int kMaxUnknowns = 13;  // P0 ... P12 per image
-constexpr int kUnsupportedSensor = 19;
-constexpr int kBadUnit = 32;
 constexpr int kIterations = 7;
 constexpr double kEarthRate = 7.292115841e-5;  // rad/s
 constexpr double kNull = LUMO_NULL_VALUE;
@@ -350,10 +348,8 @@ std::string SensorNameOf(const EphemerisSeg_t& sSeg) {
 }
 
 [[noreturn]] void ReportUnsupportedSensor(const EphemerisSeg_t& sSeg) {
-    std::printf("Unsupported satellite sensor\n");
-    std::fflush(stdout);
-    IMPErrChar(kUnsupportedSensor, 1, "Satellite Sensor", SensorNameOf(sSeg).c_str());
-    throw std::logic_error("fatal host error returned");  // IMPErrChar throws when fatal
+    lumo::PrintUserMessage(stdout, "Unsupported satellite sensor\n");
+    lumo::FatalChar(lumo::Err::kSensor, "Satellite Sensor", SensorNameOf(sSeg).c_str());
 }
 
 // Fills the set-up of an image from the sensor table. A name that matches no
@@ -1005,10 +1001,9 @@ void AddConstraintRows(const Adjustment& sAdj, NormalEquations& sNormal) {
 }
 
 [[noreturn]] void ReportBadStart(std::size_t k, const char* pszWhat) {
-    IMPError(kComputationFailed, 1,
-             MkName(_("Image %d: %s; check the segment's orbit and viewing angles.\n"),
-                    static_cast<int>(k), pszWhat));
-    throw std::logic_error("fatal host error returned");
+    lumo::Fatal(lumo::Err::kComputation,
+                MkName(_("Image %d: %s; check the segment's orbit and viewing angles.\n"),
+                       static_cast<int>(k), pszWhat));
 }
 
 // Starting values of P0 ... P12 from the orbit and viewing geometry, image by
@@ -1147,11 +1142,11 @@ std::unique_ptr<NormalEquations> MakeNormalEquations(int nUnknowns) {
     } catch (const std::bad_alloc&) {
     } catch (const std::length_error&) {
     }
-    IMPError(kComputationFailed, 1,
-             MkName(_("SRIT adjustment: the normal matrix of %d unknowns (%llu values) cannot be "
-                      "allocated.\n"),
-                    nUnknowns, nElements));
-    throw std::logic_error("fatal host error returned");
+    lumo::Fatal(
+        lumo::Err::kComputation,
+        MkName(_("SRIT adjustment: the normal matrix of %d unknowns (%llu values) cannot be "
+                 "allocated.\n"),
+               nUnknowns, nElements));
 }
 
 // The fixed seven iterations: rows, constraints, solution, update, and the
@@ -1169,12 +1164,7 @@ void RunIterations(Adjustment& sAdj) {
         AddObservationRows(sAdj, sNormal);
         AddConstraintRows(sAdj, sNormal);
         if (!sNormal.Solve(adfX.data())) {
-            if (nova::diag::Debugger::GetDebugLevel() != 0) {
-                nova::diag::Debugger::Debug(
-                    nova::FormatString("SRIT iteration %d: singular normal equations\n",
-                                       nIteration + 1),
-                    1, "lumokit", "mathmodel/lumo/sritcalc_imp", __LINE__);
-            }
+            LUMO_TRACE(1, "SRIT iteration %d: singular normal equations\n", nIteration + 1);
         }
         UpdateParameters(sAdj, adfX.data());
         EstimateElevations(sAdj, false);
@@ -1199,7 +1189,7 @@ Ellipsoid EllipsoidOf(const ProjInfo_t& sProj, const char* pszDecoded) {
             } else if (s == 0.0) {
                 b = a;
             } else {
-                IMPErrReal(kBadUnit, 1, "Earth model", s, 2);
+                lumo::FatalReal(lumo::Err::kUnit, "Earth model", s, 2);
             }
         }
     } else {
@@ -1207,7 +1197,7 @@ Ellipsoid EllipsoidOf(const ProjInfo_t& sProj, const char* pszDecoded) {
         GetEllipsoidData(pszDecoded, &nCode, &a, &b);
     }
     if (!(a > 0.0) || !(b > 0.0) || !(b <= a) || !std::isfinite(a)) {
-        IMPErrReal(kBadUnit, 1, "Earth model", a, 2);
+        lumo::FatalReal(lumo::Err::kUnit, "Earth model", a, 2);
     }
     return {a, (a * a - b * b) / (a * a)};
 }
@@ -1215,16 +1205,17 @@ Ellipsoid EllipsoidOf(const ProjInfo_t& sProj, const char* pszDecoded) {
 void RequireConformal(const ProjInfo_t& sProj, char* pszDecoded) {
     DecodeGeosys(sProj.szProj, pszDecoded);
     if (IsConformal(pszDecoded)) return;
-    std::printf("Invalid GCP unit! Unit must be one of the following :\n");
-    std::printf("UTM, KROV, LCC, MER, MSC, OM, PS, RSO, FOOT,\n");
-    std::printf("SG, SOM, SPCS, SPIF, SPAF, TM, UPS, METRE \n");
-    std::fflush(stdout);
-    IMPErrChar(kBadUnit, 1, "GCP Unit", pszDecoded);
+    lumo::PrintUserMessage(stdout,
+                           "Invalid GCP unit! Unit must be one of the following :\n"
+                           "UTM, KROV, LCC, MER, MSC, OM, PS, RSO, FOOT,\n"
+                           "SG, SOM, SPCS, SPIF, SPAF, TM, UPS, METRE \n");
+    lumo::FatalChar(lumo::Err::kUnit, "GCP Unit", pszDecoded);
 }
 
 void RequireArgument(const void* pv, const char* pszName) {
     if (pv != nullptr) return;
-    IMPError(kComputationFailed, 1, MkName(_("SRITCalculate: argument %s is null.\n"), pszName));
+    lumo::Fatal(lumo::Err::kComputation,
+                MkName(_("SRITCalculate: argument %s is null.\n"), pszName));
 }
 
 // Per-image values of the segment and the flags that follow from its name.
@@ -1247,15 +1238,16 @@ void LoadImage(ImageState& sImg, int nImage) {
                                sSeg.dfLineRes};
     for (double dfValue : adfScene) {
         if (!std::isfinite(dfValue)) {
-            IMPError(kComputationFailed, 1,
-                     MkName(_("Image %d: the segment holds a value that is not a number "
-                              "(%.17g); no model computed.\n"),
-                            nImage, dfValue));
+            lumo::Fatal(lumo::Err::kComputation,
+                        MkName(_("Image %d: the segment holds a value that is not a number "
+                                 "(%.17g); no model computed.\n"),
+                               nImage, dfValue));
         }
     }
-    if (!(sSeg.dfIFOV > 0.0)) IMPErrReal(kComputationFailed, 1, "Segment dfIFOV", sSeg.dfIFOV, 6);
+    if (!(sSeg.dfIFOV > 0.0))
+        lumo::FatalReal(lumo::Err::kComputation, "Segment dfIFOV", sSeg.dfIFOV, 6);
     if (!(sSeg.dfOrbitRadius > 0.0)) {
-        IMPErrReal(kComputationFailed, 1, "Segment dfOrbitRadius", sSeg.dfOrbitRadius, 3);
+        lumo::FatalReal(lumo::Err::kComputation, "Segment dfOrbitRadius", sSeg.dfOrbitRadius, 3);
     }
     const bool bLineTableSensor = SegmentStartsWith(sSeg, "PLA") || SegmentStartsWith(sSeg, "MLA");
     if (const AttitudeData_t* psRecord = AttitudeRecord(sSeg)) {
@@ -1427,10 +1419,10 @@ void Adjust(Adjustment& sAdj, const char* pszFunction) {
     for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
         for (int p = 0; p < kMaxUnknowns; ++p) {
             if (std::isfinite(sAdj.asImages[k].P[p])) continue;
-            IMPError(kComputationFailed, 1,
-                     MkName(_("%s: the adjustment of image %d diverged (parameter %d is not a "
-                              "number); check the control points.\n"),
-                            pszFunction, static_cast<int>(k), p));
+            lumo::Fatal(lumo::Err::kComputation,
+                        MkName(_("%s: the adjustment of image %d diverged (parameter %d is not a "
+                                 "number); check the control points.\n"),
+                               pszFunction, static_cast<int>(k), p));
         }
     }
 }
@@ -1483,9 +1475,9 @@ int SRITCalculate_imp(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psE
                                     sPoint.dfZ};
         for (double dfValue : adfValues) {
             if (!std::isfinite(dfValue) || dfValue == kNull) {
-                IMPError(kComputationFailed, 1,
-                         MkName(_("GCP number %d has an invalid coordinate (%.17g).\n"), i + 1,
-                                dfValue));
+                lumo::Fatal(lumo::Err::kComputation,
+                            MkName(_("GCP number %d has an invalid coordinate (%.17g).\n"), i + 1,
+                                   dfValue));
             }
         }
         if (psEphemeris->nLevelConvForm > 0) {
@@ -1503,7 +1495,6 @@ int SRITCalculate_imp(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psE
 
 namespace {
 
-constexpr int kTooManyImages = 11;
 // Line tags of the block adjustment's debug messages.
 constexpr int kNotEnoughPointsLine = 1100;
 constexpr int kSensorLine = 1268;
@@ -1534,9 +1525,9 @@ double Optional(const double* padf, int i) {
 void RequireCoordinate(double dfValue, bool bNullAllowed, const char* pszWhat, int nObservation,
                        const char* pszName) {
     if (std::isfinite(dfValue) && (bNullAllowed || dfValue != kNull)) return;
-    IMPError(kComputationFailed, 1,
-             MkName(_("SRITCalculateN: %s observation %d has an invalid %s (%.17g).\n"), pszWhat,
-                    nObservation, pszName, dfValue));
+    lumo::Fatal(lumo::Err::kComputation,
+                MkName(_("SRITCalculateN: %s observation %d has an invalid %s (%.17g).\n"), pszWhat,
+                       nObservation, pszName, dfValue));
 }
 
 // The caller's arrays of one block adjustment.
@@ -1562,11 +1553,10 @@ std::size_t FindImage(const std::unordered_map<std::string, std::size_t>& mapIma
                       const char* pszIds, int nIndex, const char* pszWhat) {
     const auto it = mapImages.find(IdKey(pszIds, nIndex));
     if (it != mapImages.end()) return it->second;
-    IMPError(kComputationFailed, 1,
-             MkName(_("SRITCalculateN: %s observation %d names image \"%s\", which is not among "
-                      "the images of the block.\n"),
-                    pszWhat, nIndex + 1, IdText(pszIds, nIndex).c_str()));
-    throw std::logic_error("fatal host error returned");
+    lumo::Fatal(lumo::Err::kComputation,
+                MkName(_("SRITCalculateN: %s observation %d names image \"%s\", which is not among "
+                         "the images of the block.\n"),
+                       pszWhat, nIndex + 1, IdText(pszIds, nIndex).c_str()));
 }
 
 // Point record of an identifier, made on its first appearance.
@@ -1623,7 +1613,7 @@ void AddControlObservations(Adjustment& sAdj, const BlockInput& in,
         } else if (bPlan) {
             sPoint.cType = 'P';
         } else {
-            IMPError(kComputationFailed, 1, MkName(_("GCP number %d has invalid type.\n"), n));
+            lumo::Fatal(lumo::Err::kComputation, MkName(_("GCP number %d has invalid type.\n"), n));
         }
         if (sImg.psSeg->nLevelConvForm > 0) {
             SPOT1BTo1AControlPoint_imp(in.papsEphemeris, static_cast<int>(k), &sSlot.dfPixel,
@@ -1688,11 +1678,10 @@ bool EnoughPoints(const Adjustment& sAdj) {
         const ImageState& sImg = sAdj.asImages[k];
         const int nNeeded = SegmentStartsWith(*sImg.psSeg, "SAR") ? 5 : 4;
         if (sImg.nObservations >= nNeeded) continue;
-        if (nova::diag::Debugger::GetDebugLevel() != 0) {
-            nova::diag::Debugger::Debug(
-                nova::FormatString("Not enough points in image %d! no model calculated\n",
-                                   static_cast<int>(k)),
-                1, "lumokit", "mathmodel/lumo/sritcalc_imp", kNotEnoughPointsLine);
+        if (lumo::TraceOn()) {
+            lumo::Trace(1, __FILE__, kNotEnoughPointsLine,
+                        "Not enough points in image %d! no model calculated\n",
+                        static_cast<int>(k));
         }
         return false;
     }
@@ -1732,11 +1721,12 @@ void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
     RequireArgument(in.padfZ, "padfZ");
     RequireArgument(in.padfC, "padfC");
     RequireArgument(in.padfD, "padfD");
-    if (in.nTie < 0) IMPErrReal(kComputationFailed, 1, "Number of tie observations", in.nTie, 0);
+    if (in.nTie < 0)
+        lumo::FatalReal(lumo::Err::kComputation, "Number of tie observations", in.nTie, 0);
     if (in.nTie == 1) {
-        IMPError(kComputationFailed, 1,
-                 _("SRITCalculateN: a single tie observation ties nothing; a tie point needs "
-                   "observations in at least two images.\n"));
+        lumo::Fatal(lumo::Err::kComputation,
+                    _("SRITCalculateN: a single tie observation ties nothing; a tie point needs "
+                      "observations in at least two images.\n"));
     }
     if (in.nTie > 0) {
         RequireArgument(in.pszTieImageIds, "pszTieImageIds");
@@ -1756,10 +1746,10 @@ void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
                                   papsModels[k]->psEphemeris == in.papsEphemeris[j];
             if (papsModels[j] == papsModels[k] || in.papsEphemeris[j] == in.papsEphemeris[k] ||
                 bCrossed) {
-                IMPError(kComputationFailed, 1,
-                         MkName(_("SRITCalculateN: images %d and %d share a model record or a "
-                                  "segment; each image needs its own.\n"),
-                                j, k));
+                lumo::Fatal(lumo::Err::kComputation,
+                            MkName(_("SRITCalculateN: images %d and %d share a model record or a "
+                                     "segment; each image needs its own.\n"),
+                                   j, k));
             }
         }
     }
@@ -1829,9 +1819,9 @@ int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsMo
     if (nGCP < 3) return 0;
     // Checked before anything is allocated for the images.
     if (nImages > SRIT_MAX_IMAGES) {
-        IMPError(kTooManyImages, 1, _("Number of images has exceeded limit.\n"));
+        lumo::Fatal(lumo::Err::kBadArgument, _("Number of images has exceeded limit.\n"));
     }
-    if (nImages < 1) IMPErrReal(kComputationFailed, 1, "Number of images", nImages, 0);
+    if (nImages < 1) lumo::FatalReal(lumo::Err::kComputation, "Number of images", nImages, 0);
     RequireArgument(psProjInfo, "psProjInfo");
     const BlockInput in{nImages,        pszImageIds,    bImageFirst, papsEphemeris, nGCP,
                         pszGcpImageIds, pszGcpPointIds, pszGcpUsage, padfA,         padfB,
@@ -1868,12 +1858,10 @@ int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsMo
 
     for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
         FillRecord(sAdj.asImages[k], papsModels[k], papsEphemeris[k], *psProjInfo);
-        if (nova::diag::Debugger::GetDebugLevel() != 0) {
+        if (lumo::TraceOn()) {
             const std::string osSensor(papsModels[k]->Sensor,
                                        strnlen(papsModels[k]->Sensor, SRIT_SENSOR_SIZE));
-            nova::diag::Debugger::Debug(
-                nova::FormatString("SRITModel[i]->Sensor=%s\n", osSensor.c_str()), 1, "lumokit",
-                "mathmodel/lumo/sritcalc_imp", kSensorLine);
+            lumo::Trace(1, __FILE__, kSensorLine, "SRITModel[i]->Sensor=%s\n", osSensor.c_str());
         }
     }
     for (int i = 0; i < nTie; ++i) {
@@ -2144,7 +2132,7 @@ void SRITRMSError_imp(const SRITInfo_t* psModel, int nGCP, const double* padfX, 
     if (nGCP < 2) return;
     if (psModel == nullptr || padfX == nullptr || padfY == nullptr || padfZ == nullptr ||
         padfPixel == nullptr || padfLine == nullptr) {
-        IMPError(kComputationFailed, 1, _("SRITRMSError: a null model or point array.\n"));
+        lumo::Fatal(lumo::Err::kComputation, _("SRITRMSError: a null model or point array.\n"));
         return;
     }
     double dfSumPixel = 0.0, dfSumLine = 0.0;

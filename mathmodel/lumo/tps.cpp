@@ -10,6 +10,7 @@
 #include <utility>
 #include <vector>
 
+#include "errors.h"
 #include "lumo_tps.h"
 #include "projection.h"
 #include "regression.h"
@@ -25,11 +26,8 @@ extern "C" __attribute__((target("avx2"))) __m256d _ZGVdN4v_log(__m256d);
 
 namespace {
 
-constexpr int kErrorCode = 100;
-
 [[noreturn]] void Fail(const char* text) {
-    IMPError(kErrorCode, 1, text);
-    std::abort();  // IMPError does not return for fatal reports
+    lumo::Fatal(lumo::Err::kComputation, text);
 }
 
 // ---------------------------------------------------------------------------

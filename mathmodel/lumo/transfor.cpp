@@ -6,6 +6,7 @@
 #include <memory>
 #include <vector>
 
+#include "errors.h"
 #include "lumo_ephemeris.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
@@ -39,8 +40,8 @@ void CalculateRigorous(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* 
                        double* y2, void* pExtra) {
     const auto* psExtra = static_cast<const TRNSritExtra_t*>(pExtra);
     if (psExtra == nullptr || psExtra->psEphemeris == nullptr) {
-        IMPError(100, 1, _("TRNCalculate3D: a rigorous fit needs its TRNSritExtra_t record.\n"));
-        return;
+        lumo::Fatal(lumo::Err::kComputation,
+                    _("TRNCalculate3D: a rigorous fit needs its TRNSritExtra_t record.\n"));
     }
     std::unique_ptr<EphemerisSeg_t, SegmentDeleter> psSegment(
         EphemerisSegDuplicate(psExtra->psEphemeris));
@@ -54,10 +55,8 @@ void CalculateRigorous(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* 
 }
 
 void DebugNotImplemented(const char* pszKind, int nLine) {
-    if (nova::diag::Debugger::GetDebugLevel() == 0) return;
-    nova::diag::Debugger::Debug(
-        nova::FormatString("<TRNRMSError() not yet implemented for %s>\n", pszKind), 1, "lumokit",
-        "mathmodel/lumo/transfor", nLine);
+    if (!lumo::TraceOn()) return;
+    lumo::Trace(1, __FILE__, nLine, "<TRNRMSError() not yet implemented for %s>\n", pszKind);
 }
 
 GEOInfo_t* AsRegression(const TRNInfo_t* psTrn) {
@@ -113,7 +112,8 @@ TRNInfo_t* TRNAllocate(int nType) {
             psTrn->pModel = SRITAllocate();
             break;
         default:
-            IMPError(11, 0, MkName(_("Illegal nType (%d) passed to TRNAllocate()."), nType));
+            lumo::Warn(lumo::Err::kBadArgument,
+                       MkName(_("Illegal nType (%d) passed to TRNAllocate()."), nType));
             break;
     }
     return psTrn.release();
