@@ -127,22 +127,29 @@ BlockArrays MakeArrays(const BlockProject& project) {
 }
 
 // Root mean square image residual of a project's control observations of
-// one kind (used or check) in one image.
+// one kind (used or check) in one image; observations the model cannot map
+// are counted apart.
 nlohmann::json ImageResiduals(const BlockProject& project, const std::string& id,
                               const SRITInfo_t& model, bool bCheck) {
     double sumPixel = 0.0, sumLine = 0.0;
     int count = 0;
+    int failed = 0;  // observations the model maps to no image position
     for (const BlockGcp& g : project.asGcps) {
         if (g.bCheck != bCheck || Upper(g.osImage) != Upper(id) || g.dfZ == LUMO_NULL_VALUE) {
             continue;
         }
         double pixel = 0.0, line = 0.0;
         SRITGeo2Img(&model, g.dfX, g.dfY, g.dfZ, &pixel, &line);
+        if (!IsPosition(pixel, line)) {
+            ++failed;
+            continue;
+        }
         sumPixel += (pixel - g.dfPixel) * (pixel - g.dfPixel);
         sumLine += (line - g.dfLine) * (line - g.dfLine);
         ++count;
     }
     nlohmann::json result{{"count", count}};
+    if (failed > 0) result["failed"] = failed;
     if (count > 0) {
         result["rmsPixel"] = std::sqrt(sumPixel / count);
         result["rmsLine"] = std::sqrt(sumLine / count);

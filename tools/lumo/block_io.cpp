@@ -1,8 +1,10 @@
 // Reading block project files.
 #include "block_io.h"
 
+#include <cctype>
 #include <cmath>
 #include <filesystem>
+#include <map>
 #include <string>
 
 #include "cli_error.h"
@@ -10,11 +12,22 @@
 #include "lumo_srit.h"
 #include "lumo_types.h"
 #include "model_io.h"
+#include "points_io.h"
 
 namespace lumo::cli {
 namespace {
 
 using nlohmann::json;
+
+// Largest ground coordinate that can be real: a conformal projection of the
+// Earth spans some 4e7 m (and 1.3e8 US survey feet).
+constexpr double kMaxGround = 1e9;
+// Heights within 100 km of the ellipsoid; image coordinates within 1e9.
+constexpr double kMaxHeight = 1e5;
+constexpr double kMaxImage = 1e9;
+// Two observations of one control point agree when their ground positions
+// differ by at most this much in every coordinate (ground units, metres).
+constexpr double kSamePointTolerance = 1e-3;
 
 // An identifier of 1 to SRIT_ID_SIZE characters.
 std::string Text(const json& object, const char* pszName, const FieldContext& ctx) {
@@ -28,14 +41,63 @@ std::string Text(const json& object, const char* pszName, const FieldContext& ct
     return text;
 }
 
-// A finite number; when bOptional, an absent member or null gives the null value.
-double Number(const json& object, const char* pszName, const FieldContext& ctx, bool bOptional) {
+// A finite number within ±dfLimit; when bOptional, an absent member or null
+// gives the null value.
+double Number(const json& object, const char* pszName, const FieldContext& ctx, bool bOptional,
+              double dfLimit) {
     const json* pv = FindField(object, pszName);
     if (bOptional && (pv == nullptr || pv->is_null())) return LUMO_NULL_VALUE;
     if (pv == nullptr || !pv->is_number()) ctx.Fail(pszName, "must be a number");
     const double value = pv->get<double>();
     if (!std::isfinite(value)) ctx.Fail(pszName, "must be a finite number");
+    if (std::fabs(value) > dfLimit) {
+        ctx.Fail(pszName, FormatDouble(value) + " is not a physical value (beyond ±" +
+                              FormatDouble(dfLimit) + ")");
+    }
     return value;
+}
+
+// A standard deviation: positive when given.
+double Deviation(const json& object, const char* pszName, const FieldContext& ctx) {
+    const double value = Number(object, pszName, ctx, true, kMaxGround);
+    if (value != LUMO_NULL_VALUE && !(value > 0.0)) {
+        ctx.Fail(pszName, "must be positive, found " + FormatDouble(value));
+    }
+    return value;
+}
+
+std::string Upper(std::string text) {
+    for (char& c : text) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+    return text;
+}
+
+bool Agree(double a, double b) {
+    if (a == LUMO_NULL_VALUE || b == LUMO_NULL_VALUE) return a == b;
+    return std::fabs(a - b) <= kSamePointTolerance;
+}
+
+std::string Position(const BlockGcp& g) {
+    return "(" + FormatDouble(g.dfX) + ", " + FormatDouble(g.dfY) + ", " +
+           (g.dfZ == LUMO_NULL_VALUE ? std::string("no z") : FormatDouble(g.dfZ)) + ")";
+}
+
+// The observations of one control point (same identifier, case ignored)
+// must give one ground position: the adjustment would otherwise keep the
+// last one silently.
+void CheckSamePositions(const BlockProject& project, const FieldContext& ctx) {
+    std::map<std::string, std::size_t> first;
+    for (std::size_t i = 0; i < project.asGcps.size(); ++i) {
+        const BlockGcp& g = project.asGcps[i];
+        const auto [it, bNew] = first.emplace(Upper(g.osPoint), i);
+        if (bNew) continue;
+        const BlockGcp& f = project.asGcps[it->second];
+        if (Agree(f.dfX, g.dfX) && Agree(f.dfY, g.dfY) && Agree(f.dfZ, g.dfZ)) continue;
+        ctx.Fail("gcps[" + std::to_string(i) + "]",
+                 "gives control point " + Quoted(g.osPoint) + " the ground position " +
+                     Position(g) + ", but gcps[" + std::to_string(it->second) + "] gives " +
+                     Position(f) + " (observations of one point must agree to " +
+                     FormatDouble(kSamePointTolerance) + ")");
+    }
 }
 
 const json& Array(const json& document, const char* pszName, const FieldContext& ctx,
@@ -104,29 +166,30 @@ BlockProject BlockProjectFromJson(const json& document, const std::string& sourc
         BlockGcp gcp;
         gcp.osImage = Text(gcps[i], "image", item);
         gcp.osPoint = Text(gcps[i], "point", item);
-        gcp.dfPixel = Number(gcps[i], "pixel", item, false);
-        gcp.dfLine = Number(gcps[i], "line", item, false);
-        gcp.dfX = Number(gcps[i], "x", item, false);
-        gcp.dfY = Number(gcps[i], "y", item, false);
-        gcp.dfZ = Number(gcps[i], "z", item, true);
-        gcp.dfSdX = Number(gcps[i], "sdX", item, true);
-        gcp.dfSdY = Number(gcps[i], "sdY", item, true);
-        gcp.dfSdZ = Number(gcps[i], "sdZ", item, true);
+        gcp.dfPixel = Number(gcps[i], "pixel", item, false, kMaxImage);
+        gcp.dfLine = Number(gcps[i], "line", item, false, kMaxImage);
+        gcp.dfX = Number(gcps[i], "x", item, false, kMaxGround);
+        gcp.dfY = Number(gcps[i], "y", item, false, kMaxGround);
+        gcp.dfZ = Number(gcps[i], "z", item, true, kMaxHeight);
+        gcp.dfSdX = Deviation(gcps[i], "sdX", item);
+        gcp.dfSdY = Deviation(gcps[i], "sdY", item);
+        gcp.dfSdZ = Deviation(gcps[i], "sdZ", item);
         if (const json* pCheck = FindField(gcps[i], "check")) {
             if (!pCheck->is_boolean()) item.Fail("check", "must be true or false");
             gcp.bCheck = pCheck->get<bool>();
         }
         project.asGcps.push_back(gcp);
     }
+    CheckSamePositions(project, ctx);
     const json& ties = Array(document, "ties", ctx, true);
     for (std::size_t i = 0; i < ties.size(); ++i) {
         const FieldContext item = ListItem(ties, "ties", i, ctx);
         BlockTie tie;
         tie.osImage = Text(ties[i], "image", item);
         tie.osPoint = Text(ties[i], "point", item);
-        tie.dfPixel = Number(ties[i], "pixel", item, false);
-        tie.dfLine = Number(ties[i], "line", item, false);
-        tie.dfZ = Number(ties[i], "z", item, true);
+        tie.dfPixel = Number(ties[i], "pixel", item, false, kMaxImage);
+        tie.dfLine = Number(ties[i], "line", item, false, kMaxImage);
+        tie.dfZ = Number(ties[i], "z", item, true, kMaxHeight);
         project.asTies.push_back(tie);
     }
     return project;
