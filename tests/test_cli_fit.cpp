@@ -127,14 +127,17 @@ TEST_F(FitTest, PolyFitTransformResidualsEndToEnd) {
     std::istringstream tableText(ReadText(table));
     std::string header;
     std::getline(tableText, header);
-    EXPECT_EQ(header, "id,pixel,line,x,y,z,dpixel,dline,dx,dy");
+    EXPECT_EQ(header, std::string("# geosys: ") + kGeosys);
+    std::getline(tableText, header);
+    EXPECT_EQ(header, "id,pixel,line,x,y,z,dpixel,dline,dx,dy,status");
     for (std::size_t i = 0; i < 15; ++i) {
         std::string row;
         std::getline(tableText, row);
         std::vector<std::string> f;
         std::stringstream fields(row);
         for (std::string item; std::getline(fields, item, ',');) f.push_back(item);
-        ASSERT_EQ(f.size(), 10u);
+        ASSERT_EQ(f.size(), 11u);
+        EXPECT_EQ(f[10], "ok");
         EXPECT_EQ(f[0], gcps.asPoints[i].osId);
         EXPECT_DOUBLE_EQ(std::stod(f[6]), mapped.asPoints[i].dfPixel - gcps.asPoints[i].dfPixel);
         EXPECT_DOUBLE_EQ(std::stod(f[7]), mapped.asPoints[i].dfLine - gcps.asPoints[i].dfLine);
@@ -151,9 +154,14 @@ TEST_F(FitTest, PolyOrdersAndRawCoefficientPrecision) {
     ASSERT_EQ(r.nCode, 0);
     EXPECT_LT(NumberAfter(r.osOut, "max"), 1e-6);
 
-    // Order 5 needs 21 points: lowered to 4 with a warning.
+    // Order 5 needs 21 points: refused with the reason, or lowered to 4 when allowed.
     r = RunTool({"fit", "--model", "poly", "--gcps", kGcps, "--order", "5", "--geosys", kGeosys,
                  "-o", Path("p5.json")});
+    EXPECT_EQ(r.nCode, 1);
+    EXPECT_NE(r.osErr.find("determine only order 4"), std::string::npos) << r.osErr;
+    EXPECT_FALSE(std::filesystem::exists(Path("p5.json")));
+    r = RunTool({"fit", "--model", "poly", "--gcps", kGcps, "--order", "5", "--geosys", kGeosys,
+                 "--allow-lower-order", "-o", Path("p5.json")});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
     EXPECT_NE(r.osErr.find("determine only order 4"), std::string::npos);
     EXPECT_EQ(lumo::cli::ReadModelFile(Path("p5.json")).AsPoly()->nCoeffs, 15);

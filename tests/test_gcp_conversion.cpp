@@ -292,14 +292,17 @@ TEST(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
     const RunResult sStdout =
         RunTool({"gcps", "convert", "--geosys", "UTM 31 U D000", "--height-ref", "E", osInput});
     ASSERT_EQ(sStdout.nCode, 0) << sStdout.osErr;
-    EXPECT_EQ(sStdout.osOut.rfind("id,pixel,line,x,y,z\n", 0), 0u) << sStdout.osOut;
+    EXPECT_EQ(sStdout.osOut.rfind("# geosys: LONG/LAT D000\nid,pixel,line,x,y,z\n", 0), 0u)
+        << sStdout.osOut;
 }
 
 TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
     const std::string osInput = Scratch("in.csv");
-    std::ofstream(osInput) << "id,pixel,line,x,y\nA,1,2,5,52\nB,3,4,5,95\n";
+    std::ofstream(osInput) << "id,pixel,line,x,y,z\nA,1,2,5,52,0\nB,3,4,5,95,0\n";
     const std::string osOutput = Scratch("kept.csv");
     std::ofstream(osOutput) << "old contents\n";
+    const std::string osNoZ = Scratch("noz.csv");
+    std::ofstream(osNoZ) << "id,pixel,line,x,y\nA,1,2,5,52\n";
 
     const struct {
         std::vector<std::string> asArgs;
@@ -311,6 +314,7 @@ TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
         {{"--geosys", "LONG/LAT D000", "--height-ref", "M", osInput}, ":3 (id \"B\")"},
         {{"--geosys", "LONG/LAT D000", "--height-ref", "E", Scratch("missing.csv")}, "missing"},
         {{"--height-ref", "E", osInput}, "--geosys"},
+        {{"--geosys", "LONG/LAT D000", "--height-ref", "E", osNoZ}, "no z column"},
     };
     for (const auto& sCase : asCases) {
         std::vector<std::string> asArgs = {"gcps", "convert"};
@@ -325,6 +329,7 @@ TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
         EXPECT_EQ(osKept, "old contents") << sCase.osMessagePart;
     }
     std::filesystem::remove(osInput);
+    std::filesystem::remove(osNoZ);
     std::filesystem::remove(osOutput);
 }
 

@@ -19,10 +19,9 @@ namespace {
 // Every subcommand; a new family adds its Add...Command here.
 // (A plain array, so that adding a line needs no count.)
 constexpr AddCommandFn kCommands[] = {
-    &AddDemoCommand, &AddTransformCommand, &AddPolyCommand,
-    &AddRpcCommand,  &AddFitCommand,       &AddResidualsCommand,
-    &AddGcpsCommand, &AddSegmentCommand,   &AddSimulateCommand,
-    &AddBlockCommand,
+    &AddDemoCommand,     &AddTransformCommand, &AddPolyCommand, &AddRpcCommand,
+    &AddFitCommand,      &AddResidualsCommand, &AddGcpsCommand, &AddSegmentCommand,
+    &AddSimulateCommand, &AddBlockCommand,
 };
 
 std::string VersionText() {
@@ -51,17 +50,18 @@ int RunLumo(int argc, char** argv, std::ostream& out, std::ostream& err) {
             return 0;
         }
         if (app.get_subcommands().empty()) {
-            out << app.help();
-            return 1;
+            err << app.help();
+            return kExitUsage;
         }
     } catch (const CLI::ParseError& e) {
-        return app.exit(e, out, err);
+        // Help is a success; every other parse or validation error is a usage error.
+        return app.exit(e, out, err) == 0 ? kExitSuccess : kExitUsage;
     } catch (const nova::Exception& e) {
         err << "lumo: " << e.what() << '\n';
-        return 1;
+        return kExitFailed;
     } catch (const std::exception& e) {
         err << "lumo: " << e.what() << '\n';
-        return 1;
+        return kExitFailed;
     }
     return context.nExitCode;
 }

@@ -7,12 +7,19 @@
 #include <string>
 
 #include "model_io.h"
+#include "point_prep.h"
 
 namespace CLI {
 class App;
 }
 
 namespace lumo::cli {
+
+// Exit statuses of the tool.
+constexpr int kExitSuccess = 0;       // everything done, every point computed
+constexpr int kExitFailed = 1;        // the operation failed; nothing half-written is left
+constexpr int kExitUsage = 2;         // unknown command or option, bad option value
+constexpr int kExitPointsFailed = 3;  // the run completed, but some points failed
 
 // Streams and result shared by the commands of one run.
 struct CommandContext {
@@ -38,23 +45,27 @@ void AddBlockCommand(CLI::App& app, CommandContext& context);
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 
 // `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
-// from the control points (with heights) of `gcpsPath`, ground coordinates in
-// `geosys` (empty: the segment's), written to `outputPath`.
-void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
-                const std::string& geosys, const std::string& outputPath, CommandContext& context);
+// from control points with heights, ground coordinates in `geosys` (empty:
+// the segment's), written to `outputPath`.
+void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
+                const std::string& outputPath, CommandContext& context);
 
-// `lumo transform --exact --to-image`: ground points to the image of a
-// rigorous model with the exact inverse of its image-to-ground equations.
-void TransformSritExactFile(const LoadedModel& model, const std::string& pointsPath,
-                            const std::string& outputPath, CommandContext& context);
+// `lumo transform --exact --to-image`: one ground point to the image of a
+// rigorous model with the exact inverse of its image-to-ground equations;
+// false when it does not converge.
+bool SritExactToImage(const LoadedModel& model, double dfX, double dfY, double dfZ,
+                      double* pdfPixel, double* pdfLine);
 
 // Arguments of the point-transform commands (transform and the per-family
-// commands): MODEL --to-image|--to-ground POINTS [-o OUT].
+// commands): MODEL --to-image|--to-ground POINTS [-o OUT] with the point
+// file options.
 struct TransformOptions {
     std::string osModel;
     std::string osToImage;
     std::string osToGround;
     std::string osOutput;
+    PointFileOptions sPoints;
+    bool bExact = false;  // transform --exact
 };
 
 // Adds the shared arguments to a command; exactly one direction is accepted.

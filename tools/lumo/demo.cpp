@@ -32,7 +32,8 @@ struct ImagePoint {
 
 ImagePoint ToImage(const LoadedModel& model, const GroundPoint& g) {
     ImagePoint i{0.0, 0.0};
-    if (!GenGeo2Img(model.nModelCode, model.poRecord.get(), g.x, g.y, g.z, &i.pixel, &i.line)) {
+    if (!GenGeo2Img(model.nModelCode, model.poRecord.get(), g.x, g.y, g.z, &i.pixel, &i.line) ||
+        !IsPosition(i.pixel, i.line)) {
         LUMO_CLI_FAIL(model.sEnvelope.osSource + ": the model cannot map ground point (" +
                       FormatDouble(g.x) + ", " + FormatDouble(g.y) + ") to the image");
     }
@@ -41,7 +42,8 @@ ImagePoint ToImage(const LoadedModel& model, const GroundPoint& g) {
 
 GroundPoint ToGround(const LoadedModel& model, const ImagePoint& i, double z) {
     GroundPoint g{0.0, 0.0, z};
-    if (!GenImg2Geo(model.nModelCode, model.poRecord.get(), i.pixel, i.line, z, &g.x, &g.y)) {
+    if (!GenImg2Geo(model.nModelCode, model.poRecord.get(), i.pixel, i.line, z, &g.x, &g.y) ||
+        !IsPosition(g.x, g.y)) {
         LUMO_CLI_FAIL(model.sEnvelope.osSource + ": the model cannot map image point (" +
                       FormatDouble(i.pixel) + ", " + FormatDouble(i.line) + ") to the ground");
     }

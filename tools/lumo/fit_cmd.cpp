@@ -39,6 +39,8 @@ struct FitOptions {
     int nOrder = 0;         // 0: not given
     int nPixels = -1;       // -1: from the control points
     int nLines = -1;
+    bool bAllowLowerOrder = false;  // write a lower order than asked for instead of failing
+    PointFileOptions sPoints;       // --height
 };
 
 // The control points as the parallel arrays the fitting functions take.
@@ -122,14 +124,45 @@ double RawCoefficientError(const POLYInfo_t& poly, const GEOInfo_t& forward,
     return std::isnan(worst) ? std::numeric_limits<double>::infinity() : worst;
 }
 
-PolyPtr FitPoly(const FitOptions& options, ControlArrays& c, CommandContext& context) {
+// Why a regression fitted less than the order asked for; empty when it did not.
+std::string LoweredReason(const GEOInfo_t& fit, int requested) {
+    const std::string points = "the " + std::to_string(fit.nPoints) + " control points ";
+    if (fit.nFitKind == GCP_FIT_SHIFT) return points + "are all at one place (only a shift fits)";
+    if (fit.nFitKind == GCP_FIT_SIMILARITY) {
+        return points + "are fewer than 3 or collinear (only a rotation, scale and shift fit)";
+    }
+    if (fit.nOrder >= requested) return "";
+    const int terms = (requested + 1) * (requested + 2) / 2;
+    return points + "determine only order " + std::to_string(fit.nOrder) + " (order " +
+           std::to_string(requested) + " has " + std::to_string(terms) +
+           " terms and needs at least as many well-spread points)";
+}
+
+// Refuses a fit of lower order than asked for, unless --allow-lower-order.
+void CheckFittedOrder(const FitOptions& options, int requested, const GEOInfo_t& forward,
+                      const GEOInfo_t& inverse, CommandContext& context) {
+    std::string reason = LoweredReason(forward, requested);
+    if (reason.empty()) reason = LoweredReason(inverse, requested);
+    if (reason.empty()) return;
+    const std::string asked = "order " + std::to_string(requested) +
+                              (options.nOrder == 0 ? " (the default)" : "") +
+                              " was asked for, but " + reason;
+    if (!options.bAllowLowerOrder) {
+        LUMO_CLI_FAIL(options.osGcps + ": " + asked +
+                      "; give --allow-lower-order to write the lower order");
+    }
+    context.err << "lumo fit: " << asked << "; writing the lower order\n";
+}
+
+PolyPtr FitPoly(const FitOptions& options, const std::string& geosys, ControlArrays& c,
+                CommandContext& context) {
     const int requested = options.nOrder == 0 ? 1 : options.nOrder;
     std::unique_ptr<GEOInfo_t> forward(new GEOInfo_t{});
     std::unique_ptr<GEOInfo_t> inverse(new GEOInfo_t{});
     int orderForward = requested;
     int orderInverse = requested;
     double rmsPixel = 0, rmsLine = 0, rmsX = 0, rmsY = 0;
-    const char* unit = options.osGeosys.c_str();
+    const char* unit = geosys.c_str();
     GCPRegression2(forward.get(), unit, c.x.data(), c.y.data(), "PIXEL", c.pixel.data(),
                    c.line.data(), c.Count(), &orderForward, 0, &rmsPixel, &rmsLine);
     GCPRegression2(inverse.get(), "PIXEL", c.pixel.data(), c.line.data(), unit, c.x.data(),
@@ -151,10 +184,7 @@ PolyPtr FitPoly(const FitOptions& options, ControlArrays& c, CommandContext& con
                       Number(rawError) + " pixels (more than " + Number(kRawTolerancePixels) +
                       "); use a lower --order");
     }
-    if (orderForward != requested || orderInverse != requested) {
-        context.err << "lumo fit: the control points determine only order "
-                    << std::min(orderForward, orderInverse) << " (asked for " << requested << ")\n";
-    }
+    CheckFittedOrder(options, requested, *forward, *inverse, context);
     context.out << "fitted poly: order " << std::max(orderForward, orderInverse) << " ("
                 << poly->nCoeffs << " terms) to " << c.Count() << " control points\n"
                 << "rms ground->image: pixel " << Number(rmsPixel) << ", line " << Number(rmsLine)
@@ -183,24 +213,44 @@ TpsPtr FitTps(ControlArrays& c, CommandContext& context) {
     return tps;
 }
 
+// The georeferencing of the control points' ground coordinates: --geosys,
+// else the file's "# geosys:" comment (the two must agree).
+std::string FitGeosys(const FitOptions& options, const PointSet& gcps) {
+    if (options.osGeosys.empty() || gcps.osGeosys.empty()) {
+        return options.osGeosys.empty() ? gcps.osGeosys : options.osGeosys;
+    }
+    PointFileOptions given = options.sPoints;
+    given.osGeosys = options.osGeosys;
+    DeclaredGeoref(gcps, given);  // refuses a contradiction
+    return options.osGeosys;
+}
+
 void RunFit(const FitOptions& options, CommandContext& context) {
     if (options.osModel != "poly" && options.nOrder != 0) {
         throw CLI::ValidationError("--order applies to --model poly only");
     }
-    if (options.osModel == "srit") {
-        RunSritFit(options.osGcps, options.osSegment, options.osGeosys, options.osOutput, context);
-        return;
+    if (options.osModel != "poly" && options.bAllowLowerOrder) {
+        throw CLI::ValidationError("--allow-lower-order applies to --model poly only");
     }
-    if (!options.osSegment.empty()) {
+    if (options.osModel != "srit" && !options.osSegment.empty()) {
         throw CLI::ValidationError("--segment applies to --model srit only");
     }
-    if (options.osGeosys.empty()) {
-        throw CLI::ValidationError("--geosys is required for --model poly and tps");
+    PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    const bool bRigorous = options.osModel == "srit";
+    ApplyHeights(gcps, options.sPoints, bRigorous, "the rigorous model");
+    const std::string geosys = FitGeosys(options, gcps);
+    if (bRigorous) {
+        RunSritFit(gcps, options.osSegment, geosys, options.osOutput, context);
+        return;
+    }
+    if (geosys.empty()) {
+        throw CLI::ValidationError(
+            "--geosys is required for --model poly and tps (or a \"# geosys:\" line in the "
+            "control point file)");
     }
     ProjInfo_t projInfo{};
-    CheckGeosys(options.osGeosys, &projInfo);
-    const PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
-    if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    CheckGeosys(geosys, &projInfo);
     ControlArrays c = ToArrays(gcps);
     int nPixels = 0;
     int nLines = 0;
@@ -208,17 +258,17 @@ void RunFit(const FitOptions& options, CommandContext& context) {
 
     nlohmann::json document;
     if (options.osModel == "poly") {
-        PolyPtr poly = FitPoly(options, c, context);
+        PolyPtr poly = FitPoly(options, geosys, c, context);
         poly->nPixels = nPixels;
         poly->nLines = nLines;
-        std::memcpy(poly->pszGeosys, options.osGeosys.c_str(), options.osGeosys.size() + 1);
+        std::memcpy(poly->pszGeosys, geosys.c_str(), geosys.size() + 1);
         *poly->psProjInfo = projInfo;
         document = PolyToJson(*poly);
     } else {
         TpsPtr tps = FitTps(c, context);
         tps->nPixels = nPixels;
         tps->nLines = nLines;
-        std::memcpy(tps->pszGeosys, options.osGeosys.c_str(), options.osGeosys.size() + 1);
+        std::memcpy(tps->pszGeosys, geosys.c_str(), geosys.size() + 1);
         *tps->psProjInfo = projInfo;
         document = TpsToJson(*tps);
     }
@@ -252,6 +302,10 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
         ->add_option("--lines", options->nLines,
                      "image height (default: just above the largest control point line)")
         ->check(CLI::NonNegativeNumber);
+    command->add_flag("--allow-lower-order", options->bAllowLowerOrder,
+                      "poly: write the lower order the control points determine instead of "
+                      "failing");
+    AddHeightOption(*command, options->sPoints);
     command->add_option("-o,--output", options->osOutput, "model file to write (JSON)")->required();
     command->callback([options, &context] { RunFit(*options, context); });
 }

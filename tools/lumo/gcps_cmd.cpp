@@ -23,6 +23,7 @@ struct GcpsConvertOptions {
     std::string osHeightRef;
     std::string osInput;
     std::string osOutput;
+    PointFileOptions sPoints;  // --height
 };
 
 ProjInfo_t ProjectionOf(const std::string& osGeosys) {
@@ -59,6 +60,8 @@ std::vector<ControlPoint_t> ToControlPoints(const PointSet& points) {
 void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) {
     const ProjInfo_t sProj = ProjectionOf(options.osGeosys);
     PointSet points = ReadPointsFile(options.osInput, PointKind::ControlPoint);
+    // The converted heights depend on the heights given: none are assumed.
+    ApplyHeights(points, options.sPoints, true, "the datum conversion");
     std::vector<ControlPoint_t> asGcps = ToControlPoints(points);
     try {
         ConvertGcpsToWgs84Ell(sProj, options.osHeightRef, asGcps);
@@ -67,6 +70,8 @@ void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) 
     } catch (const nova::DataException& e) {
         FailConversion(points, e);
     }
+    points.osGeosys = "LONG/LAT D000";  // WGS 84 longitude and latitude
+    points.osProjParms.clear();
     for (std::size_t i = 0; i < asGcps.size(); ++i) {
         points.asPoints[i].dfX = asGcps[i].dfGroundX;
         points.asPoints[i].dfY = asGcps[i].dfGroundY;
@@ -105,6 +110,7 @@ void AddGcpsCommand(CLI::App& app, CommandContext& context) {
         ->required();
     convert->add_option("-o,--output", options->osOutput,
                         "output CSV file (standard output when not given)");
+    AddHeightOption(*convert, options->sPoints);
     convert->callback([options, &context] { RunGcpsConvert(*options, context); });
 }
 

@@ -38,6 +38,17 @@ ModelEnvelope ReadEnvelope(const json& document, const std::string& source) {
     return envelope;
 }
 
+// Refuses a model file of another family than the one a command needs.
+void RequireFamily(const ModelEnvelope& envelope, const char* pszFamily) {
+    if (envelope.osFamily == pszFamily) return;
+    std::string wanted = Quoted(pszFamily) + " model";
+    for (const ModelFamilyCodec& codec : ModelFamilies()) {
+        if (std::string(codec.pszFamily) == pszFamily) wanted = codec.pszDescription;
+    }
+    LUMO_CLI_FAIL(envelope.osSource + ": holds a " + Quoted(envelope.osFamily) + " model, not a " +
+                  wanted);
+}
+
 std::shared_ptr<void> ReadPolyRecord(const ModelEnvelope& envelope, const json& section) {
     return SharePolyRecord(PolyFromJson(envelope, section));
 }
@@ -90,6 +101,12 @@ LoadedModel ReadModel(const json& document, const std::string& source) {
 
 LoadedModel ReadModelFile(const std::string& path) {
     return ReadModel(ParseJsonFile(path), path);
+}
+
+LoadedModel ReadModelFileOf(const std::string& path, const char* pszFamily) {
+    const json document = ParseJsonFile(path);
+    RequireFamily(ReadEnvelope(document, path), pszFamily);
+    return ReadModel(document, path);
 }
 
 void EnvelopeToProjInfo(const ModelEnvelope& envelope, ProjInfo_t* psProjInfo) {
@@ -164,10 +181,7 @@ json PolyToJson(const POLYInfo_t& poly) {
 PolyPtr ReadPolyModelFile(const std::string& path) {
     const json document = ParseJsonFile(path);
     const ModelEnvelope envelope = ReadEnvelope(document, path);
-    if (envelope.osFamily != "poly") {
-        LUMO_CLI_FAIL(path + ": holds a " + Quoted(envelope.osFamily) +
-                      " model, not a polynomial model");
-    }
+    RequireFamily(envelope, "poly");
     const FieldContext ctx{path, ""};
     const json& section = RequireObjectField(document, "poly", ctx);
     return PolyFromJson(envelope, section);

@@ -58,6 +58,9 @@ const std::vector<ModelFamilyCodec>& ModelFamilies();
 // the file and the field (or the JSON position).
 LoadedModel ReadModel(const nlohmann::json& document, const std::string& source);
 LoadedModel ReadModelFile(const std::string& path);
+// A model file that must hold the family `pszFamily` ("poly", ...); another
+// family is refused before its section is read.
+LoadedModel ReadModelFileOf(const std::string& path, const char* pszFamily);
 nlohmann::json ParseJsonFile(const std::string& path);
 
 // The polynomial family.

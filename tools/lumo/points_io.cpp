@@ -15,6 +15,7 @@
 namespace lumo::cli {
 namespace {
 
+// The columns a point file is read from.
 constexpr std::array<PointColumn, 6> kAllColumns = {PointColumn::Id,   PointColumn::Pixel,
                                                     PointColumn::Line, PointColumn::X,
                                                     PointColumn::Y,    PointColumn::Z};
@@ -47,6 +48,24 @@ std::vector<std::string> SplitFields(const std::string& line) {
 bool IsSkippable(const std::string& line) {
     const std::string text = Trim(line);
     return text.empty() || text[0] == '#';
+}
+
+// A "# geosys: TEXT" or "# projParms: TEXT" comment ahead of the points
+// declares the georeferencing of their ground coordinates.
+void ReadGeorefComment(const std::string& line, const std::string& where, PointSet& set) {
+    const std::string text = Trim(line);
+    if (text.empty() || text[0] != '#') return;
+    const std::string body = Trim(text.substr(1));
+    const auto colon = body.find(':');
+    if (colon == std::string::npos) return;
+    const std::string key = Lower(Trim(body.substr(0, colon)));
+    std::string* target = key == "geosys"      ? &set.osGeosys
+                          : key == "projparms" ? &set.osProjParms
+                                               : nullptr;
+    if (target == nullptr) return;
+    if (!target->empty()) LUMO_CLI_FAIL(where + ": a second " + Quoted(key) + " comment");
+    *target = Trim(body.substr(colon + 1));
+    if (target->empty()) LUMO_CLI_FAIL(where + ": the " + Quoted(key) + " comment gives no text");
 }
 
 std::vector<PointColumn> RequiredColumns(PointKind kind) {
@@ -147,6 +166,7 @@ double ColumnValue(const PointRecord& p, PointColumn c) {
             return p.dfY;
         case PointColumn::Z:
         case PointColumn::Id:
+        case PointColumn::Status:
             break;
     }
     return p.dfZ;
@@ -168,6 +188,8 @@ const char* PointColumnName(PointColumn column) {
             return "y";
         case PointColumn::Z:
             return "z";
+        case PointColumn::Status:
+            return "status";
     }
     return "";
 }
@@ -180,8 +202,11 @@ PointSet ReadPoints(std::istream& in, const std::string& source, PointKind kind)
     std::optional<ColumnMap> header;
     while (std::getline(in, line)) {
         ++lineNumber;
-        if (IsSkippable(line)) continue;
         const std::string where = source + ":" + std::to_string(lineNumber);
+        if (IsSkippable(line)) {
+            if (set.asPoints.empty()) ReadGeorefComment(line, where, set);
+            continue;
+        }
         if (!header) {
             header = ParseHeader(line, where);
             RequireColumns(*header, kind, where);
@@ -216,8 +241,16 @@ std::string FormatDouble(double value) {
     return std::string(buffer.data(), result.ptr);
 }
 
-void WritePoints(std::ostream& out, const PointSet& points,
-                 const std::vector<PointColumn>& columns) {
+std::string GeorefComments(const PointSet& points) {
+    std::string text;
+    if (!points.osGeosys.empty()) text += "# geosys: " + points.osGeosys + "\n";
+    if (!points.osProjParms.empty()) text += "# projParms: " + points.osProjParms + "\n";
+    return text;
+}
+
+void WritePoints(std::ostream& out, const PointSet& points, const std::vector<PointColumn>& columns,
+                 const std::vector<PointColumn>& computed) {
+    out << GeorefComments(points);
     for (std::size_t i = 0; i < columns.size(); ++i) {
         out << (i ? "," : "") << PointColumnName(columns[i]);
     }
@@ -225,8 +258,13 @@ void WritePoints(std::ostream& out, const PointSet& points,
     for (const PointRecord& p : points.asPoints) {
         for (std::size_t i = 0; i < columns.size(); ++i) {
             if (i) out << ',';
+            const bool bEmpty = p.Failed() && std::find(computed.begin(), computed.end(),
+                                                        columns[i]) != computed.end();
+            if (bEmpty) continue;
             if (columns[i] == PointColumn::Id) {
                 out << p.osId;
+            } else if (columns[i] == PointColumn::Status) {
+                out << p.osStatus;
             } else {
                 out << FormatDouble(ColumnValue(p, columns[i]));
             }

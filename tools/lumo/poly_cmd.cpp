@@ -14,10 +14,7 @@ void AddPolyCommand(CLI::App& app, CommandContext& context) {
     AddTransformArguments(*command, *options);
     command->callback([options, &context] {
         RequireDirection(*options);
-        LoadedModel model;
-        model.nModelCode = LUMO_CODE_POLY;
-        model.poRecord = SharePolyRecord(ReadPolyModelFile(options->osModel));
-        RunTransformOptions(*options, model, context);
+        RunTransformOptions(*options, ReadModelFileOf(options->osModel, "poly"), context);
     });
 }
 

@@ -14,6 +14,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "points_io.h"
+#include "transform.h"
 
 namespace lumo::cli {
 namespace {
@@ -22,52 +23,70 @@ struct ResidualsOptions {
     std::string osModel;
     std::string osGcps;
     std::string osOutput;
+    PointFileOptions sPoints;
 };
 
-// Model position minus control point position, both directions.
+// Model position minus control point position, both directions; a direction
+// that failed has no residual.
 struct Residual {
     double dPixel = 0.0;
     double dLine = 0.0;
     double dX = 0.0;
     double dY = 0.0;
+    bool bImage = false;
+    bool bGround = false;
 };
 
-// Sums of squares and largest distances over the points.
+// Sums of squares and largest distances over the residuals computed.
 struct Summary {
-    std::size_t nCount = 0;
+    std::size_t nImage = 0, nGround = 0, nFailed = 0;
     double sumPixel2 = 0, sumLine2 = 0, sumX2 = 0, sumY2 = 0;
     double maxImage = 0, maxGround = 0;
 
     void Add(const Residual& r) {
-        ++nCount;
-        sumPixel2 += r.dPixel * r.dPixel;
-        sumLine2 += r.dLine * r.dLine;
-        sumX2 += r.dX * r.dX;
-        sumY2 += r.dY * r.dY;
-        maxImage = std::max(maxImage, std::hypot(r.dPixel, r.dLine));
-        maxGround = std::max(maxGround, std::hypot(r.dX, r.dY));
+        if (r.bImage) {
+            ++nImage;
+            sumPixel2 += r.dPixel * r.dPixel;
+            sumLine2 += r.dLine * r.dLine;
+            maxImage = std::max(maxImage, std::hypot(r.dPixel, r.dLine));
+        }
+        if (r.bGround) {
+            ++nGround;
+            sumX2 += r.dX * r.dX;
+            sumY2 += r.dY * r.dY;
+            maxGround = std::max(maxGround, std::hypot(r.dX, r.dY));
+        }
+        if (!r.bImage || !r.bGround) ++nFailed;
     }
-    double Rms(double sum) const { return nCount ? std::sqrt(sum / nCount) : 0.0; }
+    static double Rms(double sum, std::size_t n) { return n ? std::sqrt(sum / n) : 0.0; }
 };
 
-[[noreturn]] void FailPoint(const PointSet& gcps, const PointRecord& p, const std::string& what) {
-    std::string name = gcps.osSource + ":" + std::to_string(p.nSourceLine);
-    if (!p.osId.empty()) name += " (id " + Quoted(p.osId) + ")";
-    LUMO_CLI_FAIL(name + ": " + what);
-}
-
-Residual ResidualOf(const LoadedModel& model, const PointSet& gcps, const PointRecord& p) {
-    void* record = model.poRecord.get();
-    double pixel = 0, line = 0, x = 0, y = 0;
-    if (!GenGeo2Img(model.nModelCode, record, p.dfX, p.dfY, p.dfZ, &pixel, &line) ||
-        !std::isfinite(pixel) || !std::isfinite(line)) {
-        FailPoint(gcps, p, "the model cannot map this ground point to the image");
+// Residuals of one control point whose ground position in the model's system
+// is `ground`; a direction the model cannot compute fails the point.
+Residual ResidualOf(const LoadedModel& model, const GroundXY& ground, PointRecord& p) {
+    Residual r;
+    if (p.Failed()) return r;  // the ground position could not be converted
+    PointRecord image = p;
+    image.dfX = ground.x;
+    image.dfY = ground.y;
+    TransformPoint(model, Direction::ToImage, image);
+    PointRecord back = p;
+    TransformPoint(model, Direction::ToGround, back);
+    r.bImage = !image.Failed();
+    r.bGround = !back.Failed();
+    if (r.bImage) {
+        r.dPixel = image.dfPixel - p.dfPixel;
+        r.dLine = image.dfLine - p.dfLine;
     }
-    if (!GenImg2Geo(model.nModelCode, record, p.dfPixel, p.dfLine, p.dfZ, &x, &y) ||
-        !std::isfinite(x) || !std::isfinite(y)) {
-        FailPoint(gcps, p, "the model cannot map this image point to the ground");
+    if (r.bGround) {
+        r.dX = back.dfX - ground.x;
+        r.dY = back.dfY - ground.y;
     }
-    return Residual{pixel - p.dfPixel, line - p.dfLine, x - p.dfX, y - p.dfY};
+    if (!r.bImage || !r.bGround) {
+        p.Fail(!r.bGround ? (!r.bImage ? kFailedBothWays : kFailedToGround) : kFailedToImage,
+               r.bImage ? back.osProblem : image.osProblem);
+    }
+    return r;
 }
 
 std::string Number(double value) {
@@ -77,20 +96,34 @@ std::string Number(double value) {
 }
 
 // The summary as comment lines, which the point reader skips.
-std::string SummaryText(const Summary& s, const std::string& model) {
-    const double rmsPixel = s.Rms(s.sumPixel2), rmsLine = s.Rms(s.sumLine2);
-    const double rmsX = s.Rms(s.sumX2), rmsY = s.Rms(s.sumY2);
-    return "# residuals of " + model + " on " + std::to_string(s.nCount) +
-           " control points (model - control point)\n# rms dpixel " + Number(rmsPixel) +
-           ", dline " + Number(rmsLine) + ", image " + Number(std::hypot(rmsPixel, rmsLine)) +
-           ", max " + Number(s.maxImage) + " (pixels)\n# rms dx " + Number(rmsX) + ", dy " +
-           Number(rmsY) + ", ground " + Number(std::hypot(rmsX, rmsY)) + ", max " +
-           Number(s.maxGround) + " (ground units)\n";
+std::string SummaryText(const Summary& s, const std::string& model, std::size_t nPoints,
+                        const std::string& groundUnits) {
+    const double rmsPixel = s.Rms(s.sumPixel2, s.nImage), rmsLine = s.Rms(s.sumLine2, s.nImage);
+    const double rmsX = s.Rms(s.sumX2, s.nGround), rmsY = s.Rms(s.sumY2, s.nGround);
+    std::string text = "# residuals of " + model + " on " + std::to_string(nPoints) +
+                       " control points (model - control point)\n";
+    if (s.nFailed > 0) {
+        text += "# " + std::to_string(s.nFailed) +
+                " points failed in one or both directions (see the status column); the figures "
+                "below leave them out\n";
+    }
+    return text + "# rms dpixel " + Number(rmsPixel) + ", dline " + Number(rmsLine) + ", image " +
+           Number(std::hypot(rmsPixel, rmsLine)) + ", max " + Number(s.maxImage) +
+           " (pixels)\n# rms dx " + Number(rmsX) + ", dy " + Number(rmsY) + ", ground " +
+           Number(std::hypot(rmsX, rmsY)) + ", max " + Number(s.maxGround) + " (" + groundUnits +
+           ")\n";
 }
 
 void WriteTable(std::ostream& out, const PointSet& gcps, const std::vector<Residual>& residuals) {
+    out << GeorefComments(gcps);
     if (gcps.bHasId) out << "id,";
-    out << "pixel,line,x,y," << (gcps.bHasZ ? "z," : "") << "dpixel,dline,dx,dy\n";
+    out << "pixel,line,x,y," << (gcps.bHasZ ? "z," : "") << "dpixel,dline,dx,dy,status\n";
+    const auto pair = [&out](bool bKnown, double a, double b) {
+        if (bKnown)
+            out << FormatDouble(a) << ',' << FormatDouble(b);
+        else
+            out << ',';
+    };
     for (std::size_t i = 0; i < residuals.size(); ++i) {
         const PointRecord& p = gcps.asPoints[i];
         const Residual& r = residuals[i];
@@ -98,31 +131,43 @@ void WriteTable(std::ostream& out, const PointSet& gcps, const std::vector<Resid
         out << FormatDouble(p.dfPixel) << ',' << FormatDouble(p.dfLine) << ','
             << FormatDouble(p.dfX) << ',' << FormatDouble(p.dfY) << ',';
         if (gcps.bHasZ) out << FormatDouble(p.dfZ) << ',';
-        out << FormatDouble(r.dPixel) << ',' << FormatDouble(r.dLine) << ',' << FormatDouble(r.dX)
-            << ',' << FormatDouble(r.dY) << '\n';
+        pair(r.bImage, r.dPixel, r.dLine);
+        out << ',';
+        pair(r.bGround, r.dX, r.dY);
+        out << ',' << p.osStatus << '\n';
     }
 }
 
 void RunResiduals(const ResidualsOptions& options, CommandContext& context) {
     const LoadedModel model = ReadModelFile(options.osModel);
-    const PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    ApplyHeights(gcps, options.sPoints, ModelUsesHeight(model.nModelCode), "the model");
+    const Georef modelGeoref = ModelGeoref(model);
+    const Georef declared = DeclaredGeoref(gcps, options.sPoints);
+    const std::vector<GroundXY> ground =
+        GroundInModelSystem(gcps, declared, modelGeoref, kFailedBothWays, context.err);
+    DeclareGeoref(gcps, declared.Known() ? declared : modelGeoref);
     std::vector<Residual> residuals;
     Summary summary;
-    for (const PointRecord& p : gcps.asPoints) {
-        residuals.push_back(ResidualOf(model, gcps, p));
+    for (std::size_t i = 0; i < gcps.asPoints.size(); ++i) {
+        residuals.push_back(ResidualOf(model, ground[i], gcps.asPoints[i]));
         summary.Add(residuals.back());
     }
     std::ostringstream text;
     WriteTable(text, gcps, residuals);
-    const std::string summaryText = SummaryText(summary, options.osModel);
+    const std::string units =
+        modelGeoref.Known() ? "ground units of " + Quoted(modelGeoref.osGeosys) : "ground units";
+    const std::string summaryText =
+        SummaryText(summary, options.osModel, gcps.asPoints.size(), units);
     text << summaryText;
     if (options.osOutput.empty()) {
         context.out << text.str();
-        return;
+    } else {
+        WriteFileReplacing(options.osOutput, text.str());
+        context.out << summaryText;
     }
-    WriteFileReplacing(options.osOutput, text.str());
-    context.out << summaryText;
+    ReportFailedPoints(gcps, "residuals", options.sPoints.bKeepGoing, context);
 }
 
 }  // namespace
@@ -136,6 +181,7 @@ void AddResidualsCommand(CLI::App& app, CommandContext& context) {
         ->required();
     command->add_option("-o,--output", options->osOutput,
                         "output CSV file (standard output when not given)");
+    AddPointFileOptions(*command, options->sPoints);
     command->callback([options, &context] { RunResiduals(*options, context); });
 }
 

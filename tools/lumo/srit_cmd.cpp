@@ -3,7 +3,6 @@
 #include <cstdio>
 #include <cstring>
 #include <ostream>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -13,7 +12,6 @@
 #include "points_io.h"
 #include "segment_io.h"
 #include "srit_io.h"
-#include "transform.h"
 
 namespace lumo::cli {
 namespace {
@@ -26,8 +24,8 @@ std::string Number(double value) {
 
 }  // namespace
 
-void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
-                const std::string& geosys, const std::string& outputPath, CommandContext& context) {
+void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
+                const std::string& outputPath, CommandContext& context) {
     if (segmentPath.empty()) LUMO_CLI_FAIL("--model srit needs --segment");
     SegmentPtr psSegment = ReadSegmentFile(segmentPath);
     const std::string osGeosys =
@@ -41,14 +39,10 @@ void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
     if (Geosys2ProjInfo(&sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
         LUMO_CLI_FAIL("projection " + Quoted(osGeosys) + " is not a known georeferencing text");
     }
-    const PointSet gcps = ReadPointsFile(gcpsPath, PointKind::ControlPoint);
     if (gcps.asPoints.size() < 3) {
-        LUMO_CLI_FAIL(gcpsPath + ": the rigorous model needs at least 3 control points, found " +
+        LUMO_CLI_FAIL(gcps.osSource +
+                      ": the rigorous model needs at least 3 control points, found " +
                       std::to_string(gcps.asPoints.size()));
-    }
-    if (!gcps.bHasZ) {
-        context.err << "lumo fit: " << gcpsPath
-                    << " has no z column; the control points are taken at height 0\n";
     }
     std::vector<double> p, l, x, y, z;
     for (const PointRecord& r : gcps.asPoints) {
@@ -61,7 +55,7 @@ void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
     SritPtr psModel(SRITAllocate());
     if (SRITCalculate(psModel.get(), true, psSegment.get(), static_cast<int>(p.size()), &sProj,
                       p.data(), l.data(), z.data(), x.data(), y.data()) != 1) {
-        LUMO_CLI_FAIL(gcpsPath + ": no rigorous model could be computed");
+        LUMO_CLI_FAIL(gcps.osSource + ": no rigorous model could be computed");
     }
     static_cast<void>(psSegment.release());  // adopted by the model
     double dfRmsPixel = 0.0, dfRmsLine = 0.0;
@@ -75,28 +69,10 @@ void RunSritFit(const std::string& gcpsPath, const std::string& segmentPath,
                 << ", line " << Number(dfRmsLine) << "\nwrote " << outputPath << "\n";
 }
 
-void TransformSritExactFile(const LoadedModel& model, const std::string& pointsPath,
-                            const std::string& outputPath, CommandContext& context) {
-    if (model.nModelCode != LUMO_CODE_SRIT) {
-        LUMO_CLI_FAIL(model.sEnvelope.osSource + ": --exact needs a rigorous (srit) model, found " +
-                      Quoted(model.sEnvelope.osFamily));
-    }
+bool SritExactToImage(const LoadedModel& model, double dfX, double dfY, double dfZ,
+                      double* pdfPixel, double* pdfLine) {
     const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
-    PointSet points = ReadPointsFile(pointsPath, PointKind::Ground);
-    for (PointRecord& p : points.asPoints) {
-        if (SRITGeo2ImgExact(psModel, p.dfX, p.dfY, p.dfZ, &p.dfPixel, &p.dfLine) != 1) {
-            std::string name = points.osSource + ":" + std::to_string(p.nSourceLine);
-            if (!p.osId.empty()) name += " (id " + Quoted(p.osId) + ")";
-            LUMO_CLI_FAIL(name + ": the exact inverse does not converge for this ground point");
-        }
-    }
-    std::ostringstream text;
-    WritePoints(text, points, OutputColumns(points, Direction::ToImage));
-    if (outputPath.empty()) {
-        context.out << text.str();
-        return;
-    }
-    WriteFileReplacing(outputPath, text.str());
+    return SRITGeo2ImgExact(psModel, dfX, dfY, dfZ, pdfPixel, pdfLine) == 1;
 }
 
 }  // namespace lumo::cli

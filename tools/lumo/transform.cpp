@@ -1,47 +1,73 @@
 #include "transform.h"
 
-#include <cmath>
 #include <ostream>
 #include <sstream>
 
 #include "cli_error.h"
+#include "commands.h"
 #include "progress.h"
 
 namespace lumo::cli {
 namespace {
 
-[[noreturn]] void FailPoint(const PointSet& points, const PointRecord& p, const char* what) {
-    std::string name = points.osSource + ":" + std::to_string(p.nSourceLine);
-    if (!p.osId.empty()) name += " (id " + Quoted(p.osId) + ")";
-    LUMO_CLI_FAIL(name + ": " + what);
+// Maps the ground position (x, y) of the model's system and the point's
+// height to the image.
+void MapToImage(const LoadedModel& model, bool bExact, double x, double y, PointRecord& p) {
+    double pixel = 0.0;
+    double line = 0.0;
+    const bool bMapped = bExact ? SritExactToImage(model, x, y, p.dfZ, &pixel, &line)
+                                : GenGeo2Img(model.nModelCode, model.poRecord.get(), x, y, p.dfZ,
+                                             &pixel, &line) != 0;
+    if (!bMapped || !IsPosition(pixel, line)) {
+        p.Fail(kFailedToImage, "the model gives no image position for this ground point");
+        return;
+    }
+    p.dfPixel = pixel;
+    p.dfLine = line;
 }
 
-void TransformOne(const LoadedModel& model, Direction direction, const PointSet& points,
-                  PointRecord& p) {
-    void* record = model.poRecord.get();
-    if (direction == Direction::ToImage) {
-        double pixel = 0.0;
-        double line = 0.0;
-        if (!GenGeo2Img(model.nModelCode, record, p.dfX, p.dfY, p.dfZ, &pixel, &line)) {
-            FailPoint(points, p, "the model cannot map this ground point to the image");
-        }
-        if (!std::isfinite(pixel) || !std::isfinite(line)) {
-            FailPoint(points, p, "the image position is not finite (input out of range)");
-        }
-        p.dfPixel = pixel;
-        p.dfLine = line;
-    } else {
-        double x = 0.0;
-        double y = 0.0;
-        if (!GenImg2Geo(model.nModelCode, record, p.dfPixel, p.dfLine, p.dfZ, &x, &y)) {
-            FailPoint(points, p, "the model cannot map this image point to the ground");
-        }
-        if (!std::isfinite(x) || !std::isfinite(y)) {
-            FailPoint(points, p, "the ground position is not finite (input out of range)");
-        }
-        p.dfX = x;
-        p.dfY = y;
+void MapToGround(const LoadedModel& model, PointRecord& p) {
+    double x = 0.0;
+    double y = 0.0;
+    if (!GenImg2Geo(model.nModelCode, model.poRecord.get(), p.dfPixel, p.dfLine, p.dfZ, &x, &y) ||
+        !IsPosition(x, y)) {
+        p.Fail(kFailedToGround, "the model gives no ground position for this image point");
+        return;
     }
+    p.dfX = x;
+    p.dfY = y;
+}
+
+// The family name for messages ("the rational function model").
+std::string ModelName(const LoadedModel& model) {
+    for (const ModelFamilyCodec& codec : ModelFamilies()) {
+        if (codec.nModelCode == model.nModelCode) return std::string("the ") + codec.pszDescription;
+    }
+    return "the model";
+}
+
+void TransformAll(const LoadedModel& model, const TransformOptions& options, Direction direction,
+                  PointSet& points, CommandContext& context) {
+    const Georef modelGeoref = ModelGeoref(model);
+    const Georef declared = DeclaredGeoref(points, options.sPoints);
+    Progress progress("transforming", points.asPoints.size());
+    std::size_t done = 0;
+    if (direction == Direction::ToImage) {
+        const std::vector<GroundXY> ground =
+            GroundInModelSystem(points, declared, modelGeoref, kFailedToImage, context.err);
+        for (std::size_t i = 0; i < ground.size(); ++i) {
+            PointRecord& p = points.asPoints[i];
+            if (!p.Failed()) MapToImage(model, options.bExact, ground[i].x, ground[i].y, p);
+            progress.Update(++done);
+        }
+        DeclareGeoref(points, declared.Known() ? declared : modelGeoref);
+        return;
+    }
+    for (PointRecord& p : points.asPoints) {
+        MapToGround(model, p);
+        progress.Update(++done);
+    }
+    GroundToDeclaredSystem(points, modelGeoref, declared, kFailedToGround);
 }
 
 }  // namespace
@@ -56,37 +82,47 @@ std::vector<PointColumn> OutputColumns(const PointSet& points, Direction directi
     if (direction == Direction::ToImage) {
         columns.insert(columns.end(), {PointColumn::X, PointColumn::Y});
         if (points.bHasZ) columns.push_back(PointColumn::Z);
-        columns.insert(columns.end(), {PointColumn::Pixel, PointColumn::Line});
     } else {
         columns.insert(columns.end(), {PointColumn::Pixel, PointColumn::Line});
         if (points.bHasZ) columns.push_back(PointColumn::Z);
-        columns.insert(columns.end(), {PointColumn::X, PointColumn::Y});
     }
+    const std::vector<PointColumn> computed = ComputedColumns(direction);
+    columns.insert(columns.end(), computed.begin(), computed.end());
+    columns.push_back(PointColumn::Status);
     return columns;
 }
 
-void TransformPoints(const LoadedModel& model, Direction direction, PointSet& points) {
-    Progress progress("transforming", points.asPoints.size());
-    std::size_t done = 0;
-    for (PointRecord& p : points.asPoints) {
-        TransformOne(model, direction, points, p);
-        progress.Update(++done);
+std::vector<PointColumn> ComputedColumns(Direction direction) {
+    if (direction == Direction::ToImage) return {PointColumn::Pixel, PointColumn::Line};
+    return {PointColumn::X, PointColumn::Y};
+}
+
+void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p) {
+    if (direction == Direction::ToImage) {
+        MapToImage(model, false, p.dfX, p.dfY, p);
+    } else {
+        MapToGround(model, p);
     }
 }
 
-void TransformPointFile(const LoadedModel& model, Direction direction,
-                        const std::string& pointsPath, const std::string& outPath,
-                        std::ostream& out) {
+void RunTransform(const TransformOptions& options, const LoadedModel& model,
+                  CommandContext& context) {
+    const Direction direction =
+        options.osToImage.empty() ? Direction::ToGround : Direction::ToImage;
+    const std::string& pointsPath =
+        direction == Direction::ToImage ? options.osToImage : options.osToGround;
     PointSet points = ReadPointsFile(pointsPath, InputKind(direction));
-    TransformPoints(model, direction, points);
-    const std::vector<PointColumn> columns = OutputColumns(points, direction);
-    if (outPath.empty()) {
-        WritePoints(out, points, columns);
-        return;
-    }
+    ApplyHeights(points, options.sPoints, ModelUsesHeight(model.nModelCode), ModelName(model));
+    TransformAll(model, options, direction, points, context);
     std::ostringstream text;
-    WritePoints(text, points, columns);
-    WriteFileReplacing(outPath, text.str());
+    WritePoints(text, points, OutputColumns(points, direction), ComputedColumns(direction));
+    if (options.osOutput.empty()) {
+        context.out << text.str();
+    } else {
+        WriteFileReplacing(options.osOutput, text.str());
+    }
+    ReportFailedPoints(points, options.bExact ? "transform --exact" : "transform",
+                       options.sPoints.bKeepGoing, context);
 }
 
 }  // namespace lumo::cli

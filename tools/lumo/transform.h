@@ -2,7 +2,6 @@
 // generic dispatch on the model code.
 #pragma once
 
-#include <iosfwd>
 #include <string>
 #include <vector>
 
@@ -11,26 +10,30 @@
 
 namespace lumo::cli {
 
+struct CommandContext;
+struct TransformOptions;
+
 enum class Direction { ToImage, ToGround };
 
 // Kind of point file a direction reads.
 PointKind InputKind(Direction direction);
 
 // Columns written for the result: the id and the input coordinates as read,
-// then the computed ones.
+// then the computed ones and the status.
 std::vector<PointColumn> OutputColumns(const PointSet& points, Direction direction);
+// The columns a direction computes, left empty for a failed point.
+std::vector<PointColumn> ComputedColumns(Direction direction);
 
-// Transforms every point in place: ground to image fills pixel and line,
-// image to ground (at the point's height) fills x and y. Throws
-// nova::DataException naming the point when the model fails or gives a value
-// that is not finite.
-void TransformPoints(const LoadedModel& model, Direction direction, PointSet& points);
+// Maps one point in place (ground coordinates in the model's system): ground
+// to image fills pixel and line, image to ground (at the point's height)
+// fills x and y. A point the model cannot map, or maps to no real position,
+// is failed instead.
+void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p);
 
-// Reads the point file, transforms it and writes the result to `outPath`, or
-// to `out` when `outPath` is empty. An existing output file is replaced only
-// once every point has been transformed.
-void TransformPointFile(const LoadedModel& model, Direction direction,
-                        const std::string& pointsPath, const std::string& outPath,
-                        std::ostream& out);
+// Reads the point file of `options`, transforms it and writes the result to
+// the output file (replaced only once complete), or to standard output.
+// Failed points are written with empty fields and counted on standard error.
+void RunTransform(const TransformOptions& options, const LoadedModel& model,
+                  CommandContext& context);
 
 }  // namespace lumo::cli

@@ -4,6 +4,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include "cli_error.h"
 #include "commands.h"
 #include "transform.h"
 
@@ -18,17 +19,12 @@ void AddTransformArguments(CLI::App& command, TransformOptions& options) {
     toImage->excludes(toGround);
     command.add_option("-o,--output", options.osOutput,
                        "output CSV file (standard output when not given)");
+    AddPointFileOptions(command, options.sPoints);
 }
 
 void RunTransformOptions(const TransformOptions& options, const LoadedModel& model,
                          CommandContext& context) {
-    if (!options.osToImage.empty()) {
-        TransformPointFile(model, Direction::ToImage, options.osToImage, options.osOutput,
-                           context.out);
-    } else {
-        TransformPointFile(model, Direction::ToGround, options.osToGround, options.osOutput,
-                           context.out);
-    }
+    RunTransform(options, model, context);
 }
 
 // The direction is checked before the model is read so that a usage error
@@ -44,20 +40,19 @@ void AddTransformCommand(CLI::App& app, CommandContext& context) {
     CLI::App* command =
         app.add_subcommand("transform", "Map points through a model file of any known family");
     AddTransformArguments(*command, *options);
-    auto exact = std::make_shared<bool>(false);
-    command->add_flag("--exact", *exact,
+    command->add_flag("--exact", options->bExact,
                       "rigorous models, --to-image: invert the image-to-ground equations exactly");
-    command->callback([options, exact, &context] {
+    command->callback([options, &context] {
         RequireDirection(*options);
-        if (*exact) {
-            if (options->osToImage.empty()) {
-                throw CLI::ValidationError("--exact applies to --to-image only");
-            }
-            TransformSritExactFile(ReadModelFile(options->osModel), options->osToImage,
-                                   options->osOutput, context);
-            return;
+        if (options->bExact && options->osToImage.empty()) {
+            throw CLI::ValidationError("--exact applies to --to-image only");
         }
-        RunTransformOptions(*options, ReadModelFile(options->osModel), context);
+        const LoadedModel model = ReadModelFile(options->osModel);
+        if (options->bExact && model.nModelCode != LUMO_CODE_SRIT) {
+            LUMO_CLI_FAIL(options->osModel + ": --exact needs a rigorous (srit) model, found " +
+                          Quoted(model.sEnvelope.osFamily));
+        }
+        RunTransformOptions(*options, model, context);
     });
 }
 
