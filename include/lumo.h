@@ -8,6 +8,7 @@
 #include "lumo_mathmodel.h"
 #include "lumo_poly.h"
 #include "lumo_rf.h"
+#include "lumo_rtcs.h"
 #include "lumo_sensor.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
