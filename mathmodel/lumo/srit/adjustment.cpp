@@ -1,0 +1,244 @@
+// The rigorous adjustment's driver: the projection and ellipsoid checks, the
+// fixed iterations with their parameter update, the filling of the model
+// record, and the one-image computation.
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <vector>
+
+#include "errors.h"
+#include "lumo_sensor.h"
+#include "runtime.h"
+#include "srit/srit_internal.h"
+
+namespace lumo {
+namespace srit {
+namespace {
+
+// Applies the corrections of the solution to every image's parameters.
+void UpdateParameters(Adjustment& sAdj, const double* pdfX) {
+    int nStart = 0;
+    for (ImageState& sImg : sAdj.asImages) {
+        const int* anPos = sImg.Positions();
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            if (anPos[p] >= sImg.sSetup.nUnknowns) continue;
+            const double dfCorrection = pdfX[nStart + anPos[p]];
+            if (p == 3 || p == 6) {
+                sImg.P[p] *= 1.0 + dfCorrection;  // relative unknowns
+            } else {
+                sImg.P[p] += dfCorrection;
+            }
+        }
+        sImg.UpdateDerived();
+        nStart += sImg.sSetup.nUnknowns;
+    }
+}
+
+// The fixed seven iterations: rows, constraints, solution, update, and the
+// elevations of points without one re-estimated after each.
+void RunIterations(Adjustment& sAdj) {
+    int nUnknowns = 0;
+    for (const ImageState& sImg : sAdj.asImages) nUnknowns += sImg.sSetup.nUnknowns;
+    const std::unique_ptr<NormalEquations> psNormal = MakeNormalEquations(nUnknowns);
+    NormalEquations& sNormal = *psNormal;
+    std::vector<double> adfX(static_cast<std::size_t>(nUnknowns), 0.0);
+    for (int nIteration = 0; nIteration < kIterations; ++nIteration) {
+        sNormal.Clear();
+        sAdj.dfMinControlWeight = 0.0;
+        sAdj.dfLastRowWeight = 0.0;
+        AddObservationRows(sAdj, sNormal);
+        AddConstraintRows(sAdj, sNormal);
+        if (!sNormal.Solve(adfX.data())) {
+            LUMO_TRACE(1, "SRIT iteration %d: singular normal equations\n", nIteration + 1);
+        }
+        UpdateParameters(sAdj, adfX.data());
+        EstimateElevations(sAdj, false);
+    }
+}
+}  // namespace
+
+void ImageState::UpdateDerived() {
+    c6 = std::cos(std::atan(P[7]));
+    c15 = P[4] / c6;
+    c9 = (P[4] * P[4] + 1.0) / (P[3] * c6) + 2.0 * (c15 * c15 + 1.0) / c0;
+}
+
+void ReportNullArgument(const char* pszName) {
+    lumo::Fatal(lumo::Err::kComputation,
+                MkName(_("SRITCalculate: argument %s is null.\n"), pszName));
+}
+
+// Ellipsoid of the control points' projection.
+Ellipsoid EllipsoidOf(const ProjInfo_t& sProj, const char* pszDecoded) {
+    double a = 0.0, b = 0.0;
+    if (sProj.nEarthModelKind == NOVA_EARTH_SPHEROID_PARMS) {
+        const int k = sProj.nSpheroid;
+        if (k >= 0 && k <= 19 && sProj.adfProjParms[0] == 0.0) {
+            int nCode = 0;
+            GetEllipsoidData(MkName("E%03d", k), &nCode, &a, &b);
+        } else {
+            a = sProj.adfProjParms[0];
+            const double s = sProj.adfProjParms[1];
+            if (s > 1.0) {
+                b = s;
+            } else if (s > 0.0) {
+                b = std::sqrt(a * a - s * a * a);
+            } else if (s == 0.0) {
+                b = a;
+            } else {
+                lumo::FatalReal(lumo::Err::kUnit, "Earth model", s, 2);
+            }
+        }
+    } else {
+        int nCode = 0;
+        GetEllipsoidData(pszDecoded, &nCode, &a, &b);
+    }
+    if (!(a > 0.0) || !(b > 0.0) || !(b <= a) || !std::isfinite(a)) {
+        lumo::FatalReal(lumo::Err::kUnit, "Earth model", a, 2);
+    }
+    return {a, (a * a - b * b) / (a * a)};
+}
+
+void RequireConformal(const ProjInfo_t& sProj, char* pszDecoded) {
+    DecodeGeosys(sProj.szProj, pszDecoded);
+    if (IsConformal(pszDecoded)) return;
+    lumo::PrintUserMessage(stdout,
+                           "Invalid GCP unit! Unit must be one of the following :\n"
+                           "UTM, KROV, LCC, MER, MSC, OM, PS, RSO, FOOT,\n"
+                           "SG, SOM, SPCS, SPIF, SPAF, TM, UPS, METRE \n");
+    lumo::FatalChar(lumo::Err::kUnit, "GCP Unit", pszDecoded);
+}
+
+// Writes an image's result into its model record, which adopts the segment.
+void FillRecord(const ImageState& sImg, SRITInfo_t* psModel, EphemerisSeg_t* psEphemeris,
+                const ProjInfo_t& sProj) {
+    const double* P = sImg.P;
+    double* c = psModel->adfCoef;
+    c[0] = sImg.c0;
+    c[1] = P[5];
+    c[2] = sImg.c2;
+    c[3] = P[8];
+    c[4] = sImg.c4;
+    c[5] = P[9];
+    c[6] = std::cos(std::atan(P[7]));
+    c[7] = P[10];
+    c[8] = P[2];
+    c[15] = P[4] / c[6];
+    c[9] = (P[4] * P[4] + 1.0) / (P[3] * c[6]) + 2.0 * (c[15] * c[15] + 1.0) / c[0];
+    c[10] = sImg.c10;
+    c[11] = P[6];
+    c[12] = P[3];
+    c[13] = P[7];
+    c[14] = P[4];
+    c[16] = P[0];
+    c[17] = P[1];
+    c[18] = P[12];
+    c[19] = P[11];
+    c[20] = c[21] = c[22] = 0.0;
+    // The line arrays describe the adopted segment only: arrays of an
+    // earlier segment would not match its table.
+    std::free(psModel->padfLineShiftB);
+    std::free(psModel->padfLineShiftA);
+    psModel->padfLineShiftB = nullptr;
+    psModel->padfLineShiftA = nullptr;
+    if (sImg.bHasLineArrays) {
+        const std::size_t n = sImg.adfLineA.size();
+        psModel->padfLineShiftB = static_cast<double*>(HMalloc(n * sizeof(double)));
+        psModel->padfLineShiftA = static_cast<double*>(HMalloc(n * sizeof(double)));
+        std::copy(sImg.adfLineB.begin(), sImg.adfLineB.end(), psModel->padfLineShiftB);
+        std::copy(sImg.adfLineA.begin(), sImg.adfLineA.end(), psModel->padfLineShiftA);
+    }
+    std::memcpy(psModel->Sensor, sImg.sSetup.szShortName, SRIT_SENSOR_SIZE);
+    psModel->nSensor = sImg.sSetup.nSensor;
+    psModel->nModelClass = GetModel(sImg.sSetup.nSensor);
+    if (psModel->psEphemeris != psEphemeris) {
+        LumoSatEphemerisFree(psModel->psEphemeris);
+        psModel->psEphemeris = psEphemeris;
+    }
+    if (psModel->psProjInfo == nullptr) {
+        psModel->psProjInfo = static_cast<ProjInfo_t*>(HCalloc(1, sizeof(ProjInfo_t)));
+    }
+    if (psModel->psProjInfo != &sProj) *psModel->psProjInfo = sProj;
+}
+
+// Starting values, first elevations, the iterations, and a check that every
+// image's parameters stayed numbers.
+void Adjust(Adjustment& sAdj, const char* pszFunction) {
+    ComputeStartingValues(sAdj);
+    for (ImageState& sImage : sAdj.asImages) sImage.UpdateDerived();
+    EstimateElevations(sAdj, true);
+    RunIterations(sAdj);
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            if (std::isfinite(sAdj.asImages[k].P[p])) continue;
+            lumo::Fatal(lumo::Err::kComputation,
+                        MkName(_("%s: the adjustment of image %d diverged (parameter %d is not a "
+                                 "number); check the control points.\n"),
+                               pszFunction, static_cast<int>(k), p));
+        }
+    }
+}
+
+int CalculateOne(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psEphemeris, int nGCP,
+                 const ProjInfo_t* psProjInfo, const double* padfA, const double* padfB,
+                 const double* padfZ, const double* padfC, const double* padfD) {
+    if (nGCP < 3) return 0;
+    RequireArgument(psModel, "psModel");
+    RequireArgument(psEphemeris, "psEphemeris");
+    RequireArgument(psProjInfo, "psProjInfo");
+    RequireArgument(padfA, "padfA");
+    RequireArgument(padfB, "padfB");
+    RequireArgument(padfZ, "padfZ");
+    RequireArgument(padfC, "padfC");
+    RequireArgument(padfD, "padfD");
+
+    char szDecoded[NOVA_GEOSYS_LEN] = {};
+    RequireConformal(*psProjInfo, szDecoded);
+    Adjustment sAdj;
+    sAdj.sEllipsoid = EllipsoidOf(*psProjInfo, szDecoded);
+
+    sAdj.asImages.resize(1);
+    ImageState& sImg = sAdj.asImages[0];
+    sImg.psSeg = psEphemeris;
+
+    // Control points: one full control point per observation, all in image 0.
+    sAdj.asPoints.resize(static_cast<std::size_t>(nGCP));
+    for (int i = 0; i < nGCP; ++i) {
+        PointRecord& sPoint = sAdj.asPoints[static_cast<std::size_t>(i)];
+        sPoint.cType = 'X';
+        sPoint.nInUse = 1;
+        sPoint.dfSdX = sPoint.dfSdY = sPoint.dfSdZ = 1.0;
+        sPoint.asSlots.resize(1);
+        PointSlot& sSlot = sPoint.asSlots[0];
+        sSlot.nFlag = 1;
+        sSlot.dfPixel = bImageFirst ? padfA[i] : padfC[i];
+        sSlot.dfLine = bImageFirst ? padfB[i] : padfD[i];
+        sPoint.dfX = bImageFirst ? padfC[i] : padfA[i];
+        sPoint.dfY = bImageFirst ? padfD[i] : padfB[i];
+        sPoint.dfZ = padfZ[i];
+        const double adfValues[] = {sSlot.dfPixel, sSlot.dfLine, sPoint.dfX, sPoint.dfY,
+                                    sPoint.dfZ};
+        for (double dfValue : adfValues) {
+            if (!std::isfinite(dfValue) || dfValue == kNull) {
+                lumo::Fatal(lumo::Err::kComputation,
+                            MkName(_("GCP number %d has an invalid coordinate (%.17g).\n"), i + 1,
+                                   dfValue));
+            }
+        }
+        if (psEphemeris->nLevelConvForm > 0) {
+            ConvertControlPointTo1A(psEphemeris, &sSlot.dfPixel, &sSlot.dfLine);
+        }
+    }
+    sImg.nObservations = nGCP;
+    sImg.nUsedObservations = nGCP;
+    SpreadElevations(sAdj, sAdj.asPoints.size());
+    PrepareImages(sAdj);
+    Adjust(sAdj, "SRITCalculate");
+    FillRecord(sAdj.asImages[0], psModel, psEphemeris, *psProjInfo);
+    return 1;
+}
+
+}  // namespace srit
+}  // namespace lumo

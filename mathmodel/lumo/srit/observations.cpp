@@ -1,0 +1,197 @@
+// Observation rows of the rigorous adjustment: two rows per control-point
+// measurement, the rows that bind the images of a block (pairs, directions
+// across the elevation displacement, points without elevation), and the
+// parameter constraints.
+#include <algorithm>
+#include <cmath>
+
+#include "srit/srit_internal.h"
+
+namespace lumo {
+namespace srit {
+namespace {
+
+// Planimetric standard deviation: mean of X and Y, 2.5 when either is not given.
+double PlanimetricSd(const PointRecord& sPoint) {
+    if (sPoint.dfSdX == kNull || sPoint.dfSdY == kNull) return 2.5;
+    return 0.5 * (sPoint.dfSdX + sPoint.dfSdY);
+}
+
+// The X and Y rows of one measurement of a full control point.
+void AddControlRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    double adfCoef[kMaxUnknowns];
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const PointSlot& sSlot = sPoint.asSlots[k];
+        if (sSlot.nFlag != 1) continue;
+        const ImageState& sImg = sAdj.asImages[k];
+        const double dfSigma = sImg.sSetup.dfAccuracy;
+        const double dfTan = 2.5 * std::tan(sImg.psSeg->dfViewAngle - sSlot.dfXc * sImg.c2);
+        const double w = 1.0 / std::sqrt(dfSigma * dfSigma + 6.25 + dfTan * dfTan);
+        if (sAdj.dfMinControlWeight == 0.0 || w < sAdj.dfMinControlWeight) {
+            sAdj.dfMinControlWeight = w;
+        }
+        const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, sPoint.dfZ);
+        sNormal.ClearRow();
+        ObservationCoefficients(sImg, s, true, adfCoef);
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(s.dfX - sPoint.dfX, w);
+        sNormal.ClearRow();
+        ObservationCoefficients(sImg, s, false, adfCoef);
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(s.dfY - sPoint.dfY, w);
+        sAdj.dfLastRowWeight = w;
+    }
+}
+
+// One measurement's ground position and its X and Y coefficient rows.
+struct MeasurementRows {
+    GroundTerms s;
+    double adfX[kMaxUnknowns];
+    double adfY[kMaxUnknowns];
+};
+
+MeasurementRows RowsOf(const ImageState& sImg, const PointSlot& sSlot, double dfZ) {
+    MeasurementRows sRows{};
+    sRows.s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, dfZ);
+    ObservationCoefficients(sImg, sRows.s, true, sRows.adfX);
+    ObservationCoefficients(sImg, sRows.s, false, sRows.adfY);
+    return sRows;
+}
+
+// Adds the row whose image-i part is pdfI and image-j part pdfJ.
+void AddPairRow(Adjustment& sAdj, NormalEquations& sNormal, const ImagePair& sPair,
+                const double* pdfI, const double* pdfJ, double dfMisclosure, double dfWeight) {
+    sNormal.ClearRow();
+    WriteBlock(sAdj, sPair.i, pdfI, sNormal.Row());
+    WriteBlock(sAdj, sPair.j, pdfJ, sNormal.Row());
+    sNormal.AddRow(dfMisclosure, dfWeight);
+    sAdj.dfLastRowWeight = dfWeight;
+}
+
+// Rows that make the ground positions of a point with a known elevation agree
+// in both images of a pair.
+void AddPairRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    const double dfSdZ = sPoint.dfSdZ == kNull ? 2.5 : sPoint.dfSdZ;
+    const bool bRows =
+        sPoint.cType == 'A' || (sPoint.cType == 'X' && dfSdZ <= 0.5 * PlanimetricSd(sPoint));
+    if (!bRows) return;
+    for (const ImagePair& sPair : sAdj.asPairs) {
+        const PointSlot& sI = sPoint.asSlots[sPair.i];
+        const PointSlot& sJ = sPoint.asSlots[sPair.j];
+        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
+        const ImageState& sImgI = sAdj.asImages[sPair.i];
+        const ImageState& sImgJ = sAdj.asImages[sPair.j];
+        const MeasurementRows sRi = RowsOf(sImgI, sI, sPoint.dfZ);
+        const MeasurementRows sRj = RowsOf(sImgJ, sJ, sPoint.dfZ);
+        const double dfSigI = sImgI.sSetup.dfAccuracy, dfSigJ = sImgJ.sSetup.dfAccuracy;
+        const double dfTanDiff = std::tan(sImgI.psSeg->dfViewAngle - sI.dfXc * sImgI.c2) -
+                                 std::tan(sImgJ.psSeg->dfViewAngle - sJ.dfXc * sImgJ.c2);
+        const double w =
+            1.0 / std::sqrt(6.25 + (dfSigI * dfSigI + dfSigJ * dfSigJ) / (dfTanDiff * dfTanDiff));
+        if (!(w > 0.0) || !std::isfinite(w)) continue;  // parallel rays bind nothing
+        double adfNegX[kMaxUnknowns], adfNegY[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfNegX[p] = -sRj.adfX[p];
+            adfNegY[p] = -sRj.adfY[p];
+        }
+        AddPairRow(sAdj, sNormal, sPair, sRi.adfX, adfNegX, sRi.s.dfX - sRj.s.dfX, w);
+        AddPairRow(sAdj, sNormal, sPair, sRi.adfY, adfNegY, sRi.s.dfY - sRj.s.dfY, w);
+    }
+}
+
+// Rows across the direction in which the two images' ground positions part
+// with a wrong elevation: they hold whatever the elevation.
+void AddCrossRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    const double dfZ = IsTieOrNoElevation(sPoint) ? sPoint.dfEstZ : sPoint.dfZ;
+    for (const ImagePair& sPair : sAdj.asPairs) {
+        const PointSlot& sI = sPoint.asSlots[sPair.i];
+        const PointSlot& sJ = sPoint.asSlots[sPair.j];
+        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
+        const ImageState& sImgI = sAdj.asImages[sPair.i];
+        const ImageState& sImgJ = sAdj.asImages[sPair.j];
+        const MeasurementRows sRi = RowsOf(sImgI, sI, dfZ);
+        const MeasurementRows sRj = RowsOf(sImgJ, sJ, dfZ);
+        const Displacement ai = DisplacementOf(sImgI, sI.dfXc);
+        const Displacement aj = DisplacementOf(sImgJ, sJ.dfXc);
+        const double dx = ai.ax - aj.ax, dy = ai.ay - aj.ay;
+        const double n = std::max(std::sqrt(dx * dx + dy * dy), 1e-06);
+        double adfI[kMaxUnknowns], adfJ[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfI[p] = (dy * sRi.adfX[p] - dx * sRi.adfY[p]) / n;
+            adfJ[p] = (dx * sRj.adfY[p] - dy * sRj.adfX[p]) / n;
+        }
+        const double dfMisclosure =
+            (dy * (sRi.s.dfX - sRj.s.dfX) - dx * (sRi.s.dfY - sRj.s.dfY)) / n;
+        const double w = sPoint.cType == 'H' || sAdj.dfLastRowWeight == 0.0
+                             ? sAdj.dfMinControlWeight
+                             : sAdj.dfLastRowWeight;
+        AddPairRow(sAdj, sNormal, sPair, adfI, adfJ, dfMisclosure, w);
+    }
+}
+
+// Rows of a control point without elevation: across the direction in which
+// its image position moves with the elevation.
+void AddNoElevationRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const PointSlot& sSlot = sPoint.asSlots[k];
+        if (sSlot.nFlag != 1) continue;
+        const ImageState& sImg = sAdj.asImages[k];
+        const MeasurementRows sR = RowsOf(sImg, sSlot, sPoint.dfEstZ);
+        const Displacement a = DisplacementOf(sImg, sSlot.dfXc);
+        const double n = std::sqrt(a.ax * a.ax + a.ay * a.ay);
+        if (!(n > 0.0)) continue;
+        double adfCoef[kMaxUnknowns];
+        for (int p = 0; p < kMaxUnknowns; ++p) {
+            adfCoef[p] = (a.ay * sR.adfX[p] - a.ax * sR.adfY[p]) / n;
+        }
+        const double dfMisclosure =
+            (a.ay * (sR.s.dfX - sPoint.dfX) - a.ax * (sR.s.dfY - sPoint.dfY)) / n;
+        const double dfPlan = PlanimetricSd(sPoint);
+        const double dfSigma = sImg.sSetup.dfAccuracy;
+        const double w = 1.0 / std::sqrt(dfPlan * dfPlan + dfSigma * dfSigma);
+        sNormal.ClearRow();
+        WriteBlock(sAdj, k, adfCoef, sNormal.Row());
+        sNormal.AddRow(dfMisclosure, w);
+        sAdj.dfLastRowWeight = w;
+    }
+}
+
+}  // namespace
+
+// Observation rows of every point in use: control rows, then the rows that
+// bind the images of a block together.
+void AddObservationRows(Adjustment& sAdj, NormalEquations& sNormal) {
+    for (const PointRecord& sPoint : sAdj.asPoints) {
+        if (sPoint.nInUse != 1) continue;
+        if (sPoint.cType == 'X') AddControlRows(sAdj, sNormal, sPoint);
+        if (sAdj.asPairs.empty() && sPoint.cType != 'P') continue;
+        AddPairRows(sAdj, sNormal, sPoint);
+        AddCrossRows(sAdj, sNormal, sPoint);
+        if (sPoint.cType == 'P') AddNoElevationRows(sAdj, sNormal, sPoint);
+    }
+}
+
+// Pseudo-observations that hold P3 ... P7 near their starting values.
+void AddConstraintRows(const Adjustment& sAdj, NormalEquations& sNormal) {
+    const ConstraintWeights& W = sAdj.sWeights;
+    for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
+        const ImageState& sImg = sAdj.asImages[k];
+        const bool bConstrain = sImg.bConstrained || ShortNameContains(sImg.sSetup, "TM") ||
+                                ShortNameContains(sImg.sSetup, "ETM");
+        if (!bConstrain) continue;
+        const double* P = sImg.P;
+        const double* P0 = sImg.adfStart;
+        const int nStart = BlockStart(sAdj, k);
+        const double adfMisclosure[5] = {1.0 - P0[3] / P[3], P[4] - P0[4], P[5] - P0[5],
+                                         1.0 - P0[6] / P[6], P[7] - P0[7]};
+        const double adfWeight[5] = {W.W3, W.W4, W.W5, W.W6, W.W7};
+        for (int i = 0; i < 5; ++i) {
+            sNormal.ClearRow();
+            sNormal.Row()[nStart + 3 + i] = 1.0;
+            sNormal.AddRow(adfMisclosure[i], adfWeight[i]);
+        }
+    }
+}
+
+}  // namespace srit
+}  // namespace lumo
