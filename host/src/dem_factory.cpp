@@ -20,7 +20,6 @@ namespace {
 constexpr const char* kSourceFile = "host/src/dem_factory.cpp";
 constexpr const char* kGeoidKind = "geoid";
 // Error number of the host catalogue for invalid or inconsistent input.
-constexpr int kInvalidInputError = 11;
 // Undulation tiles of the fallback: the whole EGM96 grid fits in 4 MB.
 constexpr int kGeoidCacheMegabytes = 8;
 
@@ -152,7 +151,7 @@ class GeoidFallbackDEM final : public IRasterDEM {
         const std::string osText = FormatString(
             "Positions outside the elevation model %s: heights of the EGM96 geoid used there",
             mpoInner->GetDescription().c_str());
-        IMPError(kInvalidInputError, 0, osText.c_str());
+        IMPError(nova::kMsgInvalidInput, 0, osText.c_str());
     }
 
     DEMPtr mpoInner;

@@ -21,7 +21,6 @@ IMathModel::~IMathModel() = default;
 namespace {
 
 // Error number of the host catalogue for invalid or inconsistent input.
-constexpr int kInvalidInputError = 11;
 
 // Height offset of the finite difference that gives d(output)/d(height) at a
 // grid node. Models are close to linear in height over tens of metres.
@@ -41,7 +40,7 @@ const char* FunctionName(Direction eDir) {
 // Bad arguments are reported as a numbered warning and make the call fail.
 int RejectArguments(Direction eDir, const std::string& osWhat) {
     const std::string osText = FormatString("%s: %s", FunctionName(eDir), osWhat.c_str());
-    IMPError(kInvalidInputError, 0, osText.c_str());
+    IMPError(nova::kMsgInvalidInput, 0, osText.c_str());
     return -1;
 }
 

@@ -174,9 +174,9 @@ std::string WarningValue(const char* pszText) {
 
 void WarnBadGeosys(GeosysError eError, const char* pszText, bool bWarnUnit) {
     if (eError == GeosysError::kEarthModel) {
-        IMPErrChar(32, 0, "Earth model", WarningValue(pszText).c_str());
+        IMPErrChar(nova::kMsgUnsupportedUnit, 0, "Earth model", WarningValue(pszText).c_str());
     } else if (bWarnUnit) {
-        IMPErrChar(32, 0, "GCP Unit", WarningValue(pszText).c_str());
+        IMPErrChar(nova::kMsgUnsupportedUnit, 0, "GCP Unit", WarningValue(pszText).c_str());
     }
 }
 

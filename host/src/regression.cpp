@@ -14,8 +14,6 @@
 
 namespace {
 
-constexpr int kErrorCode = 100;
-
 // Exponents of u and v of each term, in the record's term order.
 constexpr int kTermPowers[GCP_MAX_TERMS][2] = {
     {0, 0}, {1, 0}, {0, 1}, {1, 1}, {2, 0}, {0, 2}, {2, 1}, {1, 2}, {3, 0}, {0, 3}, {2, 2},
@@ -51,8 +49,7 @@ void EvaluateTerms(double u, double v, int nTerms, double* terms) {
 }
 
 [[noreturn]] void Fail(const char* text) {
-    IMPError(kErrorCode, 1, text);
-    throw nova::NumberedError(kErrorCode, text);  // not reached: a fatal report throws
+    nova::RaiseNumbered(nova::kMsgComputationFailed, text);
 }
 
 struct Points {
@@ -261,17 +258,17 @@ bool AllFinite(const double* values, int count) {
 
 void WarnIfLowered(const GEOInfo_t& g, int order) {
     if (g.nFitKind == GCP_FIT_SHIFT)
-        IMPError(kErrorCode, 0,
+        IMPError(nova::kMsgComputationFailed, 0,
                  MkName(_("Polynomial order %d lowered to a shift: the %d control points "
                           "are all at one place."),
                         order, g.nPoints));
     else if (g.nFitKind == GCP_FIT_SIMILARITY)
-        IMPError(kErrorCode, 0,
+        IMPError(nova::kMsgComputationFailed, 0,
                  MkName(_("Polynomial order %d lowered to a similarity transform: the %d control "
                           "points are fewer than 3 or collinear."),
                         order, g.nPoints));
     else if (g.nOrder < order)
-        IMPError(kErrorCode, 0,
+        IMPError(nova::kMsgComputationFailed, 0,
                  MkName(_("Polynomial order %d lowered to %d: the %d control points do not "
                           "determine it."),
                         order, g.nOrder, g.nPoints));

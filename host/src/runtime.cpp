@@ -44,11 +44,11 @@ struct CatalogueEntry {
 };
 
 constexpr std::array<CatalogueEntry, 5> kCatalogue = {{
-    {11, "Invalid or inconsistent input"},
-    {19, "Unsupported satellite sensor"},
-    {32, "Unsupported ground unit or earth model"},
-    {100, "Computation failed"},
-    {189, "Image coordinate out of range"},
+    {nova::kMsgInvalidInput, "Invalid or inconsistent input"},
+    {nova::kMsgUnsupportedSensor, "Unsupported satellite sensor"},
+    {nova::kMsgUnsupportedUnit, "Unsupported ground unit or earth model"},
+    {nova::kMsgComputationFailed, "Computation failed"},
+    {nova::kMsgImageRange, "Image coordinate out of range"},
 }};
 
 std::mutex& SinkMutex() {
@@ -75,10 +75,16 @@ std::string ComposeReport(int nCode, const std::string& osDetail) {
     return osText;
 }
 
-void Report(int nCode, int bFatal, const std::string& osDetail) {
-    nova::ErrorReport sReport{nCode, bFatal != 0, ComposeReport(nCode, osDetail)};
+[[noreturn]] void ReportFatal(int nCode, const std::string& osDetail) {
+    nova::ErrorReport sReport{nCode, true, ComposeReport(nCode, osDetail)};
     tsLastReport = sReport;
-    if (bFatal) throw nova::NumberedError(nCode, sReport.osText);
+    throw nova::NumberedError(nCode, sReport.osText);
+}
+
+void Report(int nCode, int bFatal, const std::string& osDetail) {
+    if (bFatal) ReportFatal(nCode, osDetail);
+    nova::ErrorReport sReport{nCode, false, ComposeReport(nCode, osDetail)};
+    tsLastReport = sReport;
     ++gnWarnings;
     nova::ErrorSink oSink;
     {
@@ -186,6 +192,14 @@ void IMPErrReal(int code, int fatal, const char* label, double value, int number
 void IMPErrMsg(int code, int fatal) {
     Report(code, fatal, std::string());
 }
+
+namespace nova {
+
+void RaiseNumbered(int code, const char* text) {
+    ReportFatal(code, SafeText(text));
+}
+
+}  // namespace nova
 
 const char* _(const char* text) {
     return text;

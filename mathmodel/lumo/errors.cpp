@@ -38,8 +38,7 @@ std::string SourceTag(const char* file) {
 }  // namespace
 
 void Fatal(Err code, const char* text) {
-    IMPError(Code(code), 1, text);
-    Unreachable(code);
+    nova::RaiseNumbered(Code(code), text);
 }
 
 void FatalChar(Err code, const char* label, const char* value) {

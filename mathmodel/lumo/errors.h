@@ -8,15 +8,25 @@
 
 #include <cstdio>
 
+#include "runtime.h"
+
 namespace lumo {
 
-// Host message numbers used by the library.
+// The host message numbers the library raises, under the library's names.
+// The numbers are the host's (nova::MessageNumber); the detail text of each
+// report names the bad value, so one number serves every case of its kind.
 enum class Err : int {
-    kBadArgument = 11,   // null or out-of-range argument, exceeded limit
-    kSensor = 19,        // unsupported satellite sensor ("Satellite Sensor")
-    kUnit = 32,          // unsupported GCP unit or earth model
-    kComputation = 100,  // a computation failed (singular system, bad geometry, ...)
-    kImageRange = 189,   // image coordinate out of range ("X_img", "Y_img")
+    // Invalid or inconsistent input: the exceeded image limit of the block
+    // adjustment, bad arguments the polynomial and rational function
+    // families warn about.
+    kBadArgument = nova::kMsgInvalidInput,
+    kSensor = nova::kMsgUnsupportedSensor,  // unsupported satellite sensor ("Satellite Sensor")
+    kUnit = nova::kMsgUnsupportedUnit,      // unsupported GCP unit or earth model
+    // A computation failed or cannot start: singular systems, bad geometry,
+    // and input (null arrays, coordinates that are not numbers) without
+    // which no model can be computed.
+    kComputation = nova::kMsgComputationFailed,
+    kImageRange = nova::kMsgImageRange,  // image coordinate out of range ("X_img", "Y_img")
 };
 
 // Fatal reports: raised through the host, they never return.

@@ -33,6 +33,25 @@ void IMPErrChar(int code, int fatal, const char* label, const char* value);
 void IMPErrReal(int code, int fatal, const char* label, double value, int number);
 void IMPErrMsg(int code, int fatal);
 
+namespace nova {
+
+// The message numbers of the catalogue, named once for the host services and
+// the libraries beside them. A number names a kind of failure; the detail
+// text of each report says which value was wrong.
+enum MessageNumber : int {
+    kMsgInvalidInput = 11,        // invalid or inconsistent input (a bad field, an exceeded limit)
+    kMsgUnsupportedSensor = 19,   // unsupported satellite sensor
+    kMsgUnsupportedUnit = 32,     // unsupported ground unit or earth model
+    kMsgComputationFailed = 100,  // a computation failed (singular system, bad geometry, ...)
+    kMsgImageRange = 189,         // image coordinate out of range
+};
+
+// A fatal numbered error: reported like IMPError(code, 1, text), it throws
+// nova::NumberedError and never returns.
+[[noreturn]] void RaiseNumbered(int code, const char* text);
+
+}  // namespace nova
+
 // Message-catalogue translation of a literal; the text itself when there is
 // none. The result stays valid for the life of the process or of `text`.
 const char* _(const char* text);  // NOLINT(bugprone-reserved-identifier)
