@@ -8,6 +8,7 @@
 #include <string>
 
 #include "lumo_ap.h"
+#include "null_value.h"
 #include "projection.h"
 
 namespace {
@@ -21,11 +22,6 @@ constexpr int kDistortionIterations = 10;
 // A height of -1e20 is not given: the model takes the ground at 0.
 double GroundHeight(double dfZ) {
     return dfZ == LUMO_NULL_VALUE ? 0.0 : dfZ;
-}
-
-void SetNull(double* pdfA, double* pdfB) {
-    if (pdfA) *pdfA = LUMO_NULL_VALUE;
-    if (pdfB) *pdfB = LUMO_NULL_VALUE;
 }
 
 bool IsUsableFocalLength(double dfF) {
@@ -201,7 +197,7 @@ void PhotoToImageCorrected(const APInfo_t& ap, double x, double y, double dfZ, d
 
 // Both outputs finite, or both the null value.
 void FiniteOrNull(double* pdfA, double* pdfB) {
-    if (!std::isfinite(*pdfA) || !std::isfinite(*pdfB)) SetNull(pdfA, pdfB);
+    if (!std::isfinite(*pdfA) || !std::isfinite(*pdfB)) lumo::SetNullPair(pdfA, pdfB);
 }
 
 std::string BoundedText(const char* pszBuffer) {
@@ -255,7 +251,7 @@ void APDeallocate(APInfo_t* psAP) {
 void APGeo2Img(const APInfo_t* psAP, double dfX, double dfY, double dfZ, double* pdfPixel,
                double* pdfLine) {
     if (psAP == nullptr || pdfPixel == nullptr || pdfLine == nullptr) {
-        SetNull(pdfPixel, pdfLine);
+        lumo::SetNullPair(pdfPixel, pdfLine);
         return;
     }
     const APInfo_t& ap = *psAP;
@@ -270,7 +266,7 @@ void APGeo2Img(const APInfo_t* psAP, double dfX, double dfY, double dfZ, double*
     // height, in the plane of the perspective centre or behind it have no image.
     const double dfScale = -ap.dfFocalLength / N;
     if (dZ == 0.0 || !(dfScale > 0.0) || !std::isfinite(dfScale)) {
-        SetNull(pdfPixel, pdfLine);
+        lumo::SetNullPair(pdfPixel, pdfLine);
         return;
     }
     const double x = dfScale * (R[0] * dX + R[1] * dY + R[2] * dZ);
@@ -282,7 +278,7 @@ void APGeo2Img(const APInfo_t* psAP, double dfX, double dfY, double dfZ, double*
 void APPhoto2Img(const APInfo_t* psAP, double dfPhotoX, double dfPhotoY, double dfZ,
                  double* pdfPixel, double* pdfLine) {
     if (psAP == nullptr || pdfPixel == nullptr || pdfLine == nullptr) {
-        SetNull(pdfPixel, pdfLine);
+        lumo::SetNullPair(pdfPixel, pdfLine);
         return;
     }
     PhotoToImageCorrected(*psAP, dfPhotoX, dfPhotoY, GroundHeight(dfZ), pdfPixel, pdfLine);
@@ -292,7 +288,7 @@ void APPhoto2Img(const APInfo_t* psAP, double dfPhotoX, double dfPhotoY, double 
 void APImg2Photo(const APInfo_t* psAP, double dfPixel, double dfLine, double dfZ, double* pdfPhotoX,
                  double* pdfPhotoY) {
     if (psAP == nullptr || pdfPhotoX == nullptr || pdfPhotoY == nullptr) {
-        SetNull(pdfPhotoX, pdfPhotoY);
+        lumo::SetNullPair(pdfPhotoX, pdfPhotoY);
         return;
     }
     const APInfo_t& ap = *psAP;
@@ -331,7 +327,7 @@ void APImg2Photo(const APInfo_t* psAP, double dfPixel, double dfLine, double dfZ
 void APPhoto2Geo(const APInfo_t* psAP, double dfPhotoX, double dfPhotoY, double dfZ, double* pdfX,
                  double* pdfY) {
     if (psAP == nullptr || pdfX == nullptr || pdfY == nullptr) {
-        SetNull(pdfX, pdfY);
+        lumo::SetNullPair(pdfX, pdfY);
         return;
     }
     const APInfo_t& ap = *psAP;
@@ -346,7 +342,7 @@ void APPhoto2Geo(const APInfo_t* psAP, double dfPhotoX, double dfPhotoY, double 
     // plane or pointing away from it has no ground point.
     const double t = dZ / D;
     if (!IsUsableFocalLength(f) || !(t > 0.0) || !std::isfinite(t)) {
-        SetNull(pdfX, pdfY);
+        lumo::SetNullPair(pdfX, pdfY);
         return;
     }
     *pdfX = (R[0] * x + R[3] * y - f * R[6]) * t + ap.dfCameraX;
@@ -357,7 +353,7 @@ void APPhoto2Geo(const APInfo_t* psAP, double dfPhotoX, double dfPhotoY, double 
 int APImg2GeoDem(const APInfo_t* psAP, double dfPixel, double dfLine, double* pdfZ, double* pdfX,
                  double* pdfY) {
     if (psAP == nullptr || pdfZ == nullptr || pdfX == nullptr || pdfY == nullptr) {
-        SetNull(pdfX, pdfY);
+        lumo::SetNullPair(pdfX, pdfY);
         return 0;
     }
     if (*pdfZ == LUMO_NULL_VALUE) *pdfZ = 0.0;

@@ -159,6 +159,7 @@ LumoModelType ModelCodeToLumoType(int nModelCode) {
 #include "errors.h"
 #include "lumo_sensor.h"
 #include "runtime.h"
+#include "segment_access.h"
 
 namespace {
 
@@ -387,10 +388,6 @@ constexpr SensorNameRow kSensorNames[] = {
 };
 // clang-format on
 
-char AsciiLower(char c) {
-    return (c >= 'A' && c <= 'Z') ? static_cast<char>(c - 'A' + 'a') : c;
-}
-
 // Case-insensitive (ASCII letters only) test of the first nNameLen characters
 // of pszName against one name test.
 bool NameMatches(const char* pszName, std::size_t nNameLen, const SensorNameTest& sTest) {
@@ -398,10 +395,7 @@ bool NameMatches(const char* pszName, std::size_t nNameLen, const SensorNameTest
     const std::size_t nTextLen = std::strlen(sTest.pszText);
     if (nNameLen < nTextLen) return false;
     if (sTest.bWholeName && nNameLen != nTextLen) return false;
-    for (std::size_t i = 0; i < nTextLen; ++i) {
-        if (AsciiLower(pszName[i]) != AsciiLower(sTest.pszText[i])) return false;
-    }
-    return true;
+    return lumo::NameHasPrefix(pszName, nNameLen, sTest.pszText);
 }
 
 int CodeOfRow(const SensorNameRow& sRow, double dfPixelRes) {

@@ -8,20 +8,9 @@
 #include "lumo_srit.h"
 #include "projection.h"
 #include "runtime.h"
+#include "segment_access.h"
 
 namespace {
-
-// Attitude table of a segment when it has one with at least one line: the
-// per-line arrays of a record are as long as that table.
-const AttitudeData_t* AttitudeTable(const EphemerisSeg_t* psSeg) {
-    if (psSeg == nullptr || psSeg->nOrbitType != EPH_ORBIT_ATTITUDE ||
-        psSeg->ppOrbitData == nullptr) {
-        return nullptr;
-    }
-    const auto* psAttitude = static_cast<const AttitudeData_t*>(*psSeg->ppOrbitData);
-    if (psAttitude == nullptr || psAttitude->nNumAttitudeLines < 1) return nullptr;
-    return psAttitude;
-}
 
 // A new copy of a line array of nCount doubles, or null when there is none.
 double* CopyLineArray(const double* padfSrc, int nCount) {
@@ -81,7 +70,9 @@ void SRITCopy(SRITInfo_t* psDst, const SRITInfo_t* psSrc) {
     std::free(psDst->padfLineShiftA);
     psDst->padfLineShiftB = nullptr;
     psDst->padfLineShiftA = nullptr;
-    if (const AttitudeData_t* psTable = AttitudeTable(psSrc->psEphemeris)) {
+    // The line arrays are as long as the source segment's attitude table.
+    const AttitudeData_t* psTable = lumo::AttitudeRecordOf(psSrc->psEphemeris);
+    if (psTable != nullptr && psTable->nNumAttitudeLines >= 1) {
         psDst->padfLineShiftB = CopyLineArray(psSrc->padfLineShiftB, psTable->nNumAttitudeLines);
         psDst->padfLineShiftA = CopyLineArray(psSrc->padfLineShiftA, psTable->nNumAttitudeLines);
     }
