@@ -25,13 +25,13 @@ void UpdateParameters(Adjustment& sAdj, const double* pdfX) {
         for (int p = 0; p < kMaxUnknowns; ++p) {
             if (anPos[p] >= sImg.sSetup.nUnknowns) continue;
             const double dfCorrection = pdfX[nStart + anPos[p]];
-            if (p == 3 || p == 6) {
-                sImg.P[p] *= 1.0 + dfCorrection;  // relative unknowns
+            if (p == kAcrossScale || p == kLineSpacing) {
+                sImg.sTerms.P[p] *= 1.0 + dfCorrection;  // relative unknowns
             } else {
-                sImg.P[p] += dfCorrection;
+                sImg.sTerms.P[p] += dfCorrection;
             }
         }
-        sImg.UpdateDerived();
+        sImg.sTerms.UpdateDerived();
         nStart += sImg.sSetup.nUnknowns;
     }
 }
@@ -58,12 +58,6 @@ void RunIterations(Adjustment& sAdj) {
     }
 }
 }  // namespace
-
-void ImageState::UpdateDerived() {
-    c6 = std::cos(std::atan(P[7]));
-    c15 = P[4] / c6;
-    c9 = (P[4] * P[4] + 1.0) / (P[3] * c6) + 2.0 * (c15 * c15 + 1.0) / c0;
-}
 
 void ReportNullArgument(const char* pszName) {
     lumo::Fatal(lumo::Err::kComputation,
@@ -114,41 +108,21 @@ void RequireConformal(const ProjInfo_t& sProj, char* pszDecoded) {
 // Writes an image's result into its model record, which adopts the segment.
 void FillRecord(const ImageState& sImg, SRITInfo_t* psModel, EphemerisSeg_t* psEphemeris,
                 const ProjInfo_t& sProj) {
-    const double* P = sImg.P;
-    double* c = psModel->adfCoef;
-    c[0] = sImg.c0;
-    c[1] = P[5];
-    c[2] = sImg.c2;
-    c[3] = P[8];
-    c[4] = sImg.c4;
-    c[5] = P[9];
-    c[6] = std::cos(std::atan(P[7]));
-    c[7] = P[10];
-    c[8] = P[2];
-    c[15] = P[4] / c[6];
-    c[9] = (P[4] * P[4] + 1.0) / (P[3] * c[6]) + 2.0 * (c[15] * c[15] + 1.0) / c[0];
-    c[10] = sImg.c10;
-    c[11] = P[6];
-    c[12] = P[3];
-    c[13] = P[7];
-    c[14] = P[4];
-    c[16] = P[0];
-    c[17] = P[1];
-    c[18] = P[12];
-    c[19] = P[11];
-    c[20] = c[21] = c[22] = 0.0;
+    StoreTerms(sImg.sTerms, psModel->adfCoef);
     // The line arrays describe the adopted segment only: arrays of an
     // earlier segment would not match its table.
     std::free(psModel->padfLineShiftB);
     std::free(psModel->padfLineShiftA);
     psModel->padfLineShiftB = nullptr;
     psModel->padfLineShiftA = nullptr;
-    if (sImg.bHasLineArrays) {
-        const std::size_t n = sImg.adfLineA.size();
+    if (const AttitudeData_t* psTable = sImg.sTerms.psLineTable) {
+        const auto n = static_cast<std::size_t>(psTable->nNumAttitudeLines);
         psModel->padfLineShiftB = static_cast<double*>(HMalloc(n * sizeof(double)));
         psModel->padfLineShiftA = static_cast<double*>(HMalloc(n * sizeof(double)));
-        std::copy(sImg.adfLineB.begin(), sImg.adfLineB.end(), psModel->padfLineShiftB);
-        std::copy(sImg.adfLineA.begin(), sImg.adfLineA.end(), psModel->padfLineShiftA);
+        for (std::size_t i = 0; i < n; ++i) {
+            psModel->padfLineShiftB[i] = psTable->pAttitudeLines[i].dfValue2;
+            psModel->padfLineShiftA[i] = psTable->pAttitudeLines[i].dfValue1;
+        }
     }
     std::memcpy(psModel->Sensor, sImg.sSetup.szShortName, SRIT_SENSOR_SIZE);
     psModel->nSensor = sImg.sSetup.nSensor;
@@ -167,12 +141,12 @@ void FillRecord(const ImageState& sImg, SRITInfo_t* psModel, EphemerisSeg_t* psE
 // image's parameters stayed numbers.
 void Adjust(Adjustment& sAdj, const char* pszFunction) {
     ComputeStartingValues(sAdj);
-    for (ImageState& sImage : sAdj.asImages) sImage.UpdateDerived();
+    for (ImageState& sImage : sAdj.asImages) sImage.sTerms.UpdateDerived();
     EstimateElevations(sAdj, true);
     RunIterations(sAdj);
     for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
         for (int p = 0; p < kMaxUnknowns; ++p) {
-            if (std::isfinite(sAdj.asImages[k].P[p])) continue;
+            if (std::isfinite(sAdj.asImages[k].sTerms.P[p])) continue;
             lumo::Fatal(lumo::Err::kComputation,
                         MkName(_("%s: the adjustment of image %d diverged (parameter %d is not a "
                                  "number); check the control points.\n"),

@@ -12,6 +12,7 @@
 
 #include "errors.h"
 #include "runtime.h"
+#include "segment_access.h"
 #include "srit/srit_internal.h"
 
 namespace lumo {
@@ -199,7 +200,7 @@ void CountUsedObservations(Adjustment& sAdj, std::size_t nControlPoints) {
 bool EnoughPoints(const Adjustment& sAdj) {
     for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
         const ImageState& sImg = sAdj.asImages[k];
-        const int nNeeded = SegmentStartsWith(*sImg.psSeg, "SAR") ? 5 : 4;
+        const int nNeeded = SensorNameStartsWith(*sImg.psSeg, "SAR") ? 5 : 4;
         if (sImg.nObservations >= nNeeded) continue;
         if (lumo::TraceOn()) {
             lumo::Trace(1, kEntrySource, kNotEnoughPointsLine,

@@ -35,8 +35,8 @@ Intersection Intersect(const Adjustment& sAdj, const PointRecord& sPoint, double
         const PointSlot& sSlot = sPoint.asSlots[k];
         if (sSlot.nFlag != 1) continue;
         const ImageState& sImg = sAdj.asImages[k];
-        const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, dfZ0);
-        const Displacement a = DisplacementOf(sImg, sSlot.dfXc);
+        const GroundTerms s = ImageToGround(sImg.sTerms, sSlot.dfXc, sSlot.dfYc, dfZ0);
+        const Displacement a = DisplacementOf(sImg.sTerms, sSlot.dfXc);
         adfX.push_back(s.dfX);
         adfY.push_back(s.dfY);
         double* pdfRow = sNormal.Row();
@@ -117,7 +117,7 @@ void EstimatePoints(Adjustment& sAdj) {
             while (sPoint.asSlots[k].nFlag != 1) ++k;
             const PointSlot& sSlot = sPoint.asSlots[k];
             const GroundTerms s =
-                AdjustmentImageToGround(sAdj.asImages[k], sSlot.dfXc, sSlot.dfYc, dfZ0);
+                ImageToGround(sAdj.asImages[k].sTerms, sSlot.dfXc, sSlot.dfYc, dfZ0);
             sPoint.dfEstX = s.dfX;
             sPoint.dfEstY = s.dfY;
             sPoint.dfEstZ = sPoint.cType == 'X' ? 0.0 : dfZ0;

@@ -8,6 +8,7 @@
 
 #include "errors.h"
 #include "runtime.h"
+#include "segment_access.h"
 #include "srit/srit_internal.h"
 
 namespace lumo {
@@ -34,32 +35,10 @@ double Polynomial(double v, const double* k, int nDegree) {
     return dfSum;
 }
 
-// Case-insensitive prefix test on a fixed-size sensor name that may lack a
-// terminator.
-bool SensorStartsWith(const EphemerisSeg_t& sSeg, const char* pszPrefix) {
-    for (std::size_t i = 0; pszPrefix[i] != '\0'; ++i) {
-        if (i >= sizeof(sSeg.szSensorName)) return false;
-        const auto c = static_cast<unsigned char>(sSeg.szSensorName[i]);
-        if (std::toupper(c) != std::toupper(static_cast<unsigned char>(pszPrefix[i]))) {
-            return false;
-        }
-    }
-    return true;
-}
-
 // Per-line look table of a "SPOT5" segment, or null: an attitude record with
 // at least one line.
 const AttitudeData_t* Spot5LineTable(const EphemerisSeg_t& sSeg) {
-    if (!SensorStartsWith(sSeg, "SPOT5") || sSeg.nOrbitType != EPH_ORBIT_ATTITUDE ||
-        sSeg.ppOrbitData == nullptr) {
-        return nullptr;
-    }
-    const auto* psTable = static_cast<const AttitudeData_t*>(*sSeg.ppOrbitData);
-    if (psTable == nullptr || psTable->pAttitudeLines == nullptr ||
-        psTable->nNumAttitudeLines < 1) {
-        return nullptr;
-    }
-    return psTable;
+    return SensorNameStartsWith(sSeg, "SPOT5") ? AttitudeLinesOf(&sSeg) : nullptr;
 }
 
 // Entry of the table for an input line counted from 0: lines before the

@@ -25,18 +25,19 @@ void AddControlRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecor
         if (sSlot.nFlag != 1) continue;
         const ImageState& sImg = sAdj.asImages[k];
         const double dfSigma = sImg.sSetup.dfAccuracy;
-        const double dfTan = 2.5 * std::tan(sImg.psSeg->dfViewAngle - sSlot.dfXc * sImg.c2);
+        const double dfTan =
+            2.5 * std::tan(sImg.psSeg->dfViewAngle - sSlot.dfXc * sImg.sTerms.dfIfov);
         const double w = 1.0 / std::sqrt(dfSigma * dfSigma + 6.25 + dfTan * dfTan);
         if (sAdj.dfMinControlWeight == 0.0 || w < sAdj.dfMinControlWeight) {
             sAdj.dfMinControlWeight = w;
         }
-        const GroundTerms s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, sPoint.dfZ);
+        const GroundTerms s = ImageToGround(sImg.sTerms, sSlot.dfXc, sSlot.dfYc, sPoint.dfZ);
         sNormal.ClearRow();
-        ObservationCoefficients(sImg, s, true, adfCoef);
+        ObservationCoefficients(sImg.sTerms, s, true, adfCoef);
         WriteBlock(sAdj, k, adfCoef, sNormal.Row());
         sNormal.AddRow(s.dfX - sPoint.dfX, w);
         sNormal.ClearRow();
-        ObservationCoefficients(sImg, s, false, adfCoef);
+        ObservationCoefficients(sImg.sTerms, s, false, adfCoef);
         WriteBlock(sAdj, k, adfCoef, sNormal.Row());
         sNormal.AddRow(s.dfY - sPoint.dfY, w);
         sAdj.dfLastRowWeight = w;
@@ -52,9 +53,9 @@ struct MeasurementRows {
 
 MeasurementRows RowsOf(const ImageState& sImg, const PointSlot& sSlot, double dfZ) {
     MeasurementRows sRows{};
-    sRows.s = AdjustmentImageToGround(sImg, sSlot.dfXc, sSlot.dfYc, dfZ);
-    ObservationCoefficients(sImg, sRows.s, true, sRows.adfX);
-    ObservationCoefficients(sImg, sRows.s, false, sRows.adfY);
+    sRows.s = ImageToGround(sImg.sTerms, sSlot.dfXc, sSlot.dfYc, dfZ);
+    ObservationCoefficients(sImg.sTerms, sRows.s, true, sRows.adfX);
+    ObservationCoefficients(sImg.sTerms, sRows.s, false, sRows.adfY);
     return sRows;
 }
 
@@ -84,8 +85,9 @@ void AddPairRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& 
         const MeasurementRows sRi = RowsOf(sImgI, sI, sPoint.dfZ);
         const MeasurementRows sRj = RowsOf(sImgJ, sJ, sPoint.dfZ);
         const double dfSigI = sImgI.sSetup.dfAccuracy, dfSigJ = sImgJ.sSetup.dfAccuracy;
-        const double dfTanDiff = std::tan(sImgI.psSeg->dfViewAngle - sI.dfXc * sImgI.c2) -
-                                 std::tan(sImgJ.psSeg->dfViewAngle - sJ.dfXc * sImgJ.c2);
+        const double dfTanDiff =
+            std::tan(sImgI.psSeg->dfViewAngle - sI.dfXc * sImgI.sTerms.dfIfov) -
+            std::tan(sImgJ.psSeg->dfViewAngle - sJ.dfXc * sImgJ.sTerms.dfIfov);
         const double w =
             1.0 / std::sqrt(6.25 + (dfSigI * dfSigI + dfSigJ * dfSigJ) / (dfTanDiff * dfTanDiff));
         if (!(w > 0.0) || !std::isfinite(w)) continue;  // parallel rays bind nothing
@@ -111,8 +113,8 @@ void AddCrossRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord&
         const ImageState& sImgJ = sAdj.asImages[sPair.j];
         const MeasurementRows sRi = RowsOf(sImgI, sI, dfZ);
         const MeasurementRows sRj = RowsOf(sImgJ, sJ, dfZ);
-        const Displacement ai = DisplacementOf(sImgI, sI.dfXc);
-        const Displacement aj = DisplacementOf(sImgJ, sJ.dfXc);
+        const Displacement ai = DisplacementOf(sImgI.sTerms, sI.dfXc);
+        const Displacement aj = DisplacementOf(sImgJ.sTerms, sJ.dfXc);
         const double dx = ai.ax - aj.ax, dy = ai.ay - aj.ay;
         const double n = std::max(std::sqrt(dx * dx + dy * dy), 1e-06);
         double adfI[kMaxUnknowns], adfJ[kMaxUnknowns];
@@ -137,7 +139,7 @@ void AddNoElevationRows(Adjustment& sAdj, NormalEquations& sNormal, const PointR
         if (sSlot.nFlag != 1) continue;
         const ImageState& sImg = sAdj.asImages[k];
         const MeasurementRows sR = RowsOf(sImg, sSlot, sPoint.dfEstZ);
-        const Displacement a = DisplacementOf(sImg, sSlot.dfXc);
+        const Displacement a = DisplacementOf(sImg.sTerms, sSlot.dfXc);
         const double n = std::sqrt(a.ax * a.ax + a.ay * a.ay);
         if (!(n > 0.0)) continue;
         double adfCoef[kMaxUnknowns];
@@ -179,11 +181,13 @@ void AddConstraintRows(const Adjustment& sAdj, NormalEquations& sNormal) {
         const bool bConstrain = sImg.bConstrained || ShortNameContains(sImg.sSetup, "TM") ||
                                 ShortNameContains(sImg.sSetup, "ETM");
         if (!bConstrain) continue;
-        const double* P = sImg.P;
+        const double* P = sImg.sTerms.P;
         const double* P0 = sImg.adfStart;
         const int nStart = BlockStart(sAdj, k);
-        const double adfMisclosure[5] = {1.0 - P0[3] / P[3], P[4] - P0[4], P[5] - P0[5],
-                                         1.0 - P0[6] / P[6], P[7] - P0[7]};
+        const double adfMisclosure[5] = {1.0 - P0[kAcrossScale] / P[kAcrossScale],
+                                         P[kAcrossTilt] - P0[kAcrossTilt], P[kShear] - P0[kShear],
+                                         1.0 - P0[kLineSpacing] / P[kLineSpacing],
+                                         P[kAlongTilt] - P0[kAlongTilt]};
         const double adfWeight[5] = {W.W3, W.W4, W.W5, W.W6, W.W7};
         for (int i = 0; i < 5; ++i) {
             sNormal.ClearRow();

@@ -11,6 +11,7 @@
 
 #include "errors.h"
 #include "runtime.h"
+#include "segment_access.h"
 #include "srit/srit_internal.h"
 
 namespace lumo {
@@ -96,25 +97,6 @@ const SensorRow kSensorTable[] = {
 
 constexpr std::size_t kHeavyWeightRows = 4;  // PLA, MLA, IRIS, SAR weigh 0.05555
 
-// Case-insensitive prefix test on a name of at most nSize characters.
-bool NameStartsWith(const char* pszName, std::size_t nSize, const char* pszPrefix) {
-    for (std::size_t i = 0; pszPrefix[i] != '\0'; ++i) {
-        if (i >= nSize || pszName[i] == '\0') return false;
-        if (std::toupper(static_cast<unsigned char>(pszName[i])) !=
-            std::toupper(static_cast<unsigned char>(pszPrefix[i]))) {
-            return false;
-        }
-    }
-    return true;
-}
-
-// The sensor name as a terminated text even when all its bytes are used.
-std::string SensorNameOf(const EphemerisSeg_t& sSeg) {
-    std::size_t n = 0;
-    while (n < sizeof(sSeg.szSensorName) && sSeg.szSensorName[n] != '\0') ++n;
-    return std::string(sSeg.szSensorName, n);
-}
-
 [[noreturn]] void ReportUnsupportedSensor(const EphemerisSeg_t& sSeg) {
     lumo::PrintUserMessage(stdout, "Unsupported satellite sensor\n");
     lumo::FatalChar(lumo::Err::kSensor, "Satellite Sensor", SensorNameOf(sSeg).c_str());
@@ -128,14 +110,14 @@ ImageSetup SetupFromSensorTable(const EphemerisSeg_t& sSeg, int nObservations) {
     for (std::size_t i = 0; i < nRows; ++i) {
         const SensorRow& sRow = kSensorTable[i];
         const bool bPrefix =
-            SegmentStartsWith(sSeg, sRow.pszPrefix) ||
-            (sRow.pszAltPrefix != nullptr && SegmentStartsWith(sSeg, sRow.pszAltPrefix));
+            SensorNameStartsWith(sSeg, sRow.pszPrefix) ||
+            (sRow.pszAltPrefix != nullptr && SensorNameStartsWith(sSeg, sRow.pszAltPrefix));
         if (!bPrefix) continue;
         // Walk the group's sub-rows (a plain row is its own group of one).
         for (std::size_t j = i;
              j < nRows && std::strcmp(kSensorTable[j].pszPrefix, sRow.pszPrefix) == 0; ++j) {
             const SensorRow& sSub = kSensorTable[j];
-            if (sSub.pszSub != nullptr && !SegmentStartsWith(sSeg, sSub.pszSub)) continue;
+            if (sSub.pszSub != nullptr && !SensorNameStartsWith(sSeg, sSub.pszSub)) continue;
             ImageSetup sSetup;
             sSetup.nUnknowns = (sSub.nThreshold > 0 && nObservations >= sSub.nThreshold)
                                    ? sSub.nManyUnknowns
@@ -164,24 +146,20 @@ ImageSetup SetupFromSensorTable(const EphemerisSeg_t& sSeg, int nObservations) {
     ReportUnsupportedSensor(sSeg);
 }
 
-// Kind-1 sub-record (lines or not), for the attitude values.
-const AttitudeData_t* AttitudeRecord(const EphemerisSeg_t& sSeg) {
-    if (sSeg.nOrbitType != EPH_ORBIT_ATTITUDE || sSeg.ppOrbitData == nullptr) return nullptr;
-    return static_cast<const AttitudeData_t*>(*sSeg.ppOrbitData);
-}
-
 // Per-image values of the segment and the flags that follow from its name.
 void LoadImage(ImageState& sImg, int nImage) {
     const EphemerisSeg_t& sSeg = *sImg.psSeg;
-    sImg.bRadar = SegmentStartsWith(sSeg, "SAR");
+    sImg.bRadar = SensorNameStartsWith(sSeg, "SAR");
     sImg.bConstrained = sSeg.nSupplementFlag != 0;
-    sImg.c2 = sSeg.dfIFOV;
-    sImg.c4 = sSeg.dfCentreColumn;
-    sImg.c10 = sSeg.dfCentreLine;
-    if (sSeg.nLevelConvForm > 0 && SegmentStartsWith(sSeg, "PLA")) {
-        sImg.c4 = sImg.c10 = 3000.0;
-    } else if (sSeg.nLevelConvForm > 0 && SegmentStartsWith(sSeg, "MLA")) {
-        sImg.c4 = sImg.c10 = 1500.0;
+    ModelTerms& m = sImg.sTerms;
+    m.dfIfov = sSeg.dfIFOV;
+    m.dfCentreColumn = sSeg.dfCentreColumn;
+    m.dfCentreLine = sSeg.dfCentreLine;
+    // Level-1A scenes of these sensors are centred on fixed image positions.
+    if (sSeg.nLevelConvForm > 0 && SensorNameStartsWith(sSeg, "PLA")) {
+        m.dfCentreColumn = m.dfCentreLine = 3000.0;
+    } else if (sSeg.nLevelConvForm > 0 && SensorNameStartsWith(sSeg, "MLA")) {
+        m.dfCentreColumn = m.dfCentreLine = 1500.0;
     }
     const double adfScene[] = {sSeg.dfIFOV,        sSeg.dfViewAngle,    sSeg.dfCentreColumn,
                                sSeg.dfCentreLine,  sSeg.dfSatVelocity,  sSeg.dfAngularSpeed,
@@ -201,23 +179,15 @@ void LoadImage(ImageState& sImg, int nImage) {
     if (!(sSeg.dfOrbitRadius > 0.0)) {
         lumo::FatalReal(lumo::Err::kComputation, "Segment dfOrbitRadius", sSeg.dfOrbitRadius, 3);
     }
-    const bool bLineTableSensor = SegmentStartsWith(sSeg, "PLA") || SegmentStartsWith(sSeg, "MLA");
-    if (const AttitudeData_t* psRecord = AttitudeRecord(sSeg)) {
+    const bool bLineTableSensor =
+        SensorNameStartsWith(sSeg, "PLA") || SensorNameStartsWith(sSeg, "MLA");
+    if (const AttitudeData_t* psRecord = AttitudeRecordOf(&sSeg)) {
         sImg.adfAttitude[0] = psRecord->dfAttitude1;
         sImg.adfAttitude[1] = psRecord->dfAttitude2;
         sImg.adfAttitude[2] = psRecord->dfAttitude3;
     }
-    if (bLineTableSensor) {
-        if (const AttitudeData_t* psTable = AttitudeTable(&sSeg)) {
-            sImg.bHasLineArrays = true;
-            sImg.adfLineA.resize(static_cast<std::size_t>(psTable->nNumAttitudeLines));
-            sImg.adfLineB.resize(sImg.adfLineA.size());
-            for (std::size_t i = 0; i < sImg.adfLineA.size(); ++i) {
-                sImg.adfLineA[i] = psTable->pAttitudeLines[i].dfValue1;
-                sImg.adfLineB[i] = psTable->pAttitudeLines[i].dfValue2;
-            }
-        }
-    }
+    // The adjustment reads the per-line shifts at trunc(yc + centre line).
+    if (bLineTableSensor) m.psLineTable = AttitudeLinesOf(&sSeg);
 }
 
 // Sensor row and the name-derived groups of an image.
@@ -229,29 +199,13 @@ void SetupImage(ImageState& sImg) {
     const ImageSetup& s = sImg.sSetup;
     sImg.bFlat = ShortNameContains(s, "TM") || ShortNameContains(s, "ETM") ||
                  ShortNameContains(s, "IKONOS") || ShortNameContains(s, "L2");
-    sImg.bLinearGroup = sImg.bFlat || ShortNameContains(s, "PLA") || ShortNameContains(s, "MLA");
-    sImg.bFormosatPan = ShortNameContains(s, "FORMOSAT_PAN");
+    Selectors& f = sImg.sTerms.sSelect;
+    f.bLinear = sImg.bFlat || ShortNameContains(s, "PLA") || ShortNameContains(s, "MLA");
+    f.bCurvature = !sImg.bFlat;
+    f.bLens = ShortNameContains(s, "FORMOSAT_PAN");
 }
 
 }  // namespace
-
-bool SegmentStartsWith(const EphemerisSeg_t& sSeg, const char* pszPrefix) {
-    return NameStartsWith(sSeg.szSensorName, sizeof(sSeg.szSensorName), pszPrefix);
-}
-
-// Per-line look table of a segment (kind 1 with lines), or null.
-const AttitudeData_t* AttitudeTable(const EphemerisSeg_t* psSeg) {
-    if (psSeg == nullptr || psSeg->nOrbitType != EPH_ORBIT_ATTITUDE ||
-        psSeg->ppOrbitData == nullptr) {
-        return nullptr;
-    }
-    const auto* psTable = static_cast<const AttitudeData_t*>(*psSeg->ppOrbitData);
-    if (psTable == nullptr || psTable->pAttitudeLines == nullptr ||
-        psTable->nNumAttitudeLines < 1) {
-        return nullptr;
-    }
-    return psTable;
-}
 
 bool ShortNameContains(const ImageSetup& sSetup, const char* pszText) {
     return std::strstr(sSetup.szShortName, pszText) != nullptr;
@@ -285,8 +239,8 @@ void PrepareImages(Adjustment& sAdj) {
         for (std::size_t k = 0; k < sAdj.asImages.size(); ++k) {
             PointSlot& sSlot = sPoint.asSlots[k];
             if (sSlot.nFlag != 1 && sSlot.nFlag != 2) continue;
-            sSlot.dfXc = sAdj.asImages[k].c4 - sSlot.dfPixel;
-            sSlot.dfYc = sSlot.dfLine - sAdj.asImages[k].c10;
+            sSlot.dfXc = sAdj.asImages[k].sTerms.dfCentreColumn - sSlot.dfPixel;
+            sSlot.dfYc = sSlot.dfLine - sAdj.asImages[k].sTerms.dfCentreLine;
         }
     }
 }

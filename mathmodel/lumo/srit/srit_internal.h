@@ -16,11 +16,11 @@
 #include "lumo_ephemeris.h"
 #include "lumo_srit.h"
 #include "projection.h"
+#include "srit/model_terms.h"
 
 namespace lumo {
 namespace srit {
 
-constexpr int kMaxUnknowns = 13;  // P0 ... P12 per image
 constexpr int kIterations = 7;
 constexpr double kEarthRate = 7.292115841e-5;  // rad/s
 constexpr double kNull = LUMO_NULL_VALUE;
@@ -45,32 +45,23 @@ struct ImageSetup {
     int nSensor = 0;
 };
 
-// One image of the adjustment: its segment, set-up, parameters and the
-// derived and fixed values of the model.
+// One image of the adjustment: its segment, set-up, and its model (the
+// parameters with the fixed and derived values) in ModelTerms.
 struct ImageState {
     const EphemerisSeg_t* psSeg = nullptr;
     ImageSetup sSetup;
     bool bRadar = false;
-    bool bLinearGroup = false;  // PLA, MLA, TM, ETM, IKONOS, L2
-    bool bFlat = false;         // no Earth-curvature term
-    bool bFormosatPan = false;
+    bool bFlat = false;  // TM, ETM, IKONOS, L2: no Earth-curvature term, flat starting values
     bool bConstrained = false;
     int nObservations = 0;      // control-point observations, used and check
     int nUsedObservations = 0;  // those that enter the adjustment
     int nBlockStart = 0;        // first position of the image's block in the unknown vector
-    double P[kMaxUnknowns] = {};
-    double adfStart[kMaxUnknowns] = {};              // starting values (P3 ... P7 used)
-    double c0 = 0.0, c2 = 0.0, c4 = 0.0, c10 = 0.0;  // 2N, IFOV, centre column and line
-    double c6 = 0.0, c9 = 0.0, c15 = 0.0;
-    double dfGeocLat = 0.0;  // geocentric latitude of the scene centre
+    ModelTerms sTerms;
+    double adfStart[kMaxUnknowns] = {};  // starting values (P3 ... P7 used)
+    double dfGeocLat = 0.0;              // geocentric latitude of the scene centre
     double adfAttitude[3] = {};
-    // Per-line values of PLA/MLA images: the table's dfValue1 and dfValue2.
-    std::vector<double> adfLineA;
-    std::vector<double> adfLineB;
-    bool bHasLineArrays = false;
 
     const int* Positions() const { return bRadar ? kRadarPosition : kOpticalPosition; }
-    void UpdateDerived();
 };
 
 // One observation of a point in one image.
@@ -127,12 +118,6 @@ class NormalEquations {
 // hold are a fatal error rather than a crash.
 std::unique_ptr<NormalEquations> MakeNormalEquations(int nUnknowns);
 
-// The terms of the image-to-ground equations of one measurement.
-struct GroundTerms {
-    double t = 0.0, u = 0.0, H = 0.0, g = 0.0, K = 0.0;
-    double dfX = 0.0, dfY = 0.0;
-};
-
 // Two images whose viewing angles differ enough to intersect their rays.
 struct ImagePair {
     std::size_t i = 0, j = 0;  // i < j
@@ -177,11 +162,9 @@ void ConvertControlPointTo1A(const EphemerisSeg_t* psSeg, double* pdfPixel, doub
 // Sensor set-up and segment values (sensor_setup.cpp)
 // ---------------------------------------------------------------------------
 
-// Case-insensitive prefix test on the segment's sensor name.
-bool SegmentStartsWith(const EphemerisSeg_t& sSeg, const char* pszPrefix);
-// Per-line look table of a segment (kind 1 with lines), or null.
-const AttitudeData_t* AttitudeTable(const EphemerisSeg_t* psSeg);
 bool ShortNameContains(const ImageSetup& sSetup, const char* pszText);
+// Sensors whose image coordinates go through the level 1A/1B conversion.
+bool IsLevelSensor(int nSensor);
 // The elevation terms need at least two different elevations among the
 // first nControlPoints points.
 void SpreadElevations(Adjustment& sAdj, std::size_t nControlPoints);
@@ -189,15 +172,15 @@ void SpreadElevations(Adjustment& sAdj, std::size_t nControlPoints);
 void PrepareImages(Adjustment& sAdj);
 
 // ---------------------------------------------------------------------------
-// Equations of the adjustment (equations.cpp)
+// Equations of the adjustment (equations.cpp; the image <-> ground equations
+// are declared in model_terms.h)
 // ---------------------------------------------------------------------------
 
-// Image-to-ground of the adjustment at centred coordinates and elevation.
-GroundTerms AdjustmentImageToGround(const ImageState& sImg, double xc, double yc, double Z);
-// Coefficients of the X row (bXRow) or the Y row, by parameter P0 ... P12.
-void ObservationCoefficients(const ImageState& sImg, const GroundTerms& s, bool bXRow,
+// Partial derivatives of the X row (bXRow) or the Y row of a measurement
+// whose image-to-ground terms are s, by parameter P0 ... P12.
+void ObservationCoefficients(const ModelTerms& m, const GroundTerms& s, bool bXRow,
                              double* pdfCoef);
-Displacement DisplacementOf(const ImageState& sImg, double xc);
+Displacement DisplacementOf(const ModelTerms& m, double xc);
 // Writes image k's coefficients (by parameter) into its block of the row;
 // positions beyond the image's unknown count are not written.
 void WriteBlock(const Adjustment& sAdj, std::size_t k, const double* pdfCoef, double* pdfRow);
