@@ -5,17 +5,15 @@
 
 #include <cmath>
 #include <cstdlib>
-#include <filesystem>
 #include <limits>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include <unistd.h>
-
 #include "crs.h"
 #include "projection.h"
 #include "runtime.h"
+#include "support/proj_without_geoid.h"
 
 namespace {
 
@@ -376,33 +374,21 @@ TEST(CRS, BadInputIsReported) {
 // With the geoid model absent, a transformation between geoid and
 // ellipsoidal heights is refused instead of copying heights unchanged.
 TEST(CRS, MissingGeoidModelGivesNoTransform) {
-    const std::filesystem::path oDatabase = "/usr/share/proj/proj.db";
-    if (!std::filesystem::exists(oDatabase)) GTEST_SKIP() << "no " << oDatabase;
-    const char* pszSavedData = std::getenv("PROJ_DATA");
-    const std::string osSaved = pszSavedData != nullptr ? pszSavedData : "";
-    const std::filesystem::path oDir =
-        std::filesystem::temp_directory_path() / ("lumo_crs_nogeoid_" + std::to_string(getpid()));
-    std::filesystem::create_directories(oDir);
-    std::filesystem::create_symlink(oDatabase, oDir / "proj.db");
-    setenv("PROJ_DATA", oDir.c_str(), 1);
-
+    using lumo::support::ProjWithoutGeoid;
+    if (!ProjWithoutGeoid::Available()) GTEST_SKIP() << "no PROJ database";
     bool bOrthometric = true;
     bool bEllipsoidal = false;
-    // A new thread makes a new PROJ context, which reads the search path.
-    std::thread oWorker([&] {
-        CRSPtr poLonLat(utils::CreateCRSFromDefinition("EPSG:4326"));
-        CRSPtr poWgs84 = WGS84Ellipsoidal();
-        bOrthometric = static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Orthometric), poWgs84));
-        bEllipsoidal = static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Ellipsoidal), poWgs84));
-    });
-    oWorker.join();
-
-    if (pszSavedData != nullptr) {
-        setenv("PROJ_DATA", osSaved.c_str(), 1);
-    } else {
-        unsetenv("PROJ_DATA");
+    {
+        const ProjWithoutGeoid oNoGeoid("crs");
+        ProjWithoutGeoid::RunInNewContext([&] {
+            CRSPtr poLonLat(utils::CreateCRSFromDefinition("EPSG:4326"));
+            CRSPtr poWgs84 = WGS84Ellipsoidal();
+            bOrthometric =
+                static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Orthometric), poWgs84));
+            bEllipsoidal =
+                static_cast<bool>(Transform(Compound(poLonLat, CS_VD_Ellipsoidal), poWgs84));
+        });
     }
-    std::filesystem::remove_all(oDir);
     EXPECT_FALSE(bOrthometric);
     EXPECT_TRUE(bEllipsoidal);
 }

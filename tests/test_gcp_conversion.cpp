@@ -18,6 +18,7 @@
 #include "points_io.h"
 #include "projection.h"
 #include "runtime.h"
+#include "support/proj_without_geoid.h"
 
 namespace {
 
@@ -169,16 +170,8 @@ TEST(GcpConversion, PointThatCannotBeTransformedChangesNothing) {
 // Without the geoid model no transformation from mean sea level heights
 // exists: the documented exception, even for an empty vector.
 TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
-    const std::filesystem::path oDatabase = "/usr/share/proj/proj.db";
-    if (!std::filesystem::exists(oDatabase)) GTEST_SKIP() << "no " << oDatabase;
-    const char* pszSavedData = std::getenv("PROJ_DATA");
-    const std::string osSaved = pszSavedData != nullptr ? pszSavedData : "";
-    const std::filesystem::path oDir =
-        std::filesystem::temp_directory_path() / ("lumo_gcp_nogeoid_" + std::to_string(getpid()));
-    std::filesystem::create_directories(oDir);
-    std::filesystem::create_symlink(oDatabase, oDir / "proj.db");
-    setenv("PROJ_DATA", oDir.c_str(), 1);
-
+    using lumo::support::ProjWithoutGeoid;
+    if (!ProjWithoutGeoid::Available()) GTEST_SKIP() << "no PROJ database";
     const ProjInfo_t sLonLat = Projection("LONG/LAT D000");
     const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 5.0, 52.0, 0.0}};
     std::vector<ControlPoint_t> asGcps = asIn;
@@ -188,32 +181,26 @@ TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
     int nLine = 0;
     bool bEmptyThrew = false;
     bool bEllipsoidalWorked = false;
-    // A new thread makes a new PROJ context, which reads the search path.
-    std::thread oWorker([&] {
-        try {
-            ConvertGcpsToWgs84Ell(sLonLat, "M", asGcps);
-        } catch (const nova::Exception& e) {
-            osMessage = e.GetMessage();
-            osFile = e.GetFile();
-            osFunction = e.GetFunction();
-            nLine = e.GetLine();
-        }
-        try {
-            ConvertGcpsToWgs84Ell(sLonLat, "M", asEmpty);
-        } catch (const nova::Exception&) {
-            bEmptyThrew = true;
-        }
-        ConvertGcpsToWgs84Ell(sLonLat, "E", asEll);
-        bEllipsoidalWorked = true;
-    });
-    oWorker.join();
-
-    if (pszSavedData != nullptr) {
-        setenv("PROJ_DATA", osSaved.c_str(), 1);
-    } else {
-        unsetenv("PROJ_DATA");
+    {
+        const ProjWithoutGeoid oNoGeoid("gcp");
+        ProjWithoutGeoid::RunInNewContext([&] {
+            try {
+                ConvertGcpsToWgs84Ell(sLonLat, "M", asGcps);
+            } catch (const nova::Exception& e) {
+                osMessage = e.GetMessage();
+                osFile = e.GetFile();
+                osFunction = e.GetFunction();
+                nLine = e.GetLine();
+            }
+            try {
+                ConvertGcpsToWgs84Ell(sLonLat, "M", asEmpty);
+            } catch (const nova::Exception&) {
+                bEmptyThrew = true;
+            }
+            ConvertGcpsToWgs84Ell(sLonLat, "E", asEll);
+            bEllipsoidalWorked = true;
+        });
     }
-    std::filesystem::remove_all(oDir);
 
     EXPECT_EQ(osMessage, "Could not transform GCPs to WGS84 Ellipsoidal");
     EXPECT_EQ(osFile, "mathmodel/lumo/mmodel_func");
