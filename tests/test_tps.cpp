@@ -425,11 +425,11 @@ TEST(TpsModel, AllocateCopyReleaseAndDispatchCodeFive) {
     EXPECT_EQ(model->nPixels, 0);
     ASSERT_NE(model->psProjInfo, nullptr);
 
-    // Before a fit the dispatch succeeds with zeros, as the family reports.
+    // Before a fit there is no position: the null value, not zeros.
     double px = 5, ln = 5;
     EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), 1.0, 2.0, 0.0, &px, &ln), 1);
-    EXPECT_EQ(px, 0.0);
-    EXPECT_EQ(ln, 0.0);
+    EXPECT_EQ(px, LUMO_NULL_VALUE);
+    EXPECT_EQ(ln, LUMO_NULL_VALUE);
 
     Points p = SmoothPoints(30, 0.0, 1000.0, 21);  // ground -> image
     TRNCalculate(model->psGeoToImage, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data(),

@@ -12,6 +12,7 @@
 
 #include "errors.h"
 #include "lumo_tps.h"
+#include "null_value.h"
 #include "projection.h"
 #include "regression.h"
 #include "runtime.h"
@@ -493,12 +494,19 @@ void TPSDeallocate(TPSMInfo_t* psModel) {
     std::free(psModel);
 }
 
+// A point the spline cannot map (not finite, or no fit) has no position:
+// both outputs hold the null value rather than the container's zeros, which
+// a caller could not tell from a real position.
 void TPSGeo2Img(TPSMInfo_t* psModel, double dfX, double dfY, double* pdfPixel, double* pdfLine) {
     if (psModel == nullptr) return;
-    TRNTransform(psModel->psGeoToImage, dfX, dfY, pdfPixel, pdfLine);
+    if (TRNTransform(psModel->psGeoToImage, dfX, dfY, pdfPixel, pdfLine) == 0) {
+        lumo::SetNullPair(pdfPixel, pdfLine);
+    }
 }
 
 void TPSImg2Geo(TPSMInfo_t* psModel, double dfPixel, double dfLine, double* pdfX, double* pdfY) {
     if (psModel == nullptr) return;
-    TRNTransform(psModel->psImageToGeo, dfPixel, dfLine, pdfX, pdfY);
+    if (TRNTransform(psModel->psImageToGeo, dfPixel, dfLine, pdfX, pdfY) == 0) {
+        lumo::SetNullPair(pdfX, pdfY);
+    }
 }
