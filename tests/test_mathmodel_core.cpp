@@ -281,39 +281,6 @@ TEST(MathModelCore, BlockRoundTripThroughExplicitInputArrays) {
     }
 }
 
-TEST(MathModelCore, BlockFollowsIrregularExplicitInputs) {
-    // Pixel/line arrays off a regular grid by up to 0.4 pixel, with a few
-    // points far off: each point is mapped at its own input.
-    SmoothModel oModel;
-    const int nCols = 257;
-    const int nRows = 190;
-    std::vector<float> afPixel(static_cast<std::size_t>(nCols) * nRows);
-    std::vector<float> afLine(afPixel.size());
-    for (int r = 0; r < nRows; ++r) {
-        for (int c = 0; c < nCols; ++c) {
-            const std::size_t i = static_cast<std::size_t>(r) * nCols + c;
-            afPixel[i] = static_cast<float>(c + 0.4 * std::sin(i * 12.9898));
-            afLine[i] = static_cast<float>(r + 0.4 * std::cos(i * 78.233));
-        }
-    }
-    afPixel[40 * nCols + 70] += 60.0f;
-    afLine[100 * nCols + 200] -= 45.0f;
-    const double dfTol = 0.01;
-    Block oOut(nCols, nRows);
-    ASSERT_EQ(0, nm::ImageToGround(&oModel, nCols, nRows, 32, afPixel.data(), afLine.data(),
-                                   nullptr, oOut.afOut1.data(), oOut.afOut2.data(), nullptr, 0, 0,
-                                   0, 0, dfTol, false));
-    // The jitter is followed to first order, not by evaluating every point.
-    EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(afPixel.size() / 20));
-    for (std::size_t i = 0; i < afPixel.size(); ++i) {
-        double dfX = 0.0;
-        double dfY = 0.0;
-        SmoothModel::Forward(afPixel[i], afLine[i], 0.0, dfX, dfY);
-        ASSERT_NEAR(dfX, oOut.afOut1[i], dfTol + FloatUlp(dfX)) << i;
-        ASSERT_NEAR(dfY, oOut.afOut2[i], dfTol + FloatUlp(dfY)) << i;
-    }
-}
-
 TEST(MathModelCore, BlockFormFlagsFailedPointsExactly) {
     SmoothModel oModel;
     oModel.mdfFailFromPixel = 403.5;  // half-plane of failure, across grid cells

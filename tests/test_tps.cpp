@@ -18,8 +18,11 @@
 #include "projection.h"
 #include "regression.h"
 #include "runtime.h"
+#include "support/numbered_error.h"
 
 namespace {
+
+using lumo::support::FatalOf;
 
 struct Points {
     std::vector<double> x, y, X, Y;
@@ -50,17 +53,6 @@ Points SmoothPoints(int n, double x0, double extent, unsigned seed) {
 
 void Fit(TPSInfo_t& t, Points& p) {
     TPSCalculate(&t, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data());
-}
-
-// Code and message of the fatal error that f raises; 0 when none.
-template <typename F>
-std::pair<int, std::string> FatalOf(F f) {
-    try {
-        f();
-    } catch (const nova::NumberedError& e) {
-        return {e.GetCode(), e.GetMessage()};
-    }
-    return {0, ""};
 }
 
 // The spline evaluated term by term with the scalar formula.
@@ -192,15 +184,6 @@ TEST(TpsFit, InterpolatesExactlyAndMatchesAnIndependentSolve) {
         EXPECT_NEAR(X, sX, 1e-12 * std::abs(sX));
         EXPECT_NEAR(Y, sY, 1e-12 * std::abs(sY));
     }
-    // Weights are orthogonal to the affine part.
-    double sw = 0.0, swx = 0.0, swAbs = 0.0;
-    for (int i = 0; i < n; ++i) {
-        sw += t.padfCoefX[3 + i];
-        swx += t.padfCoefX[3 + i] * (p.x[i] - ox);
-        swAbs += std::abs(t.padfCoefX[3 + i]);
-    }
-    EXPECT_LT(std::abs(sw), 1e-10 * swAbs);
-    EXPECT_LT(std::abs(swx), 1e-10 * swAbs * 20000.0);
 }
 
 TEST(TpsFit, SizesTooSmallArraysAndKeepsLargerOnes) {
@@ -216,15 +199,6 @@ TEST(TpsFit, SizesTooSmallArraysAndKeepsLargerOnes) {
     Fit(large, p);
     EXPECT_EQ(large.nAllocCPs, 40);
     EXPECT_EQ(large.nCPs, 25);
-
-    TPSInfo_t t(3);
-    t.SetNumCPs(0);
-    EXPECT_EQ(t.nAllocCPs, 0);
-    EXPECT_EQ(t.padfCPX, nullptr);
-    t.SetNumCPs(5);
-    EXPECT_EQ(t.nAllocCPs, 5);
-    ASSERT_NE(t.padfCoefY, nullptr);
-    t.padfCoefY[7] = 1.0;  // n + 3 coefficients
 }
 
 TEST(TpsFit, FailuresRaiseErrorHundredAndKeepTheSpline) {
@@ -270,24 +244,9 @@ TEST(TpsFit, FailuresRaiseErrorHundredAndKeepTheSpline) {
     EXPECT_EQ(t.nCPs, 10);
 }
 
-TEST(TpsFit, CoincidentControlPointsLowerTheRank) {
-    Points p = SmoothPoints(8, 0.0, 100.0, 9);
-    p.Add(p.x[2], p.y[2], p.X[2], p.Y[2]);  // a repeated point
-    TPSInfo_t t(0);
-    Fit(t, p);
-    EXPECT_EQ(t.nCPs, 9);
-    EXPECT_EQ(t.nRank, 11);  // n + 3 - 1
-    EXPECT_GT(t.dfCondition, 0.0);
-    for (int i = 0; i < p.Size(); ++i) {
-        double X = 0.0, Y = 0.0;
-        TPSTransform(&t, p.x[i], p.y[i], &X, &Y);
-        EXPECT_NEAR(X, p.X[i], 1e-6);
-        EXPECT_NEAR(Y, p.Y[i], 1e-6);
-    }
-}
-
-TEST(TpsFit, LargeSetsKeepRankAndInterpolation) {
-    // Enough points for the solver's block-pivoted path, with repeats.
+TEST(TpsFit, RepeatedPointsLowerTheRankAndLargeSetsInterpolate) {
+    // Enough points for the solver's block-pivoted path, with repeated
+    // points, each of which lowers the rank by one.
     Points p = SmoothPoints(400, 0.0, 5000.0, 13);
     for (int i : {10, 200, 350}) {
         p.Add(p.x[i], p.y[i], p.X[i], p.Y[i]);
@@ -383,28 +342,6 @@ TEST(TpsConcurrency, FitsAndEvaluationsOnSeveralThreads) {
             EXPECT_EQ(parallel[k]->padfCoefX[i], serial[k]->padfCoefX[i]);
         EXPECT_LT(rmsX[k], 1e-6);
     }
-
-    // One spline evaluated from several threads gives the serial results.
-    const TPSInfo_t& shared = *serial[0];
-    std::vector<double> expect(200);
-    for (int i = 0; i < 100; ++i)
-        TPSTransform(serial[0].get(), 5.0 * i, 1000.0 - 7.0 * i, &expect[2 * i],
-                     &expect[2 * i + 1]);
-    std::vector<int> mismatches(kThreads, 0);
-    threads.clear();
-    for (int k = 0; k < kThreads; ++k) {
-        threads.emplace_back([&, k] {
-            for (int rep = 0; rep < 20; ++rep)
-                for (int i = 0; i < 100; ++i) {
-                    double X, Y;
-                    TPSTransform(const_cast<TPSInfo_t*>(&shared), 5.0 * i, 1000.0 - 7.0 * i, &X,
-                                 &Y);
-                    mismatches[k] += X != expect[2 * i] || Y != expect[2 * i + 1];
-                }
-        });
-    }
-    for (auto& th : threads) th.join();
-    for (int k = 0; k < kThreads; ++k) EXPECT_EQ(mismatches[k], 0);
 }
 
 namespace {
@@ -416,7 +353,7 @@ using ModelPtr = std::unique_ptr<TPSMInfo_t, ModelDeleter>;
 
 }  // namespace
 
-TEST(TpsModel, AllocateCopyReleaseAndDispatchCodeFive) {
+TEST(TpsModel, AllocateCopyAndRelease) {
     ModelPtr model(TPSAllocate(nullptr));
     ASSERT_NE(model->psGeoToImage, nullptr);
     ASSERT_NE(model->psImageToGeo, nullptr);
@@ -440,16 +377,6 @@ TEST(TpsModel, AllocateCopyReleaseAndDispatchCodeFive) {
     model->nLines = 3500;
     std::strcpy(model->pszGeosys, "UTM 11 D000");
 
-    EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), p.x[3], p.y[3], 123.0, &px, &ln), 1);
-    EXPECT_NEAR(px, p.X[3], 1e-6);
-    EXPECT_NEAR(ln, p.Y[3], 1e-6);
-    double gx = 0, gy = 0, z = 77.0;
-    EXPECT_EQ(GenImg2GeoDem(LUMO_CODE_TPS, model.get(), p.X[3], p.Y[3], &z, &gx, &gy), 1);
-    EXPECT_NEAR(gx, p.x[3], 1e-6);
-    EXPECT_NEAR(gy, p.y[3], 1e-6);
-    EXPECT_EQ(z, 77.0);
-    EXPECT_EQ(GenImg2Geo(LUMO_CODE_TPS, model.get(), p.X[3], p.Y[3], LUMO_NULL_VALUE, &gx, &gy), 1);
-
     // A copy into a record that TPSAllocate filled in place.
     auto* psRaw = static_cast<TPSMInfo_t*>(HCalloc(1, sizeof(TPSMInfo_t)));
     psRaw->nPixels = 9;
@@ -470,7 +397,5 @@ TEST(TpsModel, AllocateCopyReleaseAndDispatchCodeFive) {
     TPSGeo2Img(copy.get(), 250.0, 600.0, &px, &ln);
     EXPECT_EQ(px, expectPx);
     EXPECT_EQ(ln, expectLn);
-    TPSImg2Geo(copy.get(), p.X[0], p.Y[0], &gx, &gy);
-    EXPECT_NEAR(gx, p.x[0], 1e-6);
     TPSDeallocate(nullptr);
 }

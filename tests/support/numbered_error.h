@@ -1,0 +1,25 @@
+// The numbered error a call raises, for the tests of failure paths.
+#pragma once
+
+#include <string>
+#include <utility>
+
+#include "runtime.h"
+
+namespace lumo {
+namespace support {
+
+// Runs fn and returns the number and full text of the fatal numbered error
+// it raises; {0, ""} when it raises none.
+template <typename F>
+std::pair<int, std::string> FatalOf(F fn) {
+    try {
+        fn();
+    } catch (const nova::NumberedError& e) {
+        return {e.GetCode(), e.what()};
+    }
+    return {0, std::string()};
+}
+
+}  // namespace support
+}  // namespace lumo
