@@ -14,10 +14,13 @@
 #include "nova/mathmodel_core.h"
 #include "nova/runtime.h"
 #include "support/model_stubs.h"
+#include "support/warnings.h"
 
 namespace nm = nova::mathmodel;
 
 namespace {
+
+using lumo::support::WarningCapture;
 
 constexpr float kNullF = static_cast<float>(nm::kMathModelNullValue);
 
@@ -117,20 +120,6 @@ struct Block {
     std::vector<float> afOut1;
     std::vector<float> afOut2;
     std::vector<unsigned char> abyValid;
-};
-
-// Captures the numbered warnings of a scope.
-class WarningCapture {
-  public:
-    WarningCapture() {
-        moPrevious =
-            nova::SetErrorSink([this](const nova::ErrorReport& r) { maoReports.push_back(r); });
-    }
-    ~WarningCapture() { nova::SetErrorSink(moPrevious); }
-    std::vector<nova::ErrorReport> maoReports;
-
-  private:
-    nova::ErrorSink moPrevious;
 };
 
 }  // namespace

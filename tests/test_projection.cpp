@@ -15,8 +15,11 @@
 #include "../host/src/proj_definition.h"
 #include "projection.h"
 #include "runtime.h"
+#include "support/warnings.h"
 
 namespace {
+
+using lumo::support::WarningCapture;
 
 constexpr double kPi = 3.14159265358979323846;
 constexpr double kFtUS = 1200.0 / 3937.0;
@@ -43,20 +46,6 @@ ProjInfo_t Make(const char* pszText) {
     EXPECT_EQ(Geosys2ProjInfo(&sInfo, pszText, 0.0, 0.0, 1.0, 1.0), 0) << pszText;
     return sInfo;
 }
-
-// Collects numbered warnings while alive.
-class WarningCapture {
-  public:
-    WarningCapture() {
-        moPrevious = nova::SetErrorSink(
-            [this](const nova::ErrorReport& sReport) { maoReports.push_back(sReport); });
-    }
-    ~WarningCapture() { nova::SetErrorSink(moPrevious); }
-    std::vector<nova::ErrorReport> maoReports;
-
-  private:
-    nova::ErrorSink moPrevious;
-};
 
 // Meridian arc length from the equator, by Simpson integration (independent
 // of any projection library).

@@ -13,21 +13,11 @@
 #include <vector>
 
 #include "runtime.h"
+#include "support/warnings.h"
 
 namespace {
 
-// Captures warnings for the lifetime of the object.
-class WarningCapture {
-  public:
-    WarningCapture() {
-        moOld = nova::SetErrorSink([this](const nova::ErrorReport& r) { maReports.push_back(r); });
-    }
-    ~WarningCapture() { nova::SetErrorSink(moOld); }
-    std::vector<nova::ErrorReport> maReports;
-
-  private:
-    nova::ErrorSink moOld;
-};
+using lumo::support::WarningCapture;
 
 TEST(Runtime, AllocationNeverReturnsNullAndFreeAcceptsIt) {
     std::unique_ptr<char, nova::FreeDeleter> pZero(static_cast<char*>(HMalloc(0)));
@@ -76,11 +66,11 @@ TEST(Runtime, FatalErrorsThrowWithNumberAndTextWarningsAreCounted) {
     IMPErrChar(189, 0, "X_img", "12345");
     IMPErrReal(189, 0, "Y_img", 3.5, 7);
     EXPECT_EQ(nova::GetWarningCount(), 3u);
-    ASSERT_EQ(oCapture.maReports.size(), 3u);
-    EXPECT_EQ(oCapture.maReports[0].nCode, 11);
-    EXPECT_FALSE(oCapture.maReports[0].bFatal);
-    EXPECT_NE(oCapture.maReports[1].osText.find("X_img"), std::string::npos);
-    EXPECT_NE(oCapture.maReports[2].osText.find("(7)"), std::string::npos);
+    ASSERT_EQ(oCapture.maoReports.size(), 3u);
+    EXPECT_EQ(oCapture.maoReports[0].nCode, 11);
+    EXPECT_FALSE(oCapture.maoReports[0].bFatal);
+    EXPECT_NE(oCapture.maoReports[1].osText.find("X_img"), std::string::npos);
+    EXPECT_NE(oCapture.maoReports[2].osText.find("(7)"), std::string::npos);
     EXPECT_EQ(nova::GetLastErrorReport().nCode, 189);
 
     // Every catalogue number has wording of its own.
