@@ -69,6 +69,33 @@ void AddPairRow(Adjustment& sAdj, NormalEquations& sNormal, const ImagePair& sPa
     sAdj.dfLastRowWeight = dfWeight;
 }
 
+// A point's measurements in both images of a listed pair, with their ground
+// positions and coefficient rows at one elevation.
+struct PairMeasurements {
+    const ImagePair& sPair;
+    const PointSlot& sI;
+    const PointSlot& sJ;
+    const ImageState& sImgI;
+    const ImageState& sImgJ;
+    MeasurementRows sRi;
+    MeasurementRows sRj;
+};
+
+// Calls fn for every listed pair in which both of the point's measurements
+// take part in the adjustment.
+template <typename F>
+void ForEachUsedPair(const Adjustment& sAdj, const PointRecord& sPoint, double dfZ, F fn) {
+    for (const ImagePair& sPair : sAdj.asPairs) {
+        const PointSlot& sI = sPoint.asSlots[sPair.i];
+        const PointSlot& sJ = sPoint.asSlots[sPair.j];
+        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
+        const ImageState& sImgI = sAdj.asImages[sPair.i];
+        const ImageState& sImgJ = sAdj.asImages[sPair.j];
+        fn(PairMeasurements{sPair, sI, sJ, sImgI, sImgJ, RowsOf(sImgI, sI, dfZ),
+                            RowsOf(sImgJ, sJ, dfZ)});
+    }
+}
+
 // Rows that make the ground positions of a point with a known elevation agree
 // in both images of a pair.
 void AddPairRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
@@ -76,59 +103,45 @@ void AddPairRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& 
     const bool bRows =
         sPoint.cType == 'A' || (sPoint.cType == 'X' && dfSdZ <= 0.5 * PlanimetricSd(sPoint));
     if (!bRows) return;
-    for (const ImagePair& sPair : sAdj.asPairs) {
-        const PointSlot& sI = sPoint.asSlots[sPair.i];
-        const PointSlot& sJ = sPoint.asSlots[sPair.j];
-        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
-        const ImageState& sImgI = sAdj.asImages[sPair.i];
-        const ImageState& sImgJ = sAdj.asImages[sPair.j];
-        const MeasurementRows sRi = RowsOf(sImgI, sI, sPoint.dfZ);
-        const MeasurementRows sRj = RowsOf(sImgJ, sJ, sPoint.dfZ);
-        const double dfSigI = sImgI.sSetup.dfAccuracy, dfSigJ = sImgJ.sSetup.dfAccuracy;
+    ForEachUsedPair(sAdj, sPoint, sPoint.dfZ, [&](const PairMeasurements& m) {
+        const double dfSigI = m.sImgI.sSetup.dfAccuracy, dfSigJ = m.sImgJ.sSetup.dfAccuracy;
         const double dfTanDiff =
-            std::tan(sImgI.psSeg->dfViewAngle - sI.dfXc * sImgI.sTerms.dfIfov) -
-            std::tan(sImgJ.psSeg->dfViewAngle - sJ.dfXc * sImgJ.sTerms.dfIfov);
+            std::tan(m.sImgI.psSeg->dfViewAngle - m.sI.dfXc * m.sImgI.sTerms.dfIfov) -
+            std::tan(m.sImgJ.psSeg->dfViewAngle - m.sJ.dfXc * m.sImgJ.sTerms.dfIfov);
         const double w =
             1.0 / std::sqrt(6.25 + (dfSigI * dfSigI + dfSigJ * dfSigJ) / (dfTanDiff * dfTanDiff));
-        if (!(w > 0.0) || !std::isfinite(w)) continue;  // parallel rays bind nothing
+        if (!(w > 0.0) || !std::isfinite(w)) return;  // parallel rays bind nothing
         double adfNegX[kMaxUnknowns], adfNegY[kMaxUnknowns];
         for (int p = 0; p < kMaxUnknowns; ++p) {
-            adfNegX[p] = -sRj.adfX[p];
-            adfNegY[p] = -sRj.adfY[p];
+            adfNegX[p] = -m.sRj.adfX[p];
+            adfNegY[p] = -m.sRj.adfY[p];
         }
-        AddPairRow(sAdj, sNormal, sPair, sRi.adfX, adfNegX, sRi.s.dfX - sRj.s.dfX, w);
-        AddPairRow(sAdj, sNormal, sPair, sRi.adfY, adfNegY, sRi.s.dfY - sRj.s.dfY, w);
-    }
+        AddPairRow(sAdj, sNormal, m.sPair, m.sRi.adfX, adfNegX, m.sRi.s.dfX - m.sRj.s.dfX, w);
+        AddPairRow(sAdj, sNormal, m.sPair, m.sRi.adfY, adfNegY, m.sRi.s.dfY - m.sRj.s.dfY, w);
+    });
 }
 
 // Rows across the direction in which the two images' ground positions part
 // with a wrong elevation: they hold whatever the elevation.
 void AddCrossRows(Adjustment& sAdj, NormalEquations& sNormal, const PointRecord& sPoint) {
     const double dfZ = IsTieOrNoElevation(sPoint) ? sPoint.dfEstZ : sPoint.dfZ;
-    for (const ImagePair& sPair : sAdj.asPairs) {
-        const PointSlot& sI = sPoint.asSlots[sPair.i];
-        const PointSlot& sJ = sPoint.asSlots[sPair.j];
-        if (sI.nFlag != 1 || sJ.nFlag != 1) continue;
-        const ImageState& sImgI = sAdj.asImages[sPair.i];
-        const ImageState& sImgJ = sAdj.asImages[sPair.j];
-        const MeasurementRows sRi = RowsOf(sImgI, sI, dfZ);
-        const MeasurementRows sRj = RowsOf(sImgJ, sJ, dfZ);
-        const Displacement ai = DisplacementOf(sImgI.sTerms, sI.dfXc);
-        const Displacement aj = DisplacementOf(sImgJ.sTerms, sJ.dfXc);
+    ForEachUsedPair(sAdj, sPoint, dfZ, [&](const PairMeasurements& m) {
+        const Displacement ai = DisplacementOf(m.sImgI.sTerms, m.sI.dfXc);
+        const Displacement aj = DisplacementOf(m.sImgJ.sTerms, m.sJ.dfXc);
         const double dx = ai.ax - aj.ax, dy = ai.ay - aj.ay;
         const double n = std::max(std::sqrt(dx * dx + dy * dy), 1e-06);
         double adfI[kMaxUnknowns], adfJ[kMaxUnknowns];
         for (int p = 0; p < kMaxUnknowns; ++p) {
-            adfI[p] = (dy * sRi.adfX[p] - dx * sRi.adfY[p]) / n;
-            adfJ[p] = (dx * sRj.adfY[p] - dy * sRj.adfX[p]) / n;
+            adfI[p] = (dy * m.sRi.adfX[p] - dx * m.sRi.adfY[p]) / n;
+            adfJ[p] = (dx * m.sRj.adfY[p] - dy * m.sRj.adfX[p]) / n;
         }
         const double dfMisclosure =
-            (dy * (sRi.s.dfX - sRj.s.dfX) - dx * (sRi.s.dfY - sRj.s.dfY)) / n;
+            (dy * (m.sRi.s.dfX - m.sRj.s.dfX) - dx * (m.sRi.s.dfY - m.sRj.s.dfY)) / n;
         const double w = sPoint.cType == 'H' || sAdj.dfLastRowWeight == 0.0
                              ? sAdj.dfMinControlWeight
                              : sAdj.dfLastRowWeight;
-        AddPairRow(sAdj, sNormal, sPair, adfI, adfJ, dfMisclosure, w);
-    }
+        AddPairRow(sAdj, sNormal, m.sPair, adfI, adfJ, dfMisclosure, w);
+    });
 }
 
 // Rows of a control point without elevation: across the direction in which
