@@ -154,11 +154,17 @@ LUMO_API int SRITImg2GeoDem(const SRITInfo_t* psModel, double dfPixel, double df
 LUMO_API int SRITImg2GeoDem_imp(const SRITInfo_t* psModel, double dfPixel, double dfLine,
                                 double* pdfZ, double* pdfX, double* pdfY);
 // Ground to image with the fitted model, exactly inverting the image-to-ground
-// equations: starts from toutin_imp and refines with Newton steps on
-// toutin_1_imp until pixel and line move less than 1e-9, then applies the
-// level conversion as SRITGeo2Img does. SRITImg2Geo_imp of the result gives
-// back (dfX, dfY). Returns 1, or 0 (outputs LUMO_NULL_VALUE) for a null or
-// empty model, a non-finite or null input, or when the steps do not close.
+// equations (SRITImg2Geo_imp of the result gives back (dfX, dfY)): the
+// equations are solved for the along- and across-track ground distances,
+// then Newton steps on the image position stop when a step is below 1e-4
+// pixel, leaving the answer within 1e-9 pixel of the exact solution; the
+// level conversion follows as in SRITGeo2Img. The answer is verified: its
+// forward projection must lie within 1e-3 pixel (through the local
+// derivatives) of (dfX, dfY). Returns 1, or 0 (outputs LUMO_NULL_VALUE) for a
+// null or empty model, a non-finite or null input, or an answer that fails
+// the check. This is the form the tool and the math model object use;
+// SRITGeo2Img keeps the closed form, which off nadir misses the equations by
+// tenths of a pixel.
 LUMO_API int SRITGeo2ImgExact(const SRITInfo_t* psModel, double dfX, double dfY, double dfZ,
                               double* pdfPixel, double* pdfLine);
 // Toutin's equations: ground to image, and centred image coordinates

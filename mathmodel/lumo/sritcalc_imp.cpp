@@ -139,36 +139,11 @@ int SRITGeo2ImgExact(const SRITInfo_t* psModel, double dfX, double dfY, double d
         dfZ == kNull) {
         return 0;
     }
-    const ModelTerms m = lumo::srit::TermsOfRecord(*psModel);
-    // Newton's method on the image-to-ground equations, in the model's own
-    // (level 1A) image geometry, started from the ground-to-image equations.
     double p = 0.0, l = 0.0;
-    lumo::srit::GroundToImage(m, dfX, dfY, dfZ, &p, &l);
-    auto Ground = [&](double dfP, double dfL, double* pdfGX, double* pdfGY) {
-        const GroundTerms s = GroundOf(m, dfP, dfL, dfZ);
-        *pdfGX = s.dfX;
-        *pdfGY = s.dfY;
-    };
-    bool bClosed = false;
-    for (int nStep = 0; nStep < 30 && !bClosed; ++nStep) {
-        if (!std::isfinite(p) || !std::isfinite(l)) return 0;
-        double gx = 0.0, gy = 0.0, gxp = 0.0, gyp = 0.0, gxl = 0.0, gyl = 0.0;
-        const double d = 1e-3;
-        Ground(p, l, &gx, &gy);
-        Ground(p + d, l, &gxp, &gyp);
-        Ground(p, l + d, &gxl, &gyl);
-        const double j11 = (gxp - gx) / d, j21 = (gyp - gy) / d;
-        const double j12 = (gxl - gx) / d, j22 = (gyl - gy) / d;
-        const double det = j11 * j22 - j12 * j21;
-        if (!(std::abs(det) > 0.0) || !std::isfinite(det)) return 0;
-        const double rx = dfX - gx, ry = dfY - gy;
-        const double dp = (j22 * rx - j12 * ry) / det;
-        const double dl = (-j21 * rx + j11 * ry) / det;
-        p += dp;
-        l += dl;
-        bClosed = std::abs(dp) < 1e-9 && std::abs(dl) < 1e-9;
+    if (!lumo::srit::GroundToImageExact(lumo::srit::TermsOfRecord(*psModel), dfX, dfY, dfZ, &p,
+                                        &l)) {
+        return 0;
     }
-    if (!bClosed) return 0;
     if (lumo::srit::IsLevelSensor(psModel->nSensor)) SPOT1ATo1B_imp(psModel, &p, &l);
     *pdfPixel = p;
     *pdfLine = l;

@@ -47,7 +47,7 @@ double ObliquityGain(const ModelTerms& m, double xc) {
            (std::sqrt((c2 * xc) * (c2 * xc) + 1.0) * std::sqrt(P4 * P4 + 1.0));
 }
 
-GroundTerms ImageToGround(const ModelTerms& m, double xc, double yc, double Z) {
+GroundTerms ImageToAxes(const ModelTerms& m, double xc, double yc, double Z) {
     const double* P = m.P;
     const Selectors& f = m.sSelect;
     if (f.bLens) {
@@ -61,8 +61,10 @@ GroundTerms ImageToGround(const ModelTerms& m, double xc, double yc, double Z) {
     s.t = -yc * P[kLineSpacing];
     s.u = AcrossDistance(m, xc);
     s.H = f.bCurvature ? Z - s.u * s.u / m.dfTwoN : Z;
-    s.g = ObliquityGain(m, xc);
-    s.K = s.H * s.H / (2.0 * P[kAcrossScale]) + s.H;
+    if (f.bElevationTerm) {
+        s.g = ObliquityGain(m, xc);
+        s.K = s.H * s.H / (2.0 * P[kAcrossScale]) + s.H;
+    }
     const double t = s.t, u = s.u, H = s.H;
     const double F =
         (P[kShear] - t * P[kShearAlong] - u * P[kShearAcross]) * t +
@@ -87,22 +89,42 @@ GroundTerms ImageToGround(const ModelTerms& m, double xc, double yc, double Z) {
         if (f.bRadarLike) A += m.dfAcrossCube * u * u * u;
         B = dfLine + P[kLineSquare] * t * t;
     }
+    s.dfAcross = A;
+    s.dfAlong = B;
+    return s;
+}
+
+GroundTerms ImageToGround(const ModelTerms& m, double xc, double yc, double Z) {
+    GroundTerms s = ImageToAxes(m, xc, yc, Z);
+    const double* P = m.P;
     const double ct = std::cos(P[kRotation]), st = std::sin(P[kRotation]);
-    s.dfX = P[kCentreX] + A * ct + B * st;
-    s.dfY = P[kCentreY] - A * st + B * ct;
+    s.dfX = P[kCentreX] + s.dfAcross * ct + s.dfAlong * st;
+    s.dfY = P[kCentreY] - s.dfAcross * st + s.dfAlong * ct;
     return s;
 }
 
 void GroundToImage(const ModelTerms& m, double dfX, double dfY, double dfZ, double* pdfPixel,
                    double* pdfLine) {
+    double x = 0.0, y = 0.0;
+    GroundToAxes(m, dfX, dfY, &x, &y);
+    AxesToImage(m, x, y, dfZ, pdfPixel, pdfLine);
+}
+
+void GroundToAxes(const ModelTerms& m, double dfX, double dfY, double* pdfAcross,
+                  double* pdfAlong) {
+    const double* P = m.P;
+    const double s = std::sin(P[kRotation]), co = std::cos(P[kRotation]);
+    const double dX = dfX - P[kCentreX], dY = dfY - P[kCentreY];
+    *pdfAlong = dY * co + dX * s;
+    *pdfAcross = dX * co - dY * s;
+}
+
+void AxesToImage(const ModelTerms& m, double x, double y, double dfZ, double* pdfPixel,
+                 double* pdfLine) {
     const double* P = m.P;
     const Selectors& f = m.sSelect;
     const double c0 = m.dfTwoN, c2 = m.dfIfov, c6 = m.dfCosAlongTilt;
     const double h = dfZ;
-    const double s = std::sin(P[kRotation]), co = std::cos(P[kRotation]);
-    const double dX = dfX - P[kCentreX], dY = dfY - P[kCentreY];
-    const double y = dY * co + dX * s;  // along track
-    const double x = dX * co - dY * s;  // across track
     // Across-track ground position of (x', y') on the image's own axes.
     const auto Across = [&](double xp, double yp) {
         const double E =

@@ -127,8 +127,13 @@ struct GroundTerms {
     double t = 0.0;  // along-track ground distance
     double u = 0.0;  // across-track ground distance
     double H = 0.0;  // elevation less the curvature drop
-    double g = 0.0;  // obliquity gain of the elevation term
-    double K = 0.0;  // H^2 / (2 P3) + H
+    // Only where the P12 term applies (always in the adjustment): the
+    // obliquity gain of the elevation term and H^2 / (2 P3) + H.
+    double g = 0.0;
+    double K = 0.0;
+    // The ground offset from the scene centre on the image's axes (across
+    // and along track), and the ground position it gives.
+    double dfAcross = 0.0, dfAlong = 0.0;
     double dfX = 0.0, dfY = 0.0;
 };
 
@@ -139,9 +144,25 @@ double ObliquityGain(const ModelTerms& m, double xc);
 // Image (centred coordinates xc = centre column - pixel, yc = line - centre
 // line) to ground at elevation Z.
 GroundTerms ImageToGround(const ModelTerms& m, double xc, double yc, double Z);
+// The same up to the image's axes: dfAcross and dfAlong are set, dfX and
+// dfY are not.
+GroundTerms ImageToAxes(const ModelTerms& m, double xc, double yc, double Z);
 // Ground to image pixel and line, the approximate inverse of ImageToGround.
 void GroundToImage(const ModelTerms& m, double dfX, double dfY, double dfZ, double* pdfPixel,
                    double* pdfLine);
+// The ground offset from the scene centre on the image's axes (across and
+// along track), and the closed form from those offsets on: GroundToImage is
+// the two in turn.
+void GroundToAxes(const ModelTerms& m, double dfX, double dfY, double* pdfAcross, double* pdfAlong);
+void AxesToImage(const ModelTerms& m, double dfAcross, double dfAlong, double dfZ, double* pdfPixel,
+                 double* pdfLine);
+// Ground to image pixel and line as the exact inverse of ImageToGround:
+// Newton steps on the image position from the closed form's answer, until a
+// step is below 1e-9 pixel. The answer is accepted only when its ground
+// position, mapped back through the local derivatives, lies within the
+// inverse tolerance of (dfX, dfY); false (outputs untouched) otherwise.
+bool GroundToImageExact(const ModelTerms& m, double dfX, double dfY, double dfZ, double* pdfPixel,
+                        double* pdfLine);
 
 }  // namespace srit
 }  // namespace lumo
