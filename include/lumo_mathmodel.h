@@ -16,9 +16,12 @@ class Mutex;
 
 namespace mathmodel {
 
-// Wraps a deep copy of a polynomial (code 4) or thin plate spline (code 5)
-// record. Point operations go through the generic dispatch; array and block
-// operations through the host's free functions with this object first.
+// Wraps a deep copy of a polynomial (code 4), thin plate spline (code 5) or
+// rigorous (code 2) record. Point operations go through the generic
+// dispatch, except a rigorous model's GroundToImage, which is the exact
+// inverse of its image-to-ground equations (SRITGeo2ImgExact) so that both
+// directions agree; array and block operations go through the host's free
+// functions with this object first, and so through the point operations.
 class LUMO_API LumoMathModel : public IMathModel {
   public:
     // Throws nova::ParameterException for a type without a model code.

@@ -311,6 +311,12 @@ TEST(SRITMathModel, ObjectWrapsItsOwnCopyWithTheDownsampleFactor) {
     EXPECT_EQ(oModel.GetDownsampleFactor(), 3);
     EXPECT_NE(oModel.GetModel(), psModel.get());
     ASSERT_NE(oModel.GetCRS(), nullptr);
+    // Ground to image is the exact inverse of image to ground.
+    double dfX = 0, dfY = 0, dfPixel = 0, dfLine = 0;
+    ASSERT_EQ(oModel.ImageToGround(3000.5, 7000.25, 800.0, dfX, dfY, false), 0);
+    ASSERT_EQ(oModel.GroundToImage(dfX, dfY, 800.0, dfPixel, dfLine, false), 0);
+    EXPECT_NEAR(dfPixel, 3000.5, 1e-6);
+    EXPECT_NEAR(dfLine, 7000.25, 1e-6);
     oModel.SetDownsampleFactor(2);
     EXPECT_EQ(static_cast<const SRITInfo_t*>(oModel.GetModel())->anAux[0], 2);
 }

@@ -117,22 +117,48 @@ TEST(SRITAccuracy, NoisyControlPoints) {
     }
 }
 
-TEST(SRITAccuracy, ExactTransformClosesTheRoundTrip) {
+// The exact form inverts image to ground for every form of the equations
+// (each has its own derivatives): general, no curvature (class 2), the cubic
+// terms of class 5, the radar-like class 6, the P12 term, the linear form and
+// the lens correction. A ground point far outside the model is a failure.
+TEST(SRITAccuracy, ExactTransformInvertsEveryForm) {
     SceneParams s;
     s.dfRollDeg = 20.0;
     const Fit sFit = FitScene(s, 10, 10, 0.0, 61);
-    const Scene sScene(s);
-    for (const SimPoint& p : sScene.SamplePoints(50, 62, 0.0, 2000.0)) {
-        double dfPixel = 0, dfLine = 0, dfX = 0, dfY = 0;
-        ASSERT_EQ(SRITGeo2ImgExact(sFit.psModel.get(), p.dfX, p.dfY, p.dfZ, &dfPixel, &dfLine), 1);
-        ASSERT_EQ(SRITImg2Geo_imp(sFit.psModel.get(), dfPixel, dfLine, p.dfZ, &dfX, &dfY), 1);
-        // Back to the image through the exact form: the round trip closes.
-        double dfPixel2 = 0, dfLine2 = 0;
-        ASSERT_EQ(SRITGeo2ImgExact(sFit.psModel.get(), dfX, dfY, p.dfZ, &dfPixel2, &dfLine2), 1);
-        EXPECT_NEAR(dfPixel2, dfPixel, 1e-6);
-        EXPECT_NEAR(dfLine2, dfLine, 1e-6);
-        EXPECT_NEAR(dfX, p.dfX, 1e-5);
-        EXPECT_NEAR(dfY, p.dfY, 1e-5);
+    const auto Variant = [&](int nClass, int nSensor, int nCoef, double dfValue) {
+        ModelPtr psModel(SRITAllocate());
+        SRITCopy(psModel.get(), sFit.psModel.get());
+        psModel->nModelClass = nClass;
+        psModel->nSensor = nSensor;
+        psModel->adfCoef[nCoef] = dfValue;
+        return psModel;
+    };
+    std::vector<ModelPtr> apsModels;
+    apsModels.push_back(Variant(1, 55, 18, 0.0));
+    apsModels.push_back(Variant(2, 55, 18, 0.0));
+    apsModels.push_back(Variant(5, 55, 21, 1e-14));
+    apsModels.back()->adfCoef[20] = 1e-14;
+    apsModels.back()->adfCoef[22] = 1e-8;
+    apsModels.push_back(Variant(6, 55, 21, 1e-14));
+    apsModels.push_back(Variant(1, 55, 18, 1e-3));
+    apsModels.push_back(Variant(1, 30, 18, 0.0));  // TM: the linear form
+    apsModels.push_back(Variant(1, 50, 18, 0.0));  // the lens-corrected camera
+    for (std::size_t k = 0; k < apsModels.size(); ++k) {
+        const SRITInfo_t* psModel = apsModels[k].get();
+        for (double dfPixel : {0.0, 3000.5, 11999.0}) {
+            for (double dfLine : {0.0, 6000.25, 11999.0}) {
+                for (double dfZ : {-200.0, 2500.0}) {
+                    double dfX = 0, dfY = 0, dfP = 0, dfL = 0;
+                    ASSERT_EQ(SRITImg2Geo_imp(psModel, dfPixel, dfLine, dfZ, &dfX, &dfY), 1);
+                    ASSERT_EQ(SRITGeo2ImgExact(psModel, dfX, dfY, dfZ, &dfP, &dfL), 1) << k;
+                    EXPECT_NEAR(dfP, dfPixel, 1e-6) << k;
+                    EXPECT_NEAR(dfL, dfLine, 1e-6) << k;
+                }
+            }
+        }
+        double dfP = 0, dfL = 0;
+        EXPECT_EQ(SRITGeo2ImgExact(psModel, 1e12, 1e12, 0.0, &dfP, &dfL), 0) << k;
+        EXPECT_EQ(dfP, LUMO_NULL_VALUE);
     }
 }
 

@@ -53,9 +53,9 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     ReadRms(r.osOut, &dfPixel, &dfLine);
     EXPECT_LT(dfPixel, 0.5);
     EXPECT_LT(dfLine, 0.5);
-    // The exact inverse maps the check points to within the model's error
-    // of the truth, and its output reads back as image points.
-    r = RunTool({"transform", model, "--to-image", checks, "--exact", "-o", Path("exact.csv")});
+    // The exact inverse (the default) maps the check points to within the
+    // model's error of the truth, and its output reads back as image points.
+    r = RunTool({"transform", model, "--to-image", checks, "-o", Path("exact.csv")});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
     const lumo::cli::PointSet truth =
         lumo::cli::ReadPointsFile(checks, lumo::cli::PointKind::ControlPoint);
@@ -80,10 +80,10 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     r = RunTool({"fit", "--model", "srit", "--gcps", gcps, "-o", Path("x.json")});
     EXPECT_NE(r.nCode, 0);
     EXPECT_NE(r.osErr.find("--segment"), std::string::npos) << r.osErr;
-    r = RunTool({"transform", model, "--to-ground", gcps, "--exact"});
-    EXPECT_NE(r.nCode, 0);
+    r = RunTool({"transform", model, "--to-ground", gcps, "--closed-form"});
+    EXPECT_EQ(r.nCode, 2);
     r = RunTool({"transform", std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31.json",
-                 "--to-image", checks, "--exact"});
+                 "--to-image", checks, "--closed-form"});
     EXPECT_NE(r.nCode, 0);
     EXPECT_NE(r.osErr.find("srit"), std::string::npos) << r.osErr;
     r = RunTool({"simulate", "--segment", seg, "--gcps", gcps, "--lat", "89"});
@@ -106,8 +106,8 @@ TEST(SritDemo, SampleModelMeetsItsCheckPoints) {
             lumo::cli::RunFamilyDemo(demo, std::string(LUMO_SOURCE_DIR) + "/examples");
         EXPECT_EQ(r.nGcps, 30u);
         EXPECT_LT(r.sImageResidual.Rms(), 0.5);
-        // The two transforms are approximate inverses of each other.
-        EXPECT_LT(r.sImageRoundTrip.dfMax, 1.0);
+        // Ground to image is the exact inverse of image to ground.
+        EXPECT_LE(r.sImageRoundTrip.dfMax, 1e-6);
         return;
     }
     FAIL() << "no srit row in the demo";

@@ -490,6 +490,15 @@ int LumoMathModel::GroundToImage(double dfX, double dfY, double dfZ, double& dfP
                                  double& dfLine, bool /*bFlag*/) const {
     try {
         if (!mbThreadSafe) throw Exception(kNotThreadSafe, kFile, kFnGroundToImagePoint, 680);
+        // A rigorous model maps by the exact inverse of its image-to-ground
+        // equations, so that orthorectification and ImageToGround agree;
+        // its closed form misses them by tenths of a pixel off nadir.
+        if (mnModelCode == LUMO_CODE_SRIT) {
+            return SRITGeo2ImgExact(static_cast<const SRITInfo_t*>(mpData), dfX, dfY, dfZ, &dfPixel,
+                                    &dfLine) == 1
+                       ? 0
+                       : -1;
+        }
         return GenGeo2Img(mnModelCode, mpData, dfX, dfY, dfZ, &dfPixel, &dfLine) == 1 ? 0 : -1;
     } catch (...) {
         LogPointFailure(

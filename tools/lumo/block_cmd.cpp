@@ -22,6 +22,7 @@
 #include "nova/projection.h"
 #include "segment_io.h"
 #include "srit_io.h"
+#include "transform.h"
 
 namespace lumo::cli {
 namespace {
@@ -139,8 +140,7 @@ nlohmann::json ImageResiduals(const BlockProject& project, const std::string& id
             continue;
         }
         double pixel = 0.0, line = 0.0;
-        SRITGeo2Img(&model, g.dfX, g.dfY, g.dfZ, &pixel, &line);
-        if (!IsPosition(pixel, line)) {
+        if (!SritToImage(model, g.dfX, g.dfY, g.dfZ, &pixel, &line) || !IsPosition(pixel, line)) {
             ++failed;
             continue;
         }

@@ -8,6 +8,7 @@
 
 #include "model_io.h"
 #include "point_prep.h"
+#include "transform.h"
 
 namespace CLI {
 class App;
@@ -50,12 +51,6 @@ void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
                 const std::string& outputPath, CommandContext& context);
 
-// `lumo transform --exact --to-image`: one ground point to the image of a
-// rigorous model with the exact inverse of its image-to-ground equations;
-// false when it does not converge.
-bool SritExactToImage(const LoadedModel& model, double dfX, double dfY, double dfZ,
-                      double* pdfPixel, double* pdfLine);
-
 // Arguments of the point-transform commands (transform and the per-family
 // commands): MODEL --to-image|--to-ground POINTS [-o OUT] with the point
 // file options.
@@ -65,11 +60,15 @@ struct TransformOptions {
     std::string osToGround;
     std::string osOutput;
     PointFileOptions sPoints;
-    bool bExact = false;  // transform --exact
+    RigorousForm eForm = RigorousForm::Exact;  // transform --closed-form
 };
 
 // Adds the shared arguments to a command; exactly one direction is accepted.
 void AddTransformArguments(CLI::App& command, TransformOptions& options);
+// --closed-form (and the old --exact, now the default) for the rigorous model.
+void AddRigorousFormFlags(CLI::App& command, RigorousForm& form);
+// Fails when --closed-form was given for a model that is not rigorous.
+void RequireRigorousForClosedForm(RigorousForm form, const LoadedModel& model);
 // Fails with a usage error when neither direction was given.
 void RequireDirection(const TransformOptions& options);
 // Maps the chosen point file through `model` and writes the result.

@@ -15,6 +15,7 @@
 #include "commands.h"
 #include "model_io.h"
 #include "points_io.h"
+#include "transform.h"
 
 namespace lumo::cli {
 namespace {
@@ -32,8 +33,7 @@ struct ImagePoint {
 
 ImagePoint ToImage(const LoadedModel& model, const GroundPoint& g) {
     ImagePoint i{0.0, 0.0};
-    if (!GenGeo2Img(model.nModelCode, model.poRecord.get(), g.x, g.y, g.z, &i.pixel, &i.line) ||
-        !IsPosition(i.pixel, i.line)) {
+    if (!GroundToImage(model, g.x, g.y, g.z, &i.pixel, &i.line) || !IsPosition(i.pixel, i.line)) {
         LUMO_CLI_FAIL(model.sEnvelope.osSource + ": the model cannot map ground point (" +
                       FormatDouble(g.x) + ", " + FormatDouble(g.y) + ") to the image");
     }

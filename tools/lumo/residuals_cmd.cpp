@@ -24,6 +24,7 @@ struct ResidualsOptions {
     std::string osGcps;
     std::string osOutput;
     PointFileOptions sPoints;
+    RigorousForm eForm = RigorousForm::Exact;
 };
 
 // Model position minus control point position, both directions; a direction
@@ -63,13 +64,14 @@ struct Summary {
 
 // Residuals of one control point whose ground position in the model's system
 // is `ground`; a direction the model cannot compute fails the point.
-Residual ResidualOf(const LoadedModel& model, const GroundXY& ground, PointRecord& p) {
+Residual ResidualOf(const LoadedModel& model, RigorousForm form, const GroundXY& ground,
+                    PointRecord& p) {
     Residual r;
     if (p.Failed()) return r;  // the ground position could not be converted
     PointRecord image = p;
     image.dfX = ground.x;
     image.dfY = ground.y;
-    TransformPoint(model, Direction::ToImage, image);
+    TransformPoint(model, Direction::ToImage, image, form);
     PointRecord back = p;
     TransformPoint(model, Direction::ToGround, back);
     r.bImage = !image.Failed();
@@ -140,6 +142,7 @@ void WriteTable(std::ostream& out, const PointSet& gcps, const std::vector<Resid
 
 void RunResiduals(const ResidualsOptions& options, CommandContext& context) {
     const LoadedModel model = ReadModelFile(options.osModel);
+    RequireRigorousForClosedForm(options.eForm, model);
     PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
     ApplyHeights(gcps, options.sPoints, ModelUsesHeight(model.nModelCode), "the model");
@@ -151,7 +154,7 @@ void RunResiduals(const ResidualsOptions& options, CommandContext& context) {
     std::vector<Residual> residuals;
     Summary summary;
     for (std::size_t i = 0; i < gcps.asPoints.size(); ++i) {
-        residuals.push_back(ResidualOf(model, ground[i], gcps.asPoints[i]));
+        residuals.push_back(ResidualOf(model, options.eForm, ground[i], gcps.asPoints[i]));
         summary.Add(residuals.back());
     }
     std::ostringstream text;
@@ -182,6 +185,7 @@ void AddResidualsCommand(CLI::App& app, CommandContext& context) {
     command->add_option("-o,--output", options->osOutput,
                         "output CSV file (standard output when not given)");
     AddPointFileOptions(*command, options->sPoints);
+    AddRigorousFormFlags(*command, options->eForm);
     command->callback([options, &context] { RunResiduals(*options, context); });
 }
 

@@ -69,10 +69,4 @@ void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std:
                 << ", line " << Number(dfRmsLine) << "\nwrote " << outputPath << "\n";
 }
 
-bool SritExactToImage(const LoadedModel& model, double dfX, double dfY, double dfZ,
-                      double* pdfPixel, double* pdfLine) {
-    const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
-    return SRITGeo2ImgExact(psModel, dfX, dfY, dfZ, pdfPixel, pdfLine) == 1;
-}
-
 }  // namespace lumo::cli

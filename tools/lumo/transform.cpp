@@ -12,13 +12,10 @@ namespace {
 
 // Maps the ground position (x, y) of the model's system and the point's
 // height to the image.
-void MapToImage(const LoadedModel& model, bool bExact, double x, double y, PointRecord& p) {
+void MapToImage(const LoadedModel& model, RigorousForm form, double x, double y, PointRecord& p) {
     double pixel = 0.0;
     double line = 0.0;
-    const bool bMapped = bExact ? SritExactToImage(model, x, y, p.dfZ, &pixel, &line)
-                                : GenGeo2Img(model.nModelCode, model.poRecord.get(), x, y, p.dfZ,
-                                             &pixel, &line) != 0;
-    if (!bMapped || !IsPosition(pixel, line)) {
+    if (!GroundToImage(model, x, y, p.dfZ, &pixel, &line, form) || !IsPosition(pixel, line)) {
         p.Fail(kFailedToImage, "the model gives no image position for this ground point");
         return;
     }
@@ -57,7 +54,7 @@ void TransformAll(const LoadedModel& model, const TransformOptions& options, Dir
             GroundInModelSystem(points, declared, modelGeoref, kFailedToImage, context.err);
         for (std::size_t i = 0; i < ground.size(); ++i) {
             PointRecord& p = points.asPoints[i];
-            if (!p.Failed()) MapToImage(model, options.bExact, ground[i].x, ground[i].y, p);
+            if (!p.Failed()) MapToImage(model, options.eForm, ground[i].x, ground[i].y, p);
             progress.Update(++done);
         }
         DeclareGeoref(points, declared.Known() ? declared : modelGeoref);
@@ -97,9 +94,26 @@ std::vector<PointColumn> ComputedColumns(Direction direction) {
     return {PointColumn::X, PointColumn::Y};
 }
 
-void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p) {
+bool SritToImage(const SRITInfo_t& model, double x, double y, double z, double* pixel, double* line,
+                 RigorousForm form) {
+    if (form == RigorousForm::Exact) return SRITGeo2ImgExact(&model, x, y, z, pixel, line) == 1;
+    SRITGeo2Img(&model, x, y, z, pixel, line);
+    return IsPosition(*pixel, *line);
+}
+
+bool GroundToImage(const LoadedModel& model, double x, double y, double z, double* pixel,
+                   double* line, RigorousForm form) {
+    if (model.nModelCode == LUMO_CODE_SRIT) {
+        return SritToImage(*static_cast<const SRITInfo_t*>(model.poRecord.get()), x, y, z, pixel,
+                           line, form);
+    }
+    return GenGeo2Img(model.nModelCode, model.poRecord.get(), x, y, z, pixel, line) != 0;
+}
+
+void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p,
+                    RigorousForm form) {
     if (direction == Direction::ToImage) {
-        MapToImage(model, false, p.dfX, p.dfY, p);
+        MapToImage(model, form, p.dfX, p.dfY, p);
     } else {
         MapToGround(model, p);
     }
@@ -121,8 +135,9 @@ void RunTransform(const TransformOptions& options, const LoadedModel& model,
     } else {
         WriteFileReplacing(options.osOutput, text.str());
     }
-    ReportFailedPoints(points, options.bExact ? "transform --exact" : "transform",
-                       options.sPoints.bKeepGoing, context);
+    ReportFailedPoints(
+        points, options.eForm == RigorousForm::ClosedForm ? "transform --closed-form" : "transform",
+        options.sPoints.bKeepGoing, context);
 }
 
 }  // namespace lumo::cli

@@ -15,6 +15,19 @@ struct TransformOptions;
 
 enum class Direction { ToImage, ToGround };
 
+// How a rigorous model maps ground to image: as the exact inverse of its
+// image-to-ground equations (the default: round trips close), or by its
+// closed form (SRITGeo2Img, which off nadir misses the equations by tenths
+// of a pixel). Other families have one form.
+enum class RigorousForm { Exact, ClosedForm };
+
+// Ground (x, y in the model's system, z) to image; false when the model
+// gives no image position.
+bool GroundToImage(const LoadedModel& model, double x, double y, double z, double* pixel,
+                   double* line, RigorousForm form = RigorousForm::Exact);
+bool SritToImage(const SRITInfo_t& model, double x, double y, double z, double* pixel, double* line,
+                 RigorousForm form = RigorousForm::Exact);
+
 // Kind of point file a direction reads.
 PointKind InputKind(Direction direction);
 
@@ -28,7 +41,8 @@ std::vector<PointColumn> ComputedColumns(Direction direction);
 // to image fills pixel and line, image to ground (at the point's height)
 // fills x and y. A point the model cannot map, or maps to no real position,
 // is failed instead.
-void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p);
+void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p,
+                    RigorousForm form = RigorousForm::Exact);
 
 // Reads the point file of `options`, transforms it and writes the result to
 // the output file (replaced only once complete), or to standard output.

@@ -1,5 +1,6 @@
 // `lumo transform MODEL --to-image|--to-ground POINTS [-o OUT]` for any model
 // family the model-file reader knows.
+#include <cstdint>
 #include <memory>
 
 #include <CLI/CLI.hpp>
@@ -22,6 +23,24 @@ void AddTransformArguments(CLI::App& command, TransformOptions& options) {
     AddPointFileOptions(command, options.sPoints);
 }
 
+void AddRigorousFormFlags(CLI::App& command, RigorousForm& form) {
+    auto* closed = command.add_flag_function(
+        "--closed-form", [&form](std::int64_t) { form = RigorousForm::ClosedForm; },
+        "rigorous models, --to-image: the closed-form equations instead of the exact inverse of "
+        "the image-to-ground equations (off nadir they differ by tenths of a pixel)");
+    // The exact inverse was an option before it became the default.
+    command.add_flag("--exact", "rigorous models: the exact inverse (the default)")
+        ->excludes(closed);
+}
+
+void RequireRigorousForClosedForm(RigorousForm form, const LoadedModel& model) {
+    if (form == RigorousForm::ClosedForm && model.nModelCode != LUMO_CODE_SRIT) {
+        LUMO_CLI_FAIL(model.sEnvelope.osSource +
+                      ": --closed-form needs a rigorous (srit) model, found " +
+                      Quoted(model.sEnvelope.osFamily));
+    }
+}
+
 void RunTransformOptions(const TransformOptions& options, const LoadedModel& model,
                          CommandContext& context) {
     RunTransform(options, model, context);
@@ -40,18 +59,14 @@ void AddTransformCommand(CLI::App& app, CommandContext& context) {
     CLI::App* command =
         app.add_subcommand("transform", "Map points through a model file of any known family");
     AddTransformArguments(*command, *options);
-    command->add_flag("--exact", options->bExact,
-                      "rigorous models, --to-image: invert the image-to-ground equations exactly");
+    AddRigorousFormFlags(*command, options->eForm);
     command->callback([options, &context] {
         RequireDirection(*options);
-        if (options->bExact && options->osToImage.empty()) {
-            throw CLI::ValidationError("--exact applies to --to-image only");
+        if (options->eForm == RigorousForm::ClosedForm && options->osToImage.empty()) {
+            throw CLI::ValidationError("--closed-form applies to --to-image only");
         }
         const LoadedModel model = ReadModelFile(options->osModel);
-        if (options->bExact && model.nModelCode != LUMO_CODE_SRIT) {
-            LUMO_CLI_FAIL(options->osModel + ": --exact needs a rigorous (srit) model, found " +
-                          Quoted(model.sEnvelope.osFamily));
-        }
+        RequireRigorousForClosedForm(options->eForm, model);
         RunTransformOptions(*options, model, context);
     });
 }
