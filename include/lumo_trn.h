@@ -9,9 +9,7 @@
 enum TRNType {
     TRN_POLY = -2,  // host polynomial regression (GEOInfo_t)
     TRN_TPS = -3,   // thin plate spline (TPSInfo_t)
-    // The radar kind joins when its family is built; until then TRNAllocate
-    // treats it as any unknown kind (warning 11, no model).
-    TRN_RTCS = -4,
+    TRN_RTCS = -4,  // radar model (RTCSInfo_t)
     TRN_SRIT = -5,  // satellite rigorous model (SRITInfo_t)
 };
 
@@ -45,7 +43,11 @@ LUMO_API void TRNDeallocate(TRNInfo_t* psTrn);
 // kind's extra argument: for TRN_POLY the regression's integer option array
 // (options[0] = order; null for order 1); unused for TRN_TPS; a
 // TRNSritExtra_t for TRN_SRIT, whose first set is ground X, Y, Z and second
-// set image pixel and line (z2 unused).
+// set image pixel and line (z2 unused); for TRN_RTCS the image description,
+// an RTCSCOpt_t from the host allocator with its line arrays (ground
+// projection, line positions, raster size, reference height) that the
+// container adopts and releases - on a failed fit too - so the caller never
+// releases it; first set ground X, Y, Z in its projection, second set image.
 LUMO_API void TRNCalculate(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* x2, double* y2,
                            void* pExtra);
 LUMO_API void TRNCalculate3D(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* z1,

@@ -78,7 +78,7 @@ TEST(TrnContainer, BeforeAFitEverythingGivesZeros) {
 
 TEST(TrnContainer, UnknownKindsWarnOnceAndAreNoOps) {
     Points p = Quadratic(10, 1);
-    for (int kind : {0, 7, -1, static_cast<int>(TRN_RTCS)}) {
+    for (int kind : {0, 7, -1, -6}) {
         WarningRecorder warnings;
         TrnPtr trn(TRNAllocate(kind));
         ASSERT_EQ(warnings.aoReports.size(), 1u);

@@ -20,15 +20,16 @@ constexpr int kUnknowns = 2 * kRpcTerms - 1;  // numerator, denominator without 
 constexpr int kMaxPasses = 10;
 // Relative change of the residual below which reweighting stops.
 constexpr double kPassTolerance = 1e-4;
-// Ridge added to the equilibrated normal matrix (whose diagonal is 1). It
-// only moves directions the points leave undetermined (height terms of a
-// plane of points, a denominator that mimics the numerator) and keeps the
-// denominators close to 1 there. Chosen on simulated radar scenes: 1e-12
-// let denominators wander to zero, 1e-8 and above cost up to a hundredth of
-// a pixel.
-constexpr double kRidge = 1e-10;
+// Ridges added, one after the other until a fit succeeds, to the
+// equilibrated normal matrix (whose diagonal is 1). A ridge only moves
+// directions the points leave undetermined (height terms of a plane of
+// points, a denominator that mimics the numerator) and keeps the
+// denominators close to 1 there. On simulated radar scenes 1e-10 costs
+// nothing measurable but now and then lets a denominator wander towards
+// zero; the larger ones then tame it at a cost of hundredths of a pixel.
+constexpr double kRidges[] = {1e-10, 1e-8, 1e-6, 1e-4};
 // Denominators must stay clear of zero over the fitted points.
-constexpr double kSmallestFittedDenominator = 1e-2;
+constexpr double kSmallestFittedDenominator = 0.1;
 
 // Offset and scale that map the values onto [-1, 1]; a constant value gets
 // scale 1.
@@ -47,7 +48,7 @@ struct RatioFit {
 };
 
 // Fits r = num / den over the points whose terms are the rows of t.
-bool FitRatio(const Eigen::MatrixXd& t, const Eigen::VectorXd& r, RatioFit& fit) {
+bool FitRatio(const Eigen::MatrixXd& t, const Eigen::VectorXd& r, double dfRidge, RatioFit& fit) {
     const Eigen::Index n = t.rows();
     Eigen::VectorXd den = Eigen::VectorXd::Ones(n);
     Eigen::MatrixXd a(n, kUnknowns);
@@ -71,7 +72,7 @@ bool FitRatio(const Eigen::MatrixXd& t, const Eigen::VectorXd& r, RatioFit& fit)
         }
         const Eigen::VectorXd sInv = s.cwiseInverse();
         Eigen::MatrixXd me = sInv.asDiagonal() * m * sInv.asDiagonal();
-        me.diagonal().array() += kRidge;
+        me.diagonal().array() += dfRidge;
         const Eigen::VectorXd y = me.ldlt().solve(sInv.cwiseProduct(g));
         x = sInv.cwiseProduct(y);
         if (!x.allFinite()) return false;
@@ -148,7 +149,13 @@ int RpcCoefCalculator::CalcCoef(const std::vector<double>& adfLat,
         rLine[i] = (adfLine[k] - c.dfLineOffset) / c.dfLineScale;
     }
     RatioFit sPixel, sLine;
-    if (!FitRatio(t, rPixel, sPixel) || !FitRatio(t, rLine, sLine)) {
+    const auto fitWithRidges = [&](const Eigen::VectorXd& r, RatioFit& fit) {
+        for (double dfRidge : kRidges) {
+            if (FitRatio(t, r, dfRidge, fit)) return true;
+        }
+        return false;
+    };
+    if (!fitWithRidges(rPixel, sPixel) || !fitWithRidges(rLine, sLine)) {
         mosError = "the fitted denominators come close to zero over the points";
         return -1;
     }

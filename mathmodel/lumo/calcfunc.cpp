@@ -3,6 +3,7 @@
 #include "lumo_dispatch.h"
 #include "lumo_poly.h"
 #include "lumo_rf.h"
+#include "lumo_rtcs.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
 #include "mathmodel_core.h"
@@ -56,6 +57,9 @@ int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
         case LUMO_CODE_RF:
             RFGeo2Img(static_cast<RFInfo_t*>(pModel), dfX, dfY, dfZ, pdfPixel, pdfLine);
             return 1;
+        case LUMO_CODE_RTCS:
+            return RTCSGeo2Img(static_cast<const RTCSInfo_t*>(pModel), dfX, dfY, dfZ, pdfPixel,
+                               pdfLine);
         default:
             break;
     }
@@ -94,6 +98,11 @@ int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, d
             *pdfX = LUMO_NULL_VALUE;
             *pdfY = LUMO_NULL_VALUE;
             return RFImg2Geo(static_cast<RFInfo_t*>(pModel), dfPixel, dfLine, pdfX, pdfY, pdfZ) != 0
+                       ? 1
+                       : 0;
+        case LUMO_CODE_RTCS:
+            return RTCSImg2GeoDem(static_cast<const RTCSInfo_t*>(pModel), dfPixel, dfLine, pdfZ,
+                                  pdfX, pdfY) != 0
                        ? 1
                        : 0;
         default:

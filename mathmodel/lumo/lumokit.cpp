@@ -15,6 +15,7 @@
 #include "crs.h"
 #include "errors.h"
 #include "lumo_poly.h"
+#include "lumo_rtcs.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
 #include "projection.h"
@@ -100,6 +101,9 @@ void ReleaseTps(void* p) {
 void ReleaseSrit(void* p) {
     LumoFreeSRITInfo(static_cast<SRITInfo_t*>(p));
 }
+void ReleaseRtcs(void* p) {
+    RTCSFreeModel(static_cast<RTCSInfo_t*>(p));
+}
 
 RecordRelease ReleaseFor(LumoModelType eType) {
     switch (eType) {
@@ -109,8 +113,10 @@ RecordRelease ReleaseFor(LumoModelType eType) {
             return &ReleaseTps;
         case LUMO_MODEL_SRIT:
             return &ReleaseSrit;
-        // The rigorous, radar and orbit records are released here when
-        // those families join the object.
+        case LUMO_MODEL_RTCS:
+            return &ReleaseRtcs;
+        // The orbit record is released here when that family joins the
+        // object.
         default:
             return nullptr;
     }
@@ -148,6 +154,26 @@ void* CopySritRecord(const void* pSource) {
     owner.pData = SRITAllocate();
     SRITCopy(static_cast<SRITInfo_t*>(owner.pData), static_cast<const SRITInfo_t*>(pSource));
     return owner.Release();
+}
+
+void* CopyRtcsRecord(const void* pSource) {
+    RecordOwner owner;
+    owner.pfnRelease = &ReleaseRtcs;
+    owner.pData = RTCSAllocate();
+    if (owner.pData == nullptr) throw OutOfMemoryException(sizeof(RTCSInfo_t));
+    RTCSCopy(static_cast<RTCSInfo_t*>(owner.pData), static_cast<const RTCSInfo_t*>(pSource));
+    return owner.Release();
+}
+
+// The radar record's ground projection as a CRS; null when it has none or
+// the factory cannot make one (its exceptions count as no CRS).
+ogc::cs::ICRS* RadarCRS(const ogc::IProjInfoFactory* poFactory, const RTCSInfo_t& sModel) {
+    if (poFactory == nullptr || sModel.psCOpt == nullptr) return nullptr;
+    try {
+        return poFactory->CreateCRS(sModel.psCOpt->sProj);
+    } catch (...) {
+        return nullptr;
+    }
 }
 
 void* CopyTpsRecord(const void* pSource) {
@@ -324,16 +350,28 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
             eType = LUMO_MODEL_TPS;
             break;
         }
-        // The rigorous (2), orbit (3) and radar (7) records join here when
-        // their families are built; until then they are unknown models.
+        case 7: {
+            oRecord.pfnRelease = &ReleaseRtcs;
+            oRecord.pData = CopyRtcsRecord(pData);
+            const auto* psRtcs = static_cast<const RTCSInfo_t*>(oRecord.pData);
+            mnDownsampleFactor = psRtcs->nDownsample;
+            eVertical = psRtcs->osHeightRef == "M" ? ogc::cs::CS_VD_Orthometric
+                                                   : ogc::cs::CS_VD_Ellipsoidal;
+            eType = LUMO_MODEL_RTCS;
+            break;
+        }
+        // The orbit record (3) joins here when its family is built; until
+        // then it is an unknown model.
         default:
             ThrowParameter("eType", kUnknownModel, kFnInitModel, 466);
     }
 
     // Geographic and projected descriptions have a CRS; unit-only ones
     // ("METRE", "PIXEL") do not.
-    ogc::CRSPtr poHorizontal(poFactory != nullptr ? poFactory->CreateCRS(bRigorous ? sP : sQ)
-                                                  : nullptr);
+    ogc::CRSPtr poHorizontal(
+        eType == LUMO_MODEL_RTCS
+            ? RadarCRS(poFactory, *static_cast<const RTCSInfo_t*>(oRecord.pData))
+            : (poFactory != nullptr ? poFactory->CreateCRS(bRigorous ? sP : sQ) : nullptr));
     if (!poHorizontal && bRigorous) {
         ThrowParameter("pData", "Could not read the coordinate system for the math model",
                        kFnInitModel, 373);
@@ -371,6 +409,10 @@ void LumoMathModel::CopyFrom(const LumoMathModel& oOther) {
         case LUMO_MODEL_SRIT:
             oRecord.pfnRelease = &ReleaseSrit;
             oRecord.pData = CopySritRecord(oOther.mpData);
+            break;
+        case LUMO_MODEL_RTCS:
+            oRecord.pfnRelease = &ReleaseRtcs;
+            oRecord.pData = CopyRtcsRecord(oOther.mpData);
             break;
         // The rigorous, radar and orbit types are copied here when their
         // families join the object.
@@ -425,6 +467,13 @@ int LumoMathModel::GetNumColumns() const {
             }
             return psSrit->psEphemeris->nNumPixels;
         }
+        case LUMO_MODEL_RTCS: {
+            const auto* psRtcs = static_cast<const RTCSInfo_t*>(mpData);
+            if (psRtcs == nullptr || psRtcs->psCOpt == nullptr) {
+                throw DataException("Invalid RTCSInfo_t object", kFile, kFnGetNumColumns, 549);
+            }
+            return psRtcs->psCOpt->sLines.nPixels;
+        }
         // The rigorous and radar sizes (lines 528 and 549) join with their
         // families; the orbit model cannot report its size.
         default:
@@ -444,6 +493,13 @@ int LumoMathModel::GetNumRows() const {
                 throw DataException("Invalid SRITInfo_t object", kFile, kFnGetNumRows, 582);
             }
             return psSrit->psEphemeris->nNumLines;
+        }
+        case LUMO_MODEL_RTCS: {
+            const auto* psRtcs = static_cast<const RTCSInfo_t*>(mpData);
+            if (psRtcs == nullptr || psRtcs->psCOpt == nullptr) {
+                throw DataException("Invalid RTCSInfo_t object", kFile, kFnGetNumRows, 603);
+            }
+            return psRtcs->psCOpt->sLines.nLines;
         }
         default:
             ThrowParameter("eType", kUnknownModel, kFnGetNumRows, 614);
@@ -586,7 +642,9 @@ void LumoMathModel::SetDownsampleFactor(int nFactor) {
         case LUMO_MODEL_SRIT:
             if (mpData != nullptr) static_cast<SRITInfo_t*>(mpData)->anAux[0] = nFactor;
             return;
-        // The radar record takes the factor when its family joins the object.
+        case LUMO_MODEL_RTCS:
+            if (mpData != nullptr) static_cast<RTCSInfo_t*>(mpData)->nDownsample = nFactor;
+            return;
         default:
             ThrowParameter("eType", kUnknownModel, kFnSetDownsampleFactor, 1289);
     }

@@ -8,10 +8,12 @@
 
 #include "errors.h"
 #include "lumo_ephemeris.h"
+#include "lumo_rtcs.h"
 #include "lumo_srit.h"
 #include "lumo_tps.h"
 #include "lumo_trn.h"
 #include "regression.h"
+#include "rtcs/rtcs_internal.h"
 #include "runtime.h"
 
 namespace {
@@ -22,7 +24,35 @@ namespace {
 constexpr int kRegressionWorkSize = 1024;
 
 bool IsKnownKind(int nType) {
-    return nType == TRN_POLY || nType == TRN_TPS || nType == TRN_SRIT;
+    return nType == TRN_POLY || nType == TRN_TPS || nType == TRN_RTCS || nType == TRN_SRIT;
+}
+
+RTCSInfo_t* AsRadar(const TRNInfo_t* psTrn) {
+    return static_cast<RTCSInfo_t*>(psTrn->pModel);
+}
+
+// A radar fit: the record adopts the option block passed as pExtra (the
+// caller does not release it) and stays as it was when the fit fails.
+void CalculateRadar(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* z1, double* x2,
+                    double* y2, void* pExtra) {
+    lumo::rtcs::FitFromImageDescription(AsRadar(psTrn), static_cast<RTCSCOpt_t*>(pExtra), n, x1, y1,
+                                        z1, x2, y2);
+    psTrn->bCalculated = 1;
+}
+
+// Ground coordinates of the container's points through the radar model,
+// whose ground side is geographic.
+int TransformRadar(const TRNInfo_t* psTrn, double dfX, double dfY, double dfZ, double* pdfOutX,
+                   double* pdfOutY) {
+    const RTCSInfo_t* psModel = AsRadar(psTrn);
+    double dfLon = 0.0, dfLat = 0.0;
+    if (psModel->psCOpt == nullptr ||
+        !lumo::rtcs::ToGeographic(psModel->psCOpt->sProj, dfX, dfY, &dfLon, &dfLat)) {
+        return 0;
+    }
+    const int nResult = RTCSGeo2Img(psModel, dfLon, dfLat, dfZ, pdfOutX, pdfOutY);
+    if (nResult == 0) *pdfOutX = *pdfOutY = 0.0;
+    return nResult;
 }
 
 SRITInfo_t* AsRigorous(const TRNInfo_t* psTrn) {
@@ -105,6 +135,10 @@ TRNInfo_t* TRNAllocate(int nType) {
         case TRN_TPS:
             psTrn->pModel = new TPSInfo_t(0);
             break;
+        case TRN_RTCS:
+            psTrn->pModel = RTCSAllocate();
+            if (psTrn->pModel == nullptr) throw nova::OutOfMemoryException(sizeof(RTCSInfo_t));
+            break;
         case TRN_SRIT:
             // A zeroed record with its own projection and an empty segment;
             // its per-line arrays are sized by each fit from the segment's
@@ -127,6 +161,8 @@ void TRNDeallocate(TRNInfo_t* psTrn) {
         delete AsSpline(psTrn);
     else if (psTrn->nType == TRN_SRIT)
         LumoFreeSRITInfo(AsRigorous(psTrn));
+    else if (psTrn->nType == TRN_RTCS)
+        RTCSFreeModel(AsRadar(psTrn));
     std::free(psTrn);
 }
 
@@ -150,6 +186,9 @@ void TRNCalculate3D(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* z1,
         case TRN_SRIT:
             CalculateRigorous(psTrn, n, x1, y1, z1, x2, y2, pExtra);
             break;
+        case TRN_RTCS:
+            CalculateRadar(psTrn, n, x1, y1, z1, x2, y2, pExtra);
+            break;
         default:
             psTrn->bCalculated = 0;
             break;
@@ -172,6 +211,7 @@ int TRNTransform3D(TRNInfo_t* psTrn, double dfX, double dfY, double dfZ, double*
         SRITGeo2Img(AsRigorous(psTrn), dfX, dfY, dfZ, pdfOutX, pdfOutY);
         return 1;
     }
+    if (psTrn->nType == TRN_RTCS) return TransformRadar(psTrn, dfX, dfY, dfZ, pdfOutX, pdfOutY);
     TPSTransform(AsSpline(psTrn), dfX, dfY, pdfOutX, pdfOutY);
     return 1;
 }
@@ -194,6 +234,10 @@ void TRNRMSError(TRNInfo_t* psTrn, int n, double* x1, double* y1, double* x2, do
     if (psTrn->nType == TRN_SRIT) {
         // The rigorous residuals need elevations: TRNRMSError3D gives them.
         DebugNotImplemented("TRN_SRIT", __LINE__);
+        return;
+    }
+    if (psTrn->nType == TRN_RTCS) {
+        DebugNotImplemented("TRN_RTCS", __LINE__);
         return;
     }
     double dfMeanX = 0.0;

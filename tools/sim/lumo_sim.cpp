@@ -11,67 +11,9 @@
 
 #include "lumo_ephemeris.h"
 #include "runtime.h"
+#include "sim_math.h"
 
 namespace lumo::sim {
-
-namespace {
-
-constexpr double kPi = 3.14159265358979323846;
-constexpr double kDeg = kPi / 180.0;
-constexpr double kSemiMajor = 6378137.0;  // WGS 84
-constexpr double kFlattening = 1.0 / 298.257223563;
-constexpr double kEcc2 = kFlattening * (2.0 - kFlattening);
-constexpr double kGM = 3.986004418e14;         // m^3/s^2
-constexpr double kEarthRate = 7.292115841e-5;  // rad/s
-
-Ecef Add(const Ecef& a, const Ecef& b) {
-    return {a.x + b.x, a.y + b.y, a.z + b.z};
-}
-Ecef Sub(const Ecef& a, const Ecef& b) {
-    return {a.x - b.x, a.y - b.y, a.z - b.z};
-}
-Ecef Scale(const Ecef& a, double s) {
-    return {a.x * s, a.y * s, a.z * s};
-}
-double Dot(const Ecef& a, const Ecef& b) {
-    return a.x * b.x + a.y * b.y + a.z * b.z;
-}
-Ecef Cross(const Ecef& a, const Ecef& b) {
-    return {a.y * b.z - a.z * b.y, a.z * b.x - a.x * b.z, a.x * b.y - a.y * b.x};
-}
-Ecef Unit(const Ecef& a) {
-    return Scale(a, 1.0 / std::sqrt(Dot(a, a)));
-}
-double Distance(const Ecef& a, const Ecef& b) {
-    const Ecef d = Sub(a, b);
-    return std::sqrt(Dot(d, d));
-}
-
-// Inertial vector seen in the Earth-fixed frame after the Earth turned for
-// dfTime seconds (the frames coincide at the centre line).
-Ecef ToEarthFixed(const Ecef& a, double dfTime) {
-    const double th = kEarthRate * dfTime;
-    return {std::cos(th) * a.x + std::sin(th) * a.y, -std::sin(th) * a.x + std::cos(th) * a.y, a.z};
-}
-
-void Require(bool bOk, const char* pszName, double dfValue, const char* pszRule) {
-    if (bOk) return;
-    throw std::invalid_argument(std::string("scene parameter ") + pszName + " = " +
-                                std::to_string(dfValue) + ": " + pszRule);
-}
-
-// Uniform in [0, 1) from a 32-bit generator, the same on every platform.
-double Uniform(std::mt19937& sGen) {
-    return static_cast<double>(sGen()) / 4294967296.0;
-}
-
-double Gaussian(std::mt19937& sGen) {
-    const double u1 = 1.0 - Uniform(sGen);  // (0, 1]
-    const double u2 = Uniform(sGen);
-    return std::sqrt(-2.0 * std::log(u1)) * std::cos(2.0 * kPi * u2);
-}
-
-}  // namespace
 
 Ecef GeodeticToEcef(double dfLat, double dfLon, double dfHeight) {
     const double s = std::sin(dfLat);
@@ -301,32 +243,14 @@ void Scene::CentreGeodetic(double* pdfLat, double* pdfLon) const {
 
 std::vector<SimPoint> Scene::SamplePoints(int nPoints, std::uint32_t nSeed, double dfMinHeight,
                                           double dfMaxHeight, double dfMargin) const {
-    Require(nPoints >= 0 && nPoints <= 10000000, "nPoints", nPoints, "must lie in [0, 1e7]");
-    Require(std::isfinite(dfMinHeight) && std::isfinite(dfMaxHeight) &&
-                dfMinHeight <= dfMaxHeight && dfMinHeight > -1000.0 && dfMaxHeight < 10000.0,
-            "dfMaxHeight", dfMaxHeight, "heights must be ordered and within [-1000, 10000]");
-    Require(dfMargin >= 0.0 && dfMargin < 0.5, "dfMargin", dfMargin, "must lie in [0, 0.5)");
-    std::mt19937 sGen(nSeed);
-    const int nCols = std::max(1, static_cast<int>(std::ceil(std::sqrt(nPoints))));
-    const int nRows = std::max(1, (nPoints + nCols - 1) / nCols);
-    const double dfWidth = m_sParams.nPixels * (1.0 - 2.0 * dfMargin);
-    const double dfHeightLines = m_sParams.nLines * (1.0 - 2.0 * dfMargin);
-    std::vector<SimPoint> asPoints;
-    asPoints.reserve(static_cast<std::size_t>(nPoints));
-    for (int k = 0; k < nPoints; ++k) {
-        // The last row may be short: spread its cells over the full width.
-        const int nRow = k / nCols;
-        const int nInRow = nRow == nRows - 1 ? nPoints - nRow * nCols : nCols;
-        const int nCol = k % nCols;
-        SimPoint s{};
-        s.dfPixel = m_sParams.nPixels * dfMargin + (nCol + Uniform(sGen)) * dfWidth / nInRow;
-        s.dfLine = m_sParams.nLines * dfMargin + (nRow + Uniform(sGen)) * dfHeightLines / nRows;
-        s.dfZ = dfMinHeight + (dfMaxHeight - dfMinHeight) * Uniform(sGen);
+    std::vector<SimPoint> asPoints = JitteredImagePoints(
+        nPoints, nSeed, m_sParams.nPixels, m_sParams.nLines, dfMinHeight, dfMaxHeight, dfMargin);
+    for (std::size_t k = 0; k < asPoints.size(); ++k) {
+        SimPoint& s = asPoints[k];
         if (!ImageToGround(s.dfPixel, s.dfLine, s.dfZ, &s.dfX, &s.dfY)) {
             throw std::runtime_error("simulated point " + std::to_string(k) +
                                      " cannot be mapped to the ground");
         }
-        asPoints.push_back(s);
     }
     return asPoints;
 }

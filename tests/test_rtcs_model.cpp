@@ -1,0 +1,253 @@
+// The radar model record, its generation from bad segments and points, the
+// transforms' failure values, the stereo height, and the model's place in
+// the dispatch, the transform container and the math model object.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "crs.h"
+#include "lumo.h"
+#include "radar_sim.h"
+#include "rpc.h"
+#include "runtime.h"
+#include "support/radar_scene.h"
+
+namespace {
+
+using lumo::support::AsControlPoints;
+using lumo::support::GeographicProjection;
+using lumo::support::RadarFixture;
+using lumo::support::RadarModelPtr;
+using lumo::support::RadarSegmentPtr;
+
+lumo::sim::RadarSceneParams SmallScene(bool bIncreasing = true) {
+    lumo::sim::RadarSceneParams p;
+    p.nPixels = 800;
+    p.nLines = 600;
+    p.bRangeIncreasing = bIncreasing;
+    return p;
+}
+
+const RadarFixture& Fixture() {
+    static const RadarFixture f(SmallScene(), 12, 0.0, 1500.0);
+    return f;
+}
+
+RadarSegmentPtr CopySegment() {
+    return RadarSegmentPtr(EphemerisSegDuplicate(&Fixture().Segment()));
+}
+
+RadarLine_t* Lines(EphemerisSeg_t* psSeg) {
+    return static_cast<RadarData_t*>(*psSeg->ppOrbitData)->pLinePositions;
+}
+
+std::vector<ControlPoint_t> Gcps() {
+    return AsControlPoints(Fixture().Gcps());
+}
+
+// Generation of a broken segment or point set fails with fatal error `code`
+// whose text names `what`.
+void ExpectRefused(const EphemerisSeg_t* psSeg, const std::vector<ControlPoint_t>& aoGcps,
+                   int nCode, const std::string& osWhat) {
+    try {
+        RadarModelPtr p(RTCSGenModel(psSeg, GeographicProjection(), "E", aoGcps));
+        ADD_FAILURE() << "accepted; expected " << osWhat;
+    } catch (const nova::NumberedError& e) {
+        EXPECT_EQ(e.GetCode(), nCode);
+        EXPECT_NE(std::string(e.what()).find(osWhat), std::string::npos) << e.what();
+    }
+}
+
+TEST(RtcsModel, BadSegmentsAndPointsAreRefusedByName) {
+    RadarSegmentPtr s = CopySegment();
+    s->nNumPixels = 0;
+    ExpectRefused(s.get(), Gcps(), 11, "nNumPixels 0");
+    s = CopySegment();
+    s->nNumLines += 1;  // one line more than the table holds
+    ExpectRefused(s.get(), Gcps(), 11, "holds 600 lines for nNumLines 601");
+    s = CopySegment();
+    Lines(s.get())[17].fLatMid = std::nanf("");
+    ExpectRefused(s.get(), Gcps(), 11, "pLinePositions[17]");
+    s = CopySegment();
+    Lines(s.get())[3].nRangeLast = -5;
+    ExpectRefused(s.get(), Gcps(), 11, "pLinePositions[3]");
+    s = CopySegment();
+    s->nOrbitType = EPH_ORBIT_NONE;
+    ExpectRefused(s.get(), Gcps(), 11, "no radar line table");
+    std::vector<ControlPoint_t> g = Gcps();
+    g[4].dfImageX = -1.0;
+    ExpectRefused(&Fixture().Segment(), g, 189, "X_img");
+    g = Gcps();
+    g[2].dfGroundY = std::nan("");
+    EXPECT_THROW(RadarModelPtr(RTCSGenModel(&Fixture().Segment(), GeographicProjection(), "E", g)),
+                 nova::Exception);
+}
+
+TEST(RtcsModel, GenerationEdgeCases) {
+    RadarSegmentPtr s = CopySegment();
+    s->nBytesPerPixel = 5;
+    testing::internal::CaptureStdout();
+    RadarModelPtr m(RTCSGenModel(s.get(), GeographicProjection(), "e", {}));
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), "Number of Bytes Per Pixel is Invalid \n");
+    EXPECT_EQ(m->osHeightRef, "E");
+    EXPECT_EQ(m->dfMinGcpHeight, 1e38);  // no control points
+    EXPECT_EQ(m->dfMaxGcpHeight, -1e38);
+    EXPECT_EQ(m->nRangeDirection, 1);
+    // Without control points the segment's positions carry the model.
+    const lumo::sim::SimPoint c = Fixture().Scene().SamplePoints(1, 3, 750.0, 750.0, 0.2)[0];
+    double p = 0, l = 0;
+    ASSERT_EQ(RTCSGeo2Img(m.get(), c.dfX, c.dfY, c.dfZ, &p, &l), 1);
+    EXPECT_LT(std::hypot(p - c.dfPixel, l - c.dfLine), 1.0);
+
+    lumo::sim::RadarScene reversed(SmallScene(false));
+    RadarSegmentPtr r(reversed.MakeSegment());
+    RadarModelPtr mr(RTCSGenModel(r.get(), GeographicProjection(), "", {}));
+    EXPECT_EQ(mr->nRangeDirection, -1);
+    EXPECT_EQ(mr->osHeightRef, "M");
+}
+
+TEST(RtcsModel, CopiesAreDeepAndTransformsReportFailure) {
+    RadarModelPtr empty(RTCSAllocate());
+    double p = 7, l = 7, x = 7, y = 7;
+    EXPECT_EQ(RTCSGeo2Img(empty.get(), 10.0, 45.0, 0.0, &p, &l), 0);  // not generated
+    EXPECT_EQ(p, LUMO_NULL_VALUE);
+    RadarModelPtr copy(RTCSAllocate());
+    RTCSCopy(copy.get(), &Fixture().Model());
+    RTCSCopy(copy.get(), copy.get());  // no change
+    copy->osHeightRef = "e";
+    RadarModelPtr again(RTCSAllocate());
+    RTCSCopy(again.get(), copy.get());
+    copy.reset();
+    EXPECT_EQ(again->osHeightRef, "E");
+    const lumo::sim::SimPoint& g = Fixture().Gcps()[3];
+    double p0 = 0, l0 = 0, p1 = 0, l1 = 0;
+    RTCSGeo2Img(&Fixture().Model(), g.dfX, g.dfY, 0.0, &p0, &l0);
+    ASSERT_EQ(RTCSGeo2Img(again.get(), g.dfX, g.dfY, LUMO_NULL_VALUE, &p1, &l1), 1);
+    EXPECT_EQ(p0, p1);  // -1e20 is height 0, and the copy answers alike
+    EXPECT_EQ(RTCSImg2Geo(again.get(), 100.0, 100.0, LUMO_NULL_VALUE, &x, &y), 0);
+    EXPECT_EQ(x, LUMO_NULL_VALUE);
+    double z = LUMO_NULL_VALUE;
+    EXPECT_EQ(RTCSImg2GeoDem(again.get(), 100.0, 100.0, &z, &x, &y), 1);
+    EXPECT_EQ(z, 0.0);
+    EXPECT_EQ(RTCSGeo2Img(again.get(), std::nan(""), 45.0, 0.0, &p, &l), 0);
+    // The quarter-line intersection: line coordinate nLines and a failed
+    // quarter line give no point.
+    EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 600.0, 0.0, &x, &y), 0);
+    EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 5.0, 750.0, &x, &y), 1);
+    again->padfQStepCoefs[3 * 20] = RTCS_FAILED_QUARTER;
+    EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 5.0, 750.0, &x, &y), 0);
+}
+
+TEST(RtcsModel, ParallaxReductionMovesHighPointsAwayFromNearRange) {
+    const RTCSInfo_t& m = Fixture().Model();
+    double shift = 1.0;
+    RTCSCalShiftParallax(0, 1, m.padfPixelSpacing[0], m.padfIncidenceCoefs, m.padfRangeCoefs, 0.0,
+                         300.0, shift);
+    EXPECT_NEAR(shift, 0.0, 1e-9);
+    int nLow = 0, nHigh = 0;
+    const double adfSat[3] = {7.1e6, 0.0, 0.0};
+    const double dfRadius = 6.37e6;
+    RTCSParallaxCal(8.5e5, 9.0e5, adfSat, &dfRadius, 12.5, 0.0, 0.0, &nLow, &nHigh);
+    EXPECT_EQ(nLow, 1);
+    EXPECT_EQ(nHigh, 1);
+    // The same point imaged at its pixel from three heights: reduced to the
+    // reference height it is one ground position, further from near range
+    // when higher.
+    const RTCSCOpt_t& o = *m.psCOpt;
+    std::vector<double> lat, lon, h, pix, line;
+    for (double dfHeight : {0.0, o.dfAvgHt, 1500.0}) {
+        double lo = 0, la = 0, p = 0, l = 0;
+        Fixture().Scene().ImageToGround(400.0, 300.0, o.dfAvgHt, &lo, &la);
+        Fixture().Scene().GroundToImage(lo, la, dfHeight, &p, &l);
+        lat.push_back(la), lon.push_back(lo), h.push_back(dfHeight), pix.push_back(p);
+        line.push_back(l);
+    }
+    EXPECT_LT(pix[2], pix[1]);  // layover towards near range
+    GEOInfo_t fwd{}, inv{};
+    RTCSGeoToImg(&o.sLines, 3, lat.data(), lon.data(), h.data(), pix.data(), line.data(),
+                 o.sLines.nPixels, o.sLines.nLines, 0.0, 1500.0, o.dfAvgHt, &fwd, &inv);
+    double p0 = 0, l0 = 0;
+    GCPTransform(&fwd, lon[1], lat[1], &p0, &l0);
+    EXPECT_NEAR(p0, 400.0, 0.5);  // all three reduce to the reference position
+}
+
+TEST(RtcsModel, StereoPairGivesTheHeight) {
+    lumo::sim::RadarSceneParams a = SmallScene(), b = SmallScene();
+    b.dfNearIncidenceDeg = 45.0;
+    b.bAscending = true;
+    b.bRightLooking = false;
+    const RadarFixture fa(a, 12, 0.0, 1500.0), fb(b, 12, 0.0, 1500.0);
+    for (double dfHeight : {120.0, 1300.0}) {
+        double lon = 0, lat = 0, p1 = 0, l1 = 0, p2 = 0, l2 = 0;
+        fa.Scene().ImageToGround(300.0, 250.0, dfHeight, &lon, &lat);
+        fa.Scene().GroundToImage(lon, lat, dfHeight, &p1, &l1);
+        ASSERT_TRUE(fb.Scene().GroundToImage(lon, lat, dfHeight, &p2, &l2));
+        double x = 0, y = 0, z = 0;
+        ASSERT_EQ(RTCSDetGeo(&fa.Model(), &fb.Model(), p1, l1, p2, l2, x, y, z), 1);
+        EXPECT_NEAR(z, dfHeight, 10.0);
+        EXPECT_NEAR((x - lon) * 78000.0, 0.0, 30.0);
+        EXPECT_NEAR((y - lat) * 111000.0, 0.0, 30.0);
+    }
+}
+
+// An option block with the line positions of the fixture's segment, as the
+// transform container takes it.
+RTCSCOpt_t* ImageDescription() {
+    RadarModelPtr m(RTCSAllocate());
+    RTCSCopy(m.get(), &Fixture().Model());
+    RTCSCOpt_t* psOpt = m->psCOpt;
+    m->psCOpt = nullptr;
+    return psOpt;
+}
+
+TEST(RtcsModel, ContainerDispatchAndModelObject) {
+    std::unique_ptr<TRNInfo_t, void (*)(TRNInfo_t*)> trn(TRNAllocate(TRN_RTCS), &TRNDeallocate);
+    const auto& g = Fixture().Gcps();
+    std::vector<double> x, y, z, p, l;
+    for (const auto& s : g)
+        x.push_back(s.dfX), y.push_back(s.dfY), z.push_back(s.dfZ), p.push_back(s.dfPixel),
+            l.push_back(s.dfLine);
+    std::vector<double> bad = p;
+    bad[0] = 1e9;
+    EXPECT_THROW(TRNCalculate3D(trn.get(), 12, x.data(), y.data(), z.data(), bad.data(), l.data(),
+                                nullptr, ImageDescription()),
+                 nova::NumberedError);  // the block is released all the same
+    EXPECT_EQ(trn->bCalculated, 0);
+    TRNCalculate3D(trn.get(), 12, x.data(), y.data(), z.data(), p.data(), l.data(), nullptr,
+                   ImageDescription());
+    ASSERT_EQ(trn->bCalculated, 1);
+    const lumo::sim::SimPoint c = Fixture().Scene().SamplePoints(1, 8, 900.0, 900.0, 0.2)[0];
+    double tp = 0, tl = 0, tz = 5, dp = 0, dl = 0;
+    ASSERT_EQ(TRNTransform3D(trn.get(), c.dfX, c.dfY, c.dfZ, &tp, &tl, &tz), 1);
+    EXPECT_EQ(tz, 0.0);
+    EXPECT_LT(std::hypot(tp - c.dfPixel, tl - c.dfLine), 1.0);
+    auto* psModel = const_cast<RTCSInfo_t*>(&Fixture().Model());
+    ASSERT_EQ(GenGeo2Img(LUMO_CODE_RTCS, psModel, c.dfX, c.dfY, c.dfZ, &dp, &dl), 1);
+    EXPECT_LT(std::hypot(dp - c.dfPixel, dl - c.dfLine), 1.0);
+    double rx = 5, ry = 5;
+    TRNRMSError(trn.get(), 12, x.data(), y.data(), p.data(), l.data(), &rx, &ry);
+    EXPECT_EQ(rx, 0.0);
+
+    for (const char* pszRef : {"M", "E"}) {
+        psModel->osHeightRef = pszRef;
+        nova::mathmodel::LumoMathModel o(nova::mathmodel::LUMO_MODEL_RTCS, psModel);
+        EXPECT_EQ(o.GetCRS()->GetVerticalDatumType(), std::string(pszRef) == "M"
+                                                          ? nova::ogc::cs::CS_VD_Orthometric
+                                                          : nova::ogc::cs::CS_VD_Ellipsoidal);
+        EXPECT_EQ(o.GetNumColumns(), 800);
+        EXPECT_EQ(o.GetNumRows(), 600);
+        o.SetDownsampleFactor(3);
+        std::unique_ptr<nova::mathmodel::IMathModel> clone(o.Clone());
+        EXPECT_EQ(clone->GetDownsampleFactor(), 3);
+        double op = 0, ol = 0;
+        ASSERT_EQ(clone->GroundToImage(c.dfX, c.dfY, c.dfZ, op, ol, false), 0);
+        EXPECT_EQ(op, dp);
+    }
+    psModel->osHeightRef = "E";
+}
+
+}  // namespace
