@@ -113,8 +113,11 @@ LUMO_API void RTCSPolyCoef(const double* padfX, const double* padfY, double* pad
 // Image coordinates: pixel 0.0 is the centre of the first pixel of a line
 // (the one whose slant range is the segment's nRangeFirst), line 0.0 the
 // first line of the segment's line table. Ground coordinates: longitude and
-// latitude in degrees (WGS 84) and the height in metres above the WGS 84
-// ellipsoid.
+// latitude in degrees (WGS 84) and the height in metres in the model's
+// height reference: above mean sea level (EGM96) for models whose control
+// points were ("M"), above the WGS 84 ellipsoid for "E" models. The
+// segment's average height, the model's reference surface, is taken as
+// ellipsoidal.
 // ---------------------------------------------------------------------------
 
 // Marks a quarter line whose geometry could not be solved (first step
@@ -128,6 +131,18 @@ struct RTCSCOpt_t {
     ProjInfo_t sProj;     // "LON" once generated
     LinePosition sLines;  // line positions and raster size
     double dfAvgHt;       // reference (average) height of the scene, metres
+};
+
+// Geoid undulation (height of mean sea level above the WGS 84 ellipsoid,
+// metres) on a regular longitude/latitude grid over a scene; empty when the
+// model takes ellipsoidal heights.
+struct RTCSGeoidGrid {
+    int nCols = 0;
+    int nRows = 0;
+    double dfLon0 = 0.0;  // node (0, 0), degrees
+    double dfLat0 = 0.0;
+    double dfStep = 0.0;                // degrees between nodes
+    std::vector<double> adfUndulation;  // row by row, nCols x nRows
 };
 
 // The radar model record. Tables hold psCOpt->sLines.nLines lines (lines
@@ -174,6 +189,10 @@ class RTCSInfo_t {
     double* padfQRadiusNear;     // [4 * lines]
     double* padfQRadiusMid;      // [4 * lines]
     double* padfQRadiusFar;      // [4 * lines]
+    // Added after the tables: the geoid of a model whose heights are above
+    // mean sea level ("M"), so that its transforms take heights in the
+    // reference its control points were given in.
+    RTCSGeoidGrid sGeoid;
 };
 
 // An empty model (null when it cannot be created); release with

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "crs.h"
+#include "dem.h"
 #include "lumo.h"
 #include "radar_sim.h"
 #include "rpc.h"
@@ -108,6 +109,29 @@ TEST(RtcsModel, GenerationEdgeCases) {
     RadarModelPtr mr(RTCSGenModel(r.get(), GeographicProjection(), "", {}));
     EXPECT_EQ(mr->nRangeDirection, -1);
     EXPECT_EQ(mr->osHeightRef, "M");
+}
+
+TEST(RtcsModel, MeanSeaLevelModelsTakeMeanSeaLevelHeights) {
+    // Control and check points with heights above mean sea level (EGM96).
+    nova::dem::DEMPtr geoid(nova::dem::DEMFactory::CreateGlobalDEM(true, 4));
+    ASSERT_TRUE(geoid);
+    const auto toMsl = [&](std::vector<lumo::sim::SimPoint> a) {
+        for (auto& s : a) {
+            double n = 0;
+            EXPECT_TRUE(geoid->GetHeight(s.dfX, s.dfY, n));
+            s.dfZ -= n;
+        }
+        return a;
+    };
+    RadarModelPtr m(RTCSGenModel(&Fixture().Segment(), GeographicProjection(), "M",
+                                 AsControlPoints(toMsl(Fixture().Gcps()))));
+    for (const auto& c : toMsl(Fixture().Scene().SamplePoints(20, 4, 0.0, 1500.0))) {
+        double p = 0, l = 0, x = 0, y = 0;
+        ASSERT_EQ(RTCSGeo2Img(m.get(), c.dfX, c.dfY, c.dfZ, &p, &l), 1);
+        EXPECT_LT(std::hypot(p - c.dfPixel, l - c.dfLine), 1.0);
+        ASSERT_EQ(RTCSImg2Geo(m.get(), c.dfPixel, c.dfLine, c.dfZ, &x, &y), 1);
+        EXPECT_LT(std::hypot((x - c.dfX) * 78000.0, (y - c.dfY) * 111000.0), 15.0);
+    }
 }
 
 TEST(RtcsModel, CopiesAreDeepAndTransformsReportFailure) {
@@ -248,6 +272,50 @@ TEST(RtcsModel, ContainerDispatchAndModelObject) {
         EXPECT_EQ(op, dp);
     }
     psModel->osHeightRef = "E";
+}
+
+}  // namespace
+
+namespace {
+
+TEST(RtcsModel, NominalControlPointsMoveAlongConstantRange) {
+    const lumo::sim::RadarScene& sc = Fixture().Scene();
+    const double h0 = Fixture().Model().psCOpt->dfAvgHt;
+    // Two rows of five nominal points across lines 100 and 400 at the
+    // reference height; the second point of the second row cannot move.
+    std::vector<double> lon, lat, h, a, b, c;
+    std::vector<int> ids;
+    for (double line : {100.0, 400.0}) {
+        for (int k = 0; k < 5; ++k) {
+            double x = 0, y = 0;
+            ASSERT_TRUE(sc.ImageToGround(k * 799.0 / 4, line, h0, &x, &y));
+            lon.push_back(x), lat.push_back(y), h.push_back(h0), a.push_back(k * 799.0 / 4);
+            b.push_back(line), c.push_back(0.0), ids.push_back(100 + static_cast<int>(ids.size()));
+        }
+    }
+    lat[6] = std::nan("");
+    const RadarLine_t first = Lines(CopySegment().get())[0];
+    int count = 1;
+    RTCSAddElevationsToNominalGCPs(1000.0, 1, 1, first.nRangeFirst, first.nRangeLast, 6378137.0,
+                                   6356752.314245179, &count, ids.data(), a.data(), b.data(),
+                                   c.data(), lon.data(), lat.data(), h.data());
+    EXPECT_EQ(count, 0);  // one column makes no row
+    count = 10;
+    RTCSAddElevationsToNominalGCPs(1000.0, 2, 5, first.nRangeFirst, first.nRangeLast, 6378137.0,
+                                   6356752.314245179, &count, ids.data(), a.data(), b.data(),
+                                   c.data(), lon.data(), lat.data(), h.data());
+    ASSERT_EQ(count, 9);
+    EXPECT_EQ(ids[5], 105);  // untouched before the dropped point
+    EXPECT_EQ(ids[6], 7);    // then numbered by place
+    EXPECT_EQ(ids[8], 9);
+    for (int i = 0; i < count; ++i) {
+        // A point moved along its slant range is imaged where it was.
+        double p = 0, l = 0;
+        EXPECT_EQ(h[i], 1000.0);
+        ASSERT_TRUE(sc.GroundToImage(lon[i], lat[i], 1000.0, &p, &l));
+        EXPECT_LT(std::fabs(p - a[i]), 4.0) << i;
+        EXPECT_LT(std::fabs(l - b[i]), 1.0) << i;
+    }
 }
 
 }  // namespace

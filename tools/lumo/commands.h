@@ -51,6 +51,13 @@ void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
                 const std::string& outputPath, CommandContext& context);
 
+// `lumo fit --model rtcs`: the radar model of the image of `segmentPath` from
+// the control points (with heights in `heightRef`, "E" or "M") of `gcps`,
+// ground coordinates in `geosys`, written to `outputPath`.
+void RunRtcsFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
+                const std::string& heightRef, const std::string& outputPath,
+                CommandContext& context);
+
 // Arguments of the point-transform commands (transform and the per-family
 // commands): MODEL --to-image|--to-ground POINTS [-o OUT] with the point
 // file options.

@@ -102,6 +102,7 @@ const std::vector<FamilyDemo>& FamilyDemos() {
         {"tps", "tps_utm31.json", "poly_utm31_gcps.csv"},
         {"ap", "ap_frame_utm31.json", "ap_frame_utm31_gcps.csv"},
         {"srit", "srit_spot5_roll20.json", "srit_spot5_roll20_checks.csv"},
+        {"rtcs", "rtcs_scene.json", "rtcs_scene_checks.csv"},
     };
     return demos;
 }

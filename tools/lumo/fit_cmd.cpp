@@ -35,9 +35,10 @@ struct FitOptions {
     std::string osGcps;
     std::string osGeosys;
     std::string osOutput;
-    std::string osSegment;  // srit only
-    int nOrder = 0;         // 0: not given
-    int nPixels = -1;       // -1: from the control points
+    std::string osSegment;    // srit and rtcs only
+    std::string osHeightRef;  // rtcs only
+    int nOrder = 0;           // 0: not given
+    int nPixels = -1;         // -1: from the control points
     int nLines = -1;
     bool bAllowLowerOrder = false;  // write a lower order than asked for instead of failing
     PointFileOptions sPoints;       // --height
@@ -232,16 +233,25 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     if (options.osModel != "poly" && options.bAllowLowerOrder) {
         throw CLI::ValidationError("--allow-lower-order applies to --model poly only");
     }
-    if (options.osModel != "srit" && !options.osSegment.empty()) {
-        throw CLI::ValidationError("--segment applies to --model srit only");
+    const bool bRadar = options.osModel == "rtcs";
+    if (options.osModel != "srit" && !bRadar && !options.osSegment.empty()) {
+        throw CLI::ValidationError("--segment applies to --model srit and rtcs only");
+    }
+    if (!bRadar && !options.osHeightRef.empty()) {
+        throw CLI::ValidationError("--height-ref applies to --model rtcs only");
     }
     PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
     const bool bRigorous = options.osModel == "srit";
-    ApplyHeights(gcps, options.sPoints, bRigorous, "the rigorous model");
+    ApplyHeights(gcps, options.sPoints, bRigorous || bRadar,
+                 bRadar ? "the radar model" : "the rigorous model");
     const std::string geosys = FitGeosys(options, gcps);
     if (bRigorous) {
         RunSritFit(gcps, options.osSegment, geosys, options.osOutput, context);
+        return;
+    }
+    if (bRadar) {
+        RunRtcsFit(gcps, options.osSegment, geosys, options.osHeightRef, options.osOutput, context);
         return;
     }
     if (geosys.empty()) {
@@ -281,12 +291,17 @@ void RunFit(const FitOptions& options, CommandContext& context) {
 void AddFitCommand(CLI::App& app, CommandContext& context) {
     auto options = std::make_shared<FitOptions>();
     CLI::App* command = app.add_subcommand(
-        "fit", "Fit a polynomial, thin plate spline or rigorous model to control points");
-    command->add_option("--model", options->osModel, "model family: poly, tps or srit")
+        "fit", "Fit a polynomial, thin plate spline, rigorous or radar model to control points");
+    command->add_option("--model", options->osModel, "model family: poly, tps, srit or rtcs")
         ->required()
-        ->check(CLI::IsMember({"poly", "tps", "srit"}));
+        ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs"}));
     command->add_option("--segment", options->osSegment,
-                        "ephemeris segment of the image (JSON; srit only)");
+                        "ephemeris segment of the image (JSON; srit and rtcs)");
+    command
+        ->add_option("--height-ref", options->osHeightRef,
+                     "rtcs: heights of the control points are above the ellipsoid (E) or mean "
+                     "sea level (M); the model then takes heights the same way")
+        ->check(CLI::IsMember({"E", "M"}));
     command->add_option("--gcps", options->osGcps, "control points (CSV with pixel,line,x,y)")
         ->required();
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")

@@ -10,6 +10,7 @@
 #include "json_fields.h"
 #include "nova/projection.h"
 #include "rf_io.h"
+#include "rtcs_io.h"
 #include "srit_io.h"
 #include "tps_io.h"
 
@@ -66,6 +67,7 @@ const std::vector<ModelFamilyCodec>& ModelFamilies() {
         {"tps", LUMO_CODE_TPS, "thin plate spline model", &ReadTpsRecord},
         {"ap", LUMO_CODE_AP, "aerial photo model", &ReadApRecord},
         {"srit", LUMO_CODE_SRIT, "satellite rigorous model", &ReadSritRecord},
+        {"rtcs", LUMO_CODE_RTCS, "radar model", &ReadRtcsRecord},
     };
     return families;
 }

@@ -81,6 +81,13 @@ void FitFromImageDescription(RTCSInfo_t* psModel, RTCSCOpt_t* psOpt, int nPoints
 // longitude and latitude; false when they cannot be converted.
 bool ToGeographic(const ProjInfo_t& sProj, double dfX, double dfY, double* pdfLon, double* pdfLat);
 
+// Ellipsoidal height of a height in the model's reference at a position.
+double EllipsoidalHeight(const RTCSInfo_t& sModel, double dfLon, double dfLat, double dfHeight);
+// Fills sModel.sGeoid over the ground box of the line positions (widened by
+// half a degree) from the host's global geoid model. Fatal error 11 when the
+// geoid model is not installed.
+void BuildGeoidGrid(RTCSInfo_t* psModel);
+
 // A longitude written near dfReference (within 180 degrees of it).
 double LongitudeNear(double dfLon, double dfReference);
 

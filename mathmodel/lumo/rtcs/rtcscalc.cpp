@@ -175,10 +175,12 @@ bool OwnGeometryToImage(const RTCSInfo_t* psModel, double dfLon, double dfLat, d
     if (pbClamped != nullptr) *pbClamped = dfParallaxPixel != dfPixel;
     const int nLine = static_cast<int>(std::floor(dfParallaxLine));
     double dfRange = 0, dfRaised = 0, dfIncidence = 0, dfAngle = 0, dfShift = 0;
+    const double dh =
+        EllipsoidalHeight(*psModel, dfLon, dfLat, dfHeight) - psModel->psCOpt->dfAvgHt;
     calculate_parallax_shift(nLine, psModel->nRangeDirection, psModel->padfPixelSpacing,
-                             psModel->padfIncidenceCoefs, psModel->padfRangeCoefs,
-                             dfHeight - psModel->psCOpt->dfAvgHt, dfParallaxPixel, &dfRange,
-                             &dfRaised, &dfIncidence, &dfAngle, &dfShift);
+                             psModel->padfIncidenceCoefs, psModel->padfRangeCoefs, dh,
+                             dfParallaxPixel, &dfRange, &dfRaised, &dfIncidence, &dfAngle,
+                             &dfShift);
     *pdfPixel = dfPixel - dfShift;
     *pdfLine = dfLine;
     return std::isfinite(*pdfPixel) && std::isfinite(*pdfLine);
@@ -285,6 +287,7 @@ void RTCSCopy(RTCSInfo_t* psDst, const RTCSInfo_t* psSrc) {
     psDst->dfStartRangeLast = psSrc->dfStartRangeLast;
     psDst->dfMinGcpHeight = psSrc->dfMinGcpHeight;
     psDst->dfMaxGcpHeight = psSrc->dfMaxGcpHeight;
+    psDst->sGeoid = psSrc->sGeoid;
     if (psSrc->psCOpt == nullptr) return;
 
     const auto nCount = static_cast<std::size_t>(std::max(nLines, 0));

@@ -549,6 +549,7 @@ RTCSInfo_t* RTCSGenModel(const EphemerisSeg_t* psSeg, const ProjInfo_t& sProj,
                     "RTCSIniMap RTCSModel->psCOpt->dfAvgHt=%f\n", m.psCOpt->dfAvgHt);
     }
     m.nRangeDirection = sLines.padfRangeLast[0] > sLines.padfRangeFirst[0] ? 1 : -1;
+    if (m.osHeightRef == "M") lumo::rtcs::BuildGeoidGrid(&m);
     lumo::rtcs::BuildQuarterLines(&m);
 
     ControlArrays c = ConvertControlPoints(m, sLines.nPixels, sLines.nLines);

@@ -64,7 +64,15 @@ int RTCSCalGeodetic(const RTCSInfo_t* psModel, double dfPixel, double dfLine, do
     if (!lumo::rtcs::IsEvaluable(psModel)) return 0;
     const RTCSCOpt_t& sOpt = *psModel->psCOpt;
     const int nLines = sOpt.sLines.nLines;
-    const double dh = dfHeight - sOpt.dfAvgHt;
+    // The height in the model's reference, made ellipsoidal at the position
+    // the inverse polynomial gives (the geoid hardly changes over its error).
+    double dfLonGuess = 0.0, dfLatGuess = 0.0;
+    if (!psModel->sGeoid.adfUndulation.empty() &&
+        GCPTransform(&psModel->sGeoInv, dfPixel, dfLine, &dfLonGuess, &dfLatGuess) != 0) {
+        return 0;
+    }
+    const double dh =
+        lumo::rtcs::EllipsoidalHeight(*psModel, dfLonGuess, dfLatGuess, dfHeight) - sOpt.dfAvgHt;
     if (!(dfLine >= 0.0) || !(dfLine < nLines) || !std::isfinite(dfPixel) || !std::isfinite(dh)) {
         return 0;
     }
