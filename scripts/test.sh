@@ -20,3 +20,6 @@ cmake --build "$ROOT/build-sanitize" -j"$JOBS"
 echo "== tests (sanitizers) =="
 ASAN_OPTIONS=detect_leaks=1:abort_on_error=1 UBSAN_OPTIONS=print_stacktrace=1:halt_on_error=1 \
   ctest --test-dir "$ROOT/build-sanitize" --output-on-failure -j"$JOBS"
+
+echo "== size of code and tests =="
+bash "$ROOT/scripts/count_lines.sh"
