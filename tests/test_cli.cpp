@@ -134,25 +134,16 @@ TEST_F(CliTest, ModelFileErrorsNameFileAndField) {
         std::function<void(json&)> mutate;
         std::string expected;  // part of the message besides the file name
     };
+    // One case per kind of fault; the field helpers' wordings are tested
+    // with the helpers.
     const std::vector<Case> cases = {
         {[](json& d) { d.erase("geosys"); }, "\"geosys\" is missing"},
-        {[](json& d) { d["pixels"] = "6000"; }, "\"pixels\" must be an integer"},
-        {[](json& d) { d["lines"] = -1; }, "\"lines\" must lie in"},
-        {[](json& d) { d["format"] = "other"; }, "\"format\" must be"},
         {[](json& d) { d["version"] = 2; }, "\"version\" must lie in 1..1"},
         {[](json& d) { d["family"] = "nope"; }, "unknown model family \"nope\""},
-        {[](json& d) { d["family"] = 4; }, "\"family\" must be a text"},
-        {[](json& d) { d.erase("poly"); }, "\"poly\" is missing"},
-        {[](json& d) { d["poly"] = json::array(); }, "\"poly\" must be a JSON object"},
-        {[](json& d) { d["poly"]["nCoeffs"] = 0; }, "\"poly.nCoeffs\" must lie in 1..21"},
         {[](json& d) { d["poly"]["nCoeffs"] = 22; }, "\"poly.nCoeffs\" must lie in 1..21"},
-        {[](json& d) { d["poly"]["nCoeffs"] = 1e30; }, "\"poly.nCoeffs\" must be an integer"},
-        {[](json& d) { d["poly"]["nCoeffs"] = 18446744073709551615ULL; }, "must lie in 1..21"},
         {[](json& d) { d["poly"]["pixelCoeffs"].erase(0); },
          "\"poly.pixelCoeffs\" must hold 10 numbers (nCoeffs), found 9"},
-        {[](json& d) { d["poly"]["nCoeffs"] = 6; }, "\"poly.pixelCoeffs\" must hold 6"},
         {[](json& d) { d["poly"]["yCoeffs"][3] = "x"; }, "\"poly.yCoeffs\" item 3 must be"},
-        {[](json& d) { d["poly"]["lineCoeffs"] = 1.0; }, "\"poly.lineCoeffs\" must be an array"},
         {[](json& d) { d["geosys"] = "UTM 31 U D000 EXTRA"; }, "longer than 16"},
         {[](json& d) { d["geosys"] = "NOWHERE 99"; }, "unknown georeferencing text"},
     };
@@ -232,21 +223,14 @@ TEST_F(CliTest, PointFileErrorsNamePlace) {
         PointKind kind;
         std::string expected;
     } cases[] = {
-        {"", PointKind::Ground, "pts.csv: empty file"},
         {"# only a comment\n\n", PointKind::Ground, "pts.csv: empty file"},
         {"id,x\n", PointKind::Ground, "pts.csv:1: missing column \"y\" (header has: id, x)"},
-        {"x,y\n", PointKind::Image, "missing column \"pixel\""},
         {"pixel,line,x\n", PointKind::ControlPoint, "missing column \"y\""},
         {"x,y,X\n", PointKind::Ground, "column \"x\" appears twice"},
-        {"x,y\n1,2\n3,abc\n", PointKind::Ground, "pts.csv:3: column 2 (\"y\"): \"abc\" is not"},
         {"x,y\n1,2\n\n1.5e,2\n", PointKind::Ground, "pts.csv:4: column 1 (\"x\"): \"1.5e\""},
-        {"x,y\n1,2x\n", PointKind::Ground, "\"2x\" is not a finite number"},
         {"x,y\n1,\n", PointKind::Ground, "column 2 (\"y\"): \"\" is not"},
         {"x,y\nnan,1\n", PointKind::Ground, "\"nan\" is not a finite number"},
-        {"x,y\n1,inf\n", PointKind::Ground, "\"inf\" is not a finite number"},
         {"x,y\n1,1e999\n", PointKind::Ground, "\"1e999\" is not a finite number"},
-        {"x,y\n1,2,3\n", PointKind::Ground,
-         "pts.csv:2: expected 2 fields as in the header, found 3"},
         {"id,x,y\nA,1\n", PointKind::Ground, "expected 3 fields as in the header, found 2"},
     };
     for (const auto& c : cases) {

@@ -15,6 +15,7 @@
 #include "nova/crs.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
+#include "points_io.h"
 #include "support/model_records.h"
 #include "support/model_stubs.h"
 
@@ -80,16 +81,15 @@ struct Gcps {
 
 Gcps BundledGcps() {
     Gcps g;
-    g.pixel = {152.50,  5811.00, 3020.75, 450.00,  5600.50, 1200.25, 4480.00, 2255.50,
-               3890.25, 990.00,  5105.75, 2710.00, 1888.50, 4025.00, 320.75};
-    g.line = {240.25,  97.50,   2988.50, 5702.25, 5890.00, 1333.00, 1510.75, 4470.00,
-              5120.50, 3405.50, 3310.25, 620.50,  2411.00, 4011.75, 1890.00};
-    g.x = {441544.763, 498124.542, 470467.143, 445000.399, 496519.732,
-           452118.326, 484932.076, 462944.722, 479347.767, 450197.925,
-           491347.253, 467152.959, 459094.892, 480598.853, 443372.537};
-    g.y = {5717611.227, 5719529.779, 5690379.745, 5663013.896, 5661587.653,
-           5706775.165, 5705283.162, 5675497.391, 5669134.543, 5686032.494,
-           5687344.390, 5714030.951, 5696055.727, 5680235.026, 5701128.896};
+    for (const auto& p :
+         lumo::cli::ReadPointsFile(std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31_gcps.csv",
+                                   lumo::cli::PointKind::ControlPoint)
+             .asPoints) {
+        g.pixel.push_back(p.dfPixel);
+        g.line.push_back(p.dfLine);
+        g.x.push_back(p.dfX);
+        g.y.push_back(p.dfY);
+    }
     return g;
 }
 
