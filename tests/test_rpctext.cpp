@@ -4,7 +4,6 @@
 
 #include <cmath>
 #include <cstring>
-#include <fstream>
 #include <memory>
 #include <sstream>
 #include <string>
@@ -13,6 +12,7 @@
 #include "lumo.h"
 #include "model_io.h"
 #include "nova/runtime.h"
+#include "support/cli_runner.h"
 
 namespace {
 
@@ -20,12 +20,7 @@ using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
 
 const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 
-std::string ReadFile(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
+using lumo::support::ReadText;
 
 RecordPtr Parse(const std::string& text, int nForm = LUMO_RPC_TEXT_AUTO) {
     return RecordPtr(LumoRPCTextToRFInfo(text.data(), text.size(), nForm, "sample.txt"),
@@ -76,7 +71,7 @@ struct Gcp {
 };
 
 std::vector<Gcp> SampleGcps() {
-    std::istringstream in(ReadFile(kExamples + "/rf_scene_gcps.csv"));
+    std::istringstream in(ReadText(kExamples + "/rf_scene_gcps.csv"));
     std::vector<Gcp> gcps;
     std::string line;
     while (std::getline(in, line)) {
@@ -92,7 +87,7 @@ std::vector<Gcp> SampleGcps() {
 }
 
 TEST(RPCText, SampleFileReadsIntoTheModelsAxesAndFitsItsControlPoints) {
-    const std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    const std::string text = ReadText(kExamples + "/rf_scene_RPC.TXT");
     EXPECT_EQ(LumoDetectRPCTextForm(text.data(), text.size()), LUMO_RPC_TEXT_TXT);
     RecordPtr psRF = Parse(text);
     EXPECT_EQ(psRF->dfXOffset, 7.45);   // LONG_OFF
@@ -119,7 +114,7 @@ TEST(RPCText, SampleFileReadsIntoTheModelsAxesAndFitsItsControlPoints) {
 }
 
 TEST(RPCText, BothFormsRoundTripExactly) {
-    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    RecordPtr psRF = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     std::strcpy(psRF->pszSensor, "PLEIADES 1A");
     const std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
     EXPECT_EQ(LumoDetectRPCTextForm(rpb.data(), rpb.size()), LUMO_RPC_TEXT_RPB);
@@ -150,7 +145,7 @@ TEST(RPCText, BothFormsRoundTripExactly) {
 }
 
 TEST(RPCText, TolerantOfLayoutVariants) {
-    std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    std::string text = ReadText(kExamples + "/rf_scene_RPC.TXT");
     RecordPtr psRF = Parse(text);
     // Windows line ends, lower-case keys, no units, extra vendor keys.
     std::string variant = "ERR_BIAS: 1.5\r\nERR_RAND: 0.2\r\n";
@@ -170,7 +165,7 @@ TEST(RPCText, TolerantOfLayoutVariants) {
 }
 
 TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
-    const std::string text = ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    const std::string text = ReadText(kExamples + "/rf_scene_RPC.TXT");
     EXPECT_NE(ParseError(Replace(text, "LAT_SCALE: +0.11 degrees\n", ""))
                   .find("key \"LAT_SCALE\" is missing"),
               std::string::npos);
@@ -219,7 +214,7 @@ TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
 }
 
 TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
-    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    RecordPtr psRF = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     psRF->nAdjust = 1;
     EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT).find("adjustment"), std::string::npos);
     psRF->nAdjust = 0;
@@ -239,7 +234,7 @@ TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
 }
 
 TEST(RPCText, LongSatelliteNameIsCutToTheSensorBuffer) {
-    RecordPtr psRF = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    RecordPtr psRF = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
     rpb = "satId = \"A-VERY-LONG-SATELLITE-NAME\";\n" + rpb;
     EXPECT_STREQ(Parse(rpb)->pszSensor, "A-VERY-LONG-SATE");
@@ -252,25 +247,21 @@ TEST(RPCText, ToolConvertsBetweenAllForms) {
     const std::string rpb = dir + "/h_scene.RPB", json = dir + "/h_scene.json";
     const std::string bin = dir + "/h_scene.bin", txt = dir + "/h_scene_RPC.TXT";
     const auto run = [](std::vector<std::string> args) {
-        args.insert(args.begin(), "lumo");
-        std::vector<char*> argv;
-        for (std::string& a : args) argv.push_back(&a[0]);
-        std::ostringstream out, err;
-        const int rc = lumo::cli::RunLumo(static_cast<int>(argv.size()), argv.data(), out, err);
-        return std::make_pair(rc, err.str());
+        const lumo::support::RunResult r = lumo::support::RunTool(std::move(args));
+        return std::make_pair(r.nCode, r.osErr);
     };
     const std::string sample = kExamples + "/rf_scene_RPC.TXT";
     EXPECT_EQ(run({"rpc", sample, rpb}).first, 0);
     EXPECT_EQ(run({"rpc", rpb, json, "--pixels", "10000", "--lines", "10000"}).first, 0);
     EXPECT_EQ(run({"rpc", json, bin}).first, 0);
     EXPECT_EQ(run({"rpc", bin, txt, "--to", "txt"}).first, 0);
-    RecordPtr psSample = Parse(ReadFile(sample));
+    RecordPtr psSample = Parse(ReadText(sample));
     const lumo::cli::LoadedModel model = lumo::cli::ReadModelFile(json);
     EXPECT_EQ(model.nModelCode, LUMO_CODE_RF);
     EXPECT_EQ(model.sEnvelope.nPixels, 10000);
     ExpectSameModel(*psSample, *static_cast<RFInfo_t*>(model.poRecord.get()));
     // The block keeps 15 significant digits.
-    RecordPtr psFromBlock = Parse(ReadFile(txt));
+    RecordPtr psFromBlock = Parse(ReadText(txt));
     for (int i = 0; i < 20; ++i) {
         EXPECT_NEAR(psFromBlock->padfPixelNum[i], psSample->padfPixelNum[i],
                     1e-14 * std::fabs(psSample->padfPixelNum[i]));
