@@ -6,6 +6,8 @@
 // never an out-of-bounds read or write.
 #pragma once
 
+#include <string>
+
 #include "lumo_types.h"
 
 // A new, independently owned deep copy of psSrc; null when psSrc is null.
@@ -13,6 +15,12 @@ LUMO_API EphemerisSeg_t* EphemerisSegDuplicate(const EphemerisSeg_t* psSrc);
 
 // Releases a segment with its holder, sub-record and line array. Null is ignored.
 LUMO_API void LumoSatEphemerisFree(EphemerisSeg_t* psSeg);
+// Why a segment cannot be used by the models, naming the field and its
+// value; empty when it can: image and table line counts from 0 to
+// 10,000,000, a line table present when its count is, an orbit kind that
+// matches its sub-record, a level conversion form of 0, 20 or 39. Every
+// reader of a segment runs it.
+LUMO_API std::string EphemerisSegValidate(const EphemerisSeg_t* psSeg);
 
 // Makes the segment owned through *ppsDst equal to the one owned through
 // *ppsSrc, creating or releasing the destination segment as needed. The two

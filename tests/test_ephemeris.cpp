@@ -79,8 +79,8 @@ TEST(EphemerisDuplicate, UnknownKindAndEmptyHolder) {
     LumoSatEphemerisFree(nullptr);
 }
 
-// A count that disagrees with its array is never followed: the copy holds the
-// sub-record without a line array and says so with a count of 0.
+// A count that disagrees with its array is never followed: the copy holds no
+// line array and keeps the count as it is (EphemerisSegValidate refuses it).
 TEST(EphemerisDuplicate, CountDisagreeingWithArray) {
     SegmentPtr poNegative = RandomSegment(EPH_ORBIT_RADAR, 2, 3u);
     SubRecord<RadarData_t>(poNegative.get())->nNumLinePositions = -4;
@@ -88,7 +88,7 @@ TEST(EphemerisDuplicate, CountDisagreeingWithArray) {
     const RadarData_t* psRadar = SubRecord<RadarData_t>(poCopy.get());
     ASSERT_NE(psRadar, nullptr);
     EXPECT_EQ(psRadar->pLinePositions, nullptr);
-    EXPECT_EQ(psRadar->nNumLinePositions, 0);
+    EXPECT_EQ(psRadar->nNumLinePositions, -4);
 
     // Line arrays gone, counts left.
     SegmentPtr poAtt = RandomSegment(EPH_ORBIT_ATTITUDE, 7, 4u);
@@ -97,14 +97,14 @@ TEST(EphemerisDuplicate, CountDisagreeingWithArray) {
     const AttitudeData_t* psAtt = SubRecord<AttitudeData_t>(poAttCopy.get());
     ASSERT_NE(psAtt, nullptr);
     EXPECT_EQ(psAtt->pAttitudeLines, nullptr);
-    EXPECT_EQ(psAtt->nNumAttitudeLines, 0);
+    EXPECT_EQ(psAtt->nNumAttitudeLines, 7);
     EXPECT_EQ(psAtt->dfAttitude3, SubRecord<AttitudeData_t>(poAtt.get())->dfAttitude3);
 
     SegmentPtr poAvhrr = RandomSegment(EPH_ORBIT_AVHRR, 7, 4u);
     DropLines(poAvhrr.get(), &AvhrrData_t::pScanLines);
     SegmentPtr poAvhrrCopy(EphemerisSegDuplicate(poAvhrr.get()));
     EXPECT_EQ(SubRecord<AvhrrData_t>(poAvhrrCopy.get())->pScanLines, nullptr);
-    EXPECT_EQ(SubRecord<AvhrrData_t>(poAvhrrCopy.get())->nNumScanLines, 0);
+    EXPECT_EQ(SubRecord<AvhrrData_t>(poAvhrrCopy.get())->nNumScanLines, 7);
 }
 
 TEST(EphemerisFreeOrbit, KeepsTheMainRecord) {
@@ -178,7 +178,7 @@ TEST(EphemerisCopyInto, SubRecordWithoutLinesIsNotCopied) {
     const RadarData_t* psRadar = SubRecord<RadarData_t>(psDst);
     ASSERT_NE(psRadar, nullptr);
     EXPECT_EQ(psRadar->pLinePositions, nullptr);
-    EXPECT_EQ(psRadar->nNumLinePositions, 0);
+    EXPECT_EQ(psRadar->nNumLinePositions, -1);
     EXPECT_EQ(std::memcmp(psRadar->abyLeading, psNegRadar->abyLeading, RADAR_LEADING_SIZE), 0);
 }
 

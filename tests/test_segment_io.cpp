@@ -4,6 +4,7 @@
 
 #include <cmath>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <fstream>
 #include <limits>
@@ -125,6 +126,8 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
          "szSensorName"},
         {R"("format": "lumo-segment", "version": 1, "szGeosys": "\u0100")", "szGeosys"},
         {R"("format": "lumo-segment", "version": 1, "nNumLines": 1.5)", "nNumLines"},
+        {R"("format": "lumo-segment", "version": 1, "nNumLines": -1)", "nNumLines = -1"},
+        {R"("format": "lumo-segment", "version": 1, "nNumPixels": 2000000000)", "nNumPixels"},
         {R"("format": "lumo-segment", "version": 1, "bCarriedFlag": 256)", "bCarriedFlag"},
         {R"("format": "lumo-segment", "version": 1, "dfPixelRes": "five")", "dfPixelRes"},
         {R"("format": "lumo-segment", "version": 1, "adfCarriedB": [1, 2, 3])", "adfCarriedB"},
@@ -170,7 +173,7 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
         } catch (const nova::DataException& e) {
             const std::string osMessage = e.what();
             EXPECT_EQ(osMessage.rfind("case.json: ", 0), 0u) << osMessage;
-            EXPECT_NE(osMessage.find("\"" + std::string(c.pszField) + "\""), std::string::npos)
+            EXPECT_NE(osMessage.find(c.pszField), std::string::npos)
                 << "expected field " << c.pszField << " in: " << osMessage;
         }
     }

@@ -9,6 +9,7 @@
 #include "crs.h"
 #include "lumo_ephemeris.h"
 #include "lumo_gcp.h"
+#include "record_check.h"
 #include "runtime.h"
 
 namespace {
@@ -49,8 +50,7 @@ int32_t UsableLineCount(Sub& s) {
     return (LineArray(s) != nullptr && LineCount(s) > 0) ? LineCount(s) : 0;
 }
 
-// A separately owned copy of a sub-record and its lines. The copy's count is
-// the number of lines it really holds.
+// A separately owned copy of a sub-record and its lines.
 template <typename Sub>
 void* CloneSubRecord(void* pvSrc) {
     Sub& sSrc = *static_cast<Sub*>(pvSrc);
@@ -58,14 +58,35 @@ void* CloneSubRecord(void* pvSrc) {
     HostPtr<Sub> poCopy(AllocZeroed<Sub>(1));
     std::memcpy(poCopy.get(), &sSrc, sizeof(Sub));
     LineArray(*poCopy) = nullptr;
+    // The count is copied as it is; only lines that exist are copied.
     const int32_t nLines = UsableLineCount(sSrc);
     if (nLines > 0) {
         Line* pasLines = AllocZeroed<Line>(nLines);
         std::memcpy(pasLines, LineArray(sSrc), sizeof(Line) * static_cast<std::size_t>(nLines));
         LineArray(*poCopy) = pasLines;
     }
-    LineCount(*poCopy) = nLines;
     return poCopy.release();
+}
+
+// Largest line or pixel count of an image or a line table: far beyond any
+// scene, low enough that a corrupt count is refused rather than followed.
+constexpr int32_t kMaxLineCount = 10000000;
+
+std::string CheckCount(const std::string& osField, int32_t nCount) {
+    if (nCount >= 0 && nCount <= kMaxLineCount) return "";
+    return lumo::FieldProblem(osField, nCount, "a count must lie in 0..10000000");
+}
+
+template <typename Sub>
+std::string CheckSubRecord(void* pvSub, const char* pszCount, const char* pszLines) {
+    Sub& s = *static_cast<Sub*>(pvSub);
+    std::string problem = CheckCount(pszCount, LineCount(s));
+    if (problem.empty() && LineCount(s) > 0 && LineArray(s) == nullptr) {
+        problem = lumo::FieldProblem(
+            pszCount, LineCount(s),
+            std::string("the count has no line table (") + pszLines + " is null)");
+    }
+    return problem;
 }
 
 template <typename Sub>
@@ -157,6 +178,35 @@ EphemerisSeg_t* EphemerisSegDuplicate(const EphemerisSeg_t* psSrc) {
     // The copy gets a holder of its own, never the source's.
     poCopy->ppOrbitData = CloneOrbit(*psSrc, false);
     return poCopy.release();
+}
+
+std::string EphemerisSegValidate(const EphemerisSeg_t* psSeg) {
+    if (psSeg == nullptr) return "the segment is null";
+    const EphemerisSeg_t& s = *psSeg;
+    std::string problem = CheckCount("nNumLines", s.nNumLines);
+    if (problem.empty()) problem = CheckCount("nNumPixels", s.nNumPixels);
+    if (!problem.empty()) return problem;
+    if (s.nLevelConvForm != 0 && s.nLevelConvForm != 20 && s.nLevelConvForm != 39) {
+        return lumo::FieldProblem("nLevelConvForm", s.nLevelConvForm, "must be 0, 20 or 39");
+    }
+    if (s.ppOrbitData == nullptr) return "";
+    if (s.nOrbitType == EPH_ORBIT_NONE) {
+        return lumo::FieldProblem("nOrbitType", 0, "the segment holds an orbit sub-record");
+    }
+    if (OpsFor(s.nOrbitType) == nullptr) {
+        return lumo::FieldProblem("nOrbitType", s.nOrbitType,
+                                  "an orbit sub-record must be of kind 1, 2 or 3");
+    }
+    void* pvSub = *s.ppOrbitData;
+    if (pvSub == nullptr) return "";
+    switch (s.nOrbitType) {
+        case EPH_ORBIT_ATTITUDE:
+            return CheckSubRecord<AttitudeData_t>(pvSub, "nNumAttitudeLines", "pAttitudeLines");
+        case EPH_ORBIT_RADAR:
+            return CheckSubRecord<RadarData_t>(pvSub, "nNumLinePositions", "pLinePositions");
+        default:
+            return CheckSubRecord<AvhrrData_t>(pvSub, "nNumScanLines", "pScanLines");
+    }
 }
 
 void LumoSatEphemerisFree(EphemerisSeg_t* psSeg) {

@@ -7,6 +7,7 @@
 
 #include <cmath>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <limits>
 #include <random>
@@ -88,6 +89,9 @@ inline lumo::cli::SegmentPtr RandomMainRecord(Filler& r) {
                         &s.nPrefixBytes, &s.nSuffixBytes, &s.nCarried2}) {
         *pn = r.Int();
     }
+    // Image sizes a segment can have.
+    s.nNumLines = std::abs(s.nNumLines % 10000001);
+    s.nNumPixels = std::abs(s.nNumPixels % 10000001);
     // Special values that must come back exactly.
     s.dfIFOV = std::numeric_limits<double>::denorm_min();
     s.dfViewAngle = -0.0;

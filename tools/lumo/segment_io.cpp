@@ -518,13 +518,6 @@ void CheckEnvelope(const Json& document, const Reader& sReader) {
     }
 }
 
-void CheckLevelConversion(const EphemerisSeg_t& sSeg, const Reader& sReader) {
-    const int nForm = sSeg.nLevelConvForm;
-    if (nForm != 0 && nForm != 20 && nForm != 39) {
-        sReader.Fail("nLevelConvForm", "must be 0, 20 or 39, found " + std::to_string(nForm));
-    }
-}
-
 // ---------------------------------------------------------------------------
 // Writing
 // ---------------------------------------------------------------------------
@@ -684,11 +677,12 @@ SegmentPtr SegmentFromJson(const Json& document, const std::string& source) {
     SegmentPtr poSeg(static_cast<EphemerisSeg_t*>(HCalloc(1, sizeof(EphemerisSeg_t))));
     sReader.Object(document, "", Table(kSegmentFields), {"format", "version", kOrbitDataName},
                    poSeg.get());
-    CheckLevelConversion(*poSeg, sReader);
     const auto itOrbit = document.find(kOrbitDataName);
     if (itOrbit != document.end() && !itOrbit->is_null()) {
         ReadOrbitData(*itOrbit, sReader, poSeg.get());
     }
+    const std::string problem = EphemerisSegValidate(poSeg.get());
+    if (!problem.empty()) LUMO_CLI_FAIL(source + ": the segment cannot be used: " + problem);
     return poSeg;
 }
 
