@@ -7,6 +7,8 @@
 // image (pixel, line of the scanned raster).
 #pragma once
 
+#include <string>
+
 #include "lumo_types.h"
 
 constexpr int AP_GEOSYS_SIZE = 17;  // 16 characters and the terminator
@@ -54,6 +56,12 @@ struct APInfo_t {
 LUMO_API APInfo_t* APAllocate();
 // Null is ignored.
 LUMO_API void APDeallocate(APInfo_t* psAP);
+// Why a record cannot be evaluated, naming the field and its value; empty
+// when it can: finite values, a non-zero focal length, a rotation matrix
+// (R R^T = I to 1e-6), fiducial transforms that are not degenerate, an Earth
+// radius when the curvature correction is on and a camera above sea level
+// when the refraction correction is on. Every reader of a model file runs it.
+LUMO_API std::string APValidate(const APInfo_t* psAP);
 
 // Ground to image. A height of -1e20 stands for 0. A point that cannot be
 // seen on the photo (at or behind the perspective centre's plane, or not

@@ -3,7 +3,10 @@
 
 #include "lumo_types.h"
 
-// Ground to image. 1 when the transform was carried out, 0 otherwise.
+// Ground to image. 1 when the transform was carried out, 0 otherwise. The
+// three functions return 0 also when the family gives no position: an
+// output that is the null value -1e20 or not finite (the outputs then hold
+// what the family wrote).
 LUMO_API int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
                         double* pdfPixel, double* pdfLine);
 // Image to ground at the height dfZ.

@@ -1,6 +1,8 @@
 // Polynomial model: one bivariate polynomial per output, up to order 5.
 #pragma once
 
+#include <string>
+
 #include "lumo_types.h"
 
 constexpr int POLY_MAX_COEFFS = 21;
@@ -24,6 +26,10 @@ struct POLYInfo_t {
 LUMO_API POLYInfo_t* POLYAllocate();
 LUMO_API void POLYCopy(POLYInfo_t* psDst, const POLYInfo_t* psSrc);
 LUMO_API void POLYDeallocate(POLYInfo_t* psPoly);
+// Why a record cannot be evaluated (a term count outside 1..21, a
+// coefficient that is not finite), naming the field and its value; empty
+// when it can. Every reader of a model file runs it.
+LUMO_API std::string POLYValidate(const POLYInfo_t* psPoly);
 LUMO_API void POLYGeo2Img(const POLYInfo_t* psPoly, double dfX, double dfY, double* pdfPixel,
                           double* pdfLine);
 LUMO_API void POLYImg2Geo(const POLYInfo_t* psPoly, double dfPixel, double dfLine, double* pdfX,

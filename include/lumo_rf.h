@@ -55,16 +55,28 @@ struct RFInfo_t {
 // and psExisting is returned.
 LUMO_API RFInfo_t* RFAllocate(RFInfo_t* psExisting, int nTerms);
 LUMO_API void RFDeallocate(RFInfo_t* psRF);
+// Why a record cannot be evaluated, naming the field and its value; empty
+// when it can. Every reader of a model runs it: 1 to 20 terms; finite
+// coefficients; offsets and non-zero scales within what a real image and
+// place allow (latitudes within +-90 degrees, longitudes within +-360 for
+// geographic models); and over the model's own normalised ground cube,
+// denominators that neither vanish nor change sign and bounded image values.
+LUMO_API std::string RFValidate(const RFInfo_t* psRF);
 
 // Ground to image. A height of -1e20 is taken as 0. A record that cannot be
 // evaluated (null, or a scale that is zero or not finite) is reported as a
-// warning and gives -1e20 for both outputs.
+// warning and gives -1e20 for both outputs, as does a point where a
+// denominator vanishes (a pole of the model).
 LUMO_API void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPixel,
                         double* pdfLine);
 // Image to ground at the height *pdfZ (-1e20: the model's height offset,
 // written back). *pdfX and *pdfY carry the starting guess in (0 or -1e20: the
-// model's offsets) and the result out. Returns 1, or 0 when the record cannot
-// be evaluated or an input is not finite (outputs untouched).
+// model's offsets) and the result out. The Newton iteration's answer is
+// verified: it must map back onto the image point within 1e-3 pixel and, for
+// geographic models, lie within +-90 degrees of latitude and half a turn of
+// the model's longitude. Returns 1, or 0 with both outputs -1e20 when the
+// answer fails that check, the record cannot be evaluated or an input is not
+// finite.
 LUMO_API int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
                        double* pdfZ);
 // One Newton step towards the normalised image position (dfPixelN,
@@ -79,8 +91,8 @@ LUMO_API int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU,
 // field cannot be stored without loss (term count outside 0..20, a number
 // wider than its field). The reader returns a new record (RFDeallocate), or
 // null when the block does not start with "RFMODEL ", is shorter than 3584
-// bytes (nLength positive and below that) or holds a term count outside
-// 0..20.
+// bytes (nLength positive and below that) or holds a model RFValidate
+// refuses (reported as warning 11 naming the field).
 LUMO_API unsigned char* LumoRFInfoToBinary(RFInfo_t* psRF, int* pnLength);
 LUMO_API RFInfo_t* LumoBinaryToRFInfo(int nLength, unsigned char* pabyBlock);
 
@@ -97,7 +109,8 @@ enum LumoRPCTextForm {
 // Reads a model from RPC text. pszSource names the text in messages (a file
 // name). Throws nova::DataException naming the source, the line and the key
 // for a missing, repeated or malformed key, a non-finite number or a zero
-// scale. Returns a new record (RFDeallocate).
+// scale, and naming the field for a model RFValidate refuses. Returns a new
+// record (RFDeallocate).
 LUMO_API RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
                                        const char* pszSource);
 // Writes a model as RPC text in the given form. Throws nova::DataException

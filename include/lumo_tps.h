@@ -2,6 +2,8 @@
 // U(r) = r² ln(r²) per control point, interpolating the points exactly.
 #pragma once
 
+#include <string>
+
 #include "lumo_trn.h"
 #include "lumo_types.h"
 
@@ -69,6 +71,11 @@ LUMO_API TPSMInfo_t* TPSAllocate(TPSMInfo_t* psExisting);
 LUMO_API void TPSCopy(TPSMInfo_t* psDst, const TPSMInfo_t* psSrc);
 // Releases the record and everything it owns; null is ignored.
 LUMO_API void TPSDeallocate(TPSMInfo_t* psModel);
+// Why a model cannot be evaluated (a direction without its spline, a radial
+// point count of 1 to 3 or beyond the arrays, a value that is not finite),
+// naming the field and its value; empty when it can. Every reader of a model
+// file runs it.
+LUMO_API std::string TPSValidate(const TPSMInfo_t* psModel);
 LUMO_API void TPSGeo2Img(TPSMInfo_t* psModel, double dfX, double dfY, double* pdfPixel,
                          double* pdfLine);
 LUMO_API void TPSImg2Geo(TPSMInfo_t* psModel, double dfPixel, double dfLine, double* pdfX,

@@ -29,7 +29,7 @@ class CliChecks : public lumo::support::ScratchDirTest {
 
     // Runs the tool and checks its exit status and a part of its messages.
     RunResult Expect(const std::vector<std::string>& args, int nCode, const std::string& err) {
-        const RunResult r = RunTool(args);
+        RunResult r = RunTool(args);
         EXPECT_EQ(r.nCode, nCode) << args[0] << ": " << r.osErr;
         EXPECT_NE(r.osErr.find(err), std::string::npos) << r.osErr;
         return r;
@@ -60,6 +60,24 @@ TEST_F(CliChecks, FailedPointsAreNeverPositions) {
     const std::string gcps = Write("c.csv", "id,pixel,line,x,y,z\nFar,1,1,0,0,0\n");
     const RunResult r = Expect({"residuals", ap, "--gcps", gcps}, 3, "failed-to-image");
     EXPECT_NE(r.osOut.find("Far,1,1,0,0,0,,,"), std::string::npos) << r.osOut;
+    // A height far outside the rational functions' domain has no ground point.
+    const std::string image = Write("i.csv", "id,pixel,line,z\nB,100,100,1e9\n");
+    const RunResult rf = Expect({"transform", kExamples + "rf_scene.json", "--to-ground", image}, 3,
+                                "(id \"B\"): failed-to-ground");
+    EXPECT_NE(rf.osOut.find("\nB,100,100,1e+09,,,failed-to-ground\n"), std::string::npos);
+}
+
+TEST_F(CliChecks, RecordsThatCannotBeEvaluatedAreRefused) {
+    nlohmann::json segment =
+        nlohmann::json::parse(ReadText(kExamples + "segment_optical_attitude.json"));
+    segment["nNumLines"] = -1;
+    Expect({"segment", Write("s.json", segment.dump())}, 1, "nNumLines = -1");
+    // A binary block whose scale reads 0 does not become a model file.
+    Expect({"rpc", kExamples + "rf_scene_RPC.TXT", Path("b.bin")}, 0, "");
+    std::string block = ReadText(Path("b.bin"));
+    block.replace(536 + 22 * 9, 22, "  0.00000000000000e+00");  // dfLineScale
+    Expect({"rpc", Write("zero.bin", block), Path("m.json")}, 1, "dfLineScale = 0");
+    EXPECT_FALSE(std::filesystem::exists(Path("m.json")));
 }
 
 TEST_F(CliChecks, HeightsAreGivenNotAssumed) {

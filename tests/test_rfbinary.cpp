@@ -33,7 +33,8 @@ RecordPtr Own(RFInfo_t* psRF) {
     return RecordPtr(psRF, &RFDeallocate);
 }
 
-// A record with every field set to a distinct value.
+// A record with every field set to a distinct value, still a model that can
+// be evaluated: each denominator is dominated by its constant term.
 RecordPtr FullRecord(int nTerms) {
     RecordPtr psRF = Own(RFAllocate(nullptr, nTerms));
     psRF->nHalfPixelShift = 0;
@@ -52,9 +53,9 @@ RecordPtr FullRecord(int nTerms) {
     psRF->nAdjust = 1;
     for (int i = 0; i < nTerms; ++i) {
         psRF->padfPixelNum[i] = 1.0 / (i + 1);
-        psRF->padfPixelDen[i] = -1.0 / (i + 3);
+        psRF->padfPixelDen[i] = -1.0 / (i + 3) / (i == 0 ? 1.0 : 64.0);
         psRF->padfLineNum[i] = 1e-200 * (i + 1);
-        psRF->padfLineDen[i] = 3e150 / (i + 7);
+        psRF->padfLineDen[i] = 3e150 / (i + 7) / (i == 0 ? 1.0 : 64.0);
     }
     std::strcpy(psRF->pszSensor, "WORLDVIEW-3");
     return psRF;
@@ -105,7 +106,14 @@ std::string Bytes(const std::vector<unsigned char>& block, int nOffset, int nCou
 }
 
 TEST(RFBinary, WriteThenReadReproducesEveryField) {
-    for (int nTerms : {20, 7, 0}) {
+    QuietWarnings quiet;
+    // A model without terms is written, but read back it is refused: its
+    // denominators vanish everywhere.
+    RecordPtr psEmpty = FullRecord(0);
+    std::vector<unsigned char> empty = Write(psEmpty.get());
+    EXPECT_EQ(Read(empty), nullptr);
+    EXPECT_NE(nova::GetLastErrorReport().osText.find("nTerms = 0"), std::string::npos);
+    for (int nTerms : {20, 7}) {
         RecordPtr psRF = FullRecord(nTerms);
         std::vector<unsigned char> block = Write(psRF.get());
         RecordPtr psBack = Read(block);
@@ -189,6 +197,8 @@ TEST(RFBinary, HandWrittenOlderLayoutReads) {
         std::snprintf(szField, sizeof szField, "%22.14e", 1.5 * (i + 1));
         put(1024 + 22 * i, szField);
         put(2048 + 22 * i, szField);
+        put(1536 + 22 * i, i == 0 ? "1" : "0");
+        put(2560 + 22 * i, i == 0 ? "1" : "0");
     }
     put(3072, "LON D000");
     RecordPtr psRF = Read(block);
@@ -212,7 +222,7 @@ TEST(RFBinary, HandWrittenOlderLayoutReads) {
     EXPECT_EQ(psRF->nAdjust, 1);
     EXPECT_EQ(psRF->padfPixelNum[2], 4.5);
     EXPECT_EQ(psRF->padfLineNum[0], 1.5);
-    EXPECT_EQ(psRF->padfPixelDen[0], 0.0);
+    EXPECT_EQ(psRF->padfPixelDen[0], 1.0);
     EXPECT_STREQ(psRF->pszGeosys, "LON D000");
 
     // First-order terms all zero: the adjustment is off.
@@ -227,9 +237,13 @@ TEST(RFBinary, AdjustmentFlagLooksAtFirstOrderTermsOnly) {
     RecordPtr psBack = Read(block);
     EXPECT_EQ(psBack->nAdjust, 0);
     EXPECT_NE(psBack->adfPixelAdjust[4], 0.0);  // kept, but not in force
+    // A NaN first-order term puts the adjustment in force, and such a model
+    // cannot be evaluated.
+    QuietWarnings quiet;
     psRF->adfLineAdjust[1] = std::nan("");
     block = Write(psRF.get());
-    EXPECT_EQ(Read(block)->nAdjust, 1);
+    EXPECT_EQ(Read(block), nullptr);
+    EXPECT_NE(nova::GetLastErrorReport().osText.find("adfLineAdjust[1] = nan"), std::string::npos);
 }
 
 TEST(RFBinary, TextsOfSixteenCharactersAndLongerOnesAreCut) {

@@ -1,15 +1,18 @@
 // Aerial photo model: collinearity of a frame camera with fiducial
 // transforms and the corrections for principal point, lens distortion,
 // atmospheric refraction and Earth curvature.
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
 #include <string>
 
+#include "inverse_check.h"
 #include "lumo_ap.h"
 #include "null_value.h"
 #include "projection.h"
+#include "record_check.h"
 
 namespace {
 
@@ -74,50 +77,52 @@ void ScaleRadius(double& dfRadius, double dfNew, double& x, double& y) {
     dfRadius = dfNew;
 }
 
-// Newton's method for g(r') = r, started at r' = r. `Step` returns g(r') - r
-// divided by g'(r'). True with the root in dfRoot once a step falls below the
-// tolerance; a root that is not a positive finite radius is refused, since it
-// would mirror the point through the principal point.
-template <typename Step>
-bool SolveRadius(double dfRadius, Step step, double& dfRoot) {
+// Newton's method for g(r') = r, started at r' = r, with g and its
+// derivative g'. Once a step falls below the tolerance the root is verified:
+// g maps it back onto r within the tolerance times g', and it is a positive
+// finite radius (another would mirror the point through the principal
+// point). False when the iteration runs out or the root fails the check.
+template <typename G, typename DG>
+bool SolveRadius(double dfRadius, G g, DG dg, double& dfRoot) {
     double r = dfRadius;
     for (int i = 0; i < kNewtonIterations; ++i) {
-        const double dfStep = step(r);
+        const double dfStep = (g(r) - dfRadius) / dg(r);
         r -= dfStep;
         if (std::fabs(dfStep) < kNewtonTolerance) {
             dfRoot = r;
-            return r > 0.0 && std::isfinite(r);
+            return r > 0.0 && std::isfinite(r) &&
+                   std::fabs(g(r) - dfRadius) <= kNewtonTolerance * std::fabs(dg(r));
         }
     }
     return false;
 }
 
 // Ideal radius r -> measured r' for the curvature: r' + c r'^3 = r. dfRadius
-// is the radius of (x, y) and follows it.
-void RemoveCurvature(const RadialCorrections& c, double& x, double& y, double& dfRadius) {
+// is the radius of (x, y) and follows it. False when there is no root.
+bool RemoveCurvature(const RadialCorrections& c, double& x, double& y, double& dfRadius) {
     const double r = dfRadius;
-    if (r == 0.0) return;
+    if (r == 0.0) return true;
     const double k = c.dfCurvature;
     double dfRoot = r;
-    const auto step = [r, k](double s) {
-        const double s2 = s * s;
-        return (s + k * s2 * s - r) / (1.0 + 3.0 * k * s2);
-    };
-    if (SolveRadius(r, step, dfRoot)) ScaleRadius(dfRadius, dfRoot, x, y);
+    const auto g = [k](double s) { return s + k * s * s * s; };
+    const auto dg = [k](double s) { return 1.0 + 3.0 * k * s * s; };
+    if (!SolveRadius(r, g, dg, dfRoot)) return false;
+    ScaleRadius(dfRadius, dfRoot, x, y);
+    return true;
 }
 
 // Ideal radius r -> measured r' for the refraction: r' - K r' (1 + r'^2/f^2) = r.
-void AddRefraction(const RadialCorrections& c, double& x, double& y, double& dfRadius) {
+bool AddRefraction(const RadialCorrections& c, double& x, double& y, double& dfRadius) {
     const double r = dfRadius;
-    if (r == 0.0) return;
+    if (r == 0.0) return true;
     const double K = c.dfRefraction;
     const double dfInvF2 = c.dfInvF2;
     double dfRoot = r;
-    const auto step = [r, K, dfInvF2](double s) {
-        const double s2f = s * s * dfInvF2;
-        return (s - K * s * (1.0 + s2f) - r) / (1.0 - K * (1.0 + 3.0 * s2f));
-    };
-    if (SolveRadius(r, step, dfRoot)) ScaleRadius(dfRadius, dfRoot, x, y);
+    const auto g = [K, dfInvF2](double s) { return s - K * s * (1.0 + s * s * dfInvF2); };
+    const auto dg = [K, dfInvF2](double s) { return 1.0 - K * (1.0 + 3.0 * s * s * dfInvF2); };
+    if (!SolveRadius(r, g, dg, dfRoot)) return false;
+    ScaleRadius(dfRadius, dfRoot, x, y);
+    return true;
 }
 
 bool HasDistortion(const APInfo_t& ap) {
@@ -147,8 +152,10 @@ void Distortion(const APInfo_t& ap, double x, double y, double& dx, double& dy) 
 }
 
 // Finds the measured (x', y') whose distortion brings it to the ideal (x, y)
-// by fixed-point iteration; without an accepted estimate (x, y) stay.
-void AddDistortion(const APInfo_t& ap, double& x, double& y) {
+// by fixed-point iteration; an estimate is accepted only when its distortion
+// lands on (x, y) within the tolerance. False, with (x, y) as they were, when
+// no estimate is accepted.
+bool AddDistortion(const APInfo_t& ap, double& x, double& y) {
     double xs = x;
     double ys = y;
     for (int i = 0; i < kDistortionIterations; ++i) {
@@ -163,13 +170,14 @@ void AddDistortion(const APInfo_t& ap, double& x, double& y) {
                 std::fabs(ys - y) < kDistortionMaxShift) {
                 x = xs;
                 y = ys;
-                return;
+                return true;
             }
             continue;
         }
         xs -= Fx;
         ys -= Fy;
     }
+    return false;
 }
 
 void PhotoToImage(const double* d, double x, double y, double* pdfPixel, double* pdfLine) {
@@ -178,21 +186,81 @@ void PhotoToImage(const double* d, double x, double y, double* pdfPixel, double*
     *pdfLine = d[4] + d[5] * x + d[6] * y + d[7] * xy;
 }
 
-// Ideal photo coordinates to image, without the null-value and finiteness rules.
-void PhotoToImageCorrected(const APInfo_t& ap, double x, double y, double dfZ, double* pdfPixel,
-                           double* pdfLine) {
+// Ideal photo coordinates to measured ones (before the principal point and
+// the fiducial transform): each correction that is on is solved by
+// iteration. False when one of them has no verified solution: the point has
+// no image then, rather than an image without that correction.
+bool IdealToMeasured(const APInfo_t& ap, double dfZ, double& x, double& y) {
     const RadialCorrections c = MakeRadialCorrections(ap, dfZ);
     if (c.bCurvature || c.bRefraction) {
         double r = std::sqrt(x * x + y * y);
-        if (c.bCurvature) RemoveCurvature(c, x, y, r);
-        if (c.bRefraction) AddRefraction(c, x, y, r);
+        if (c.bCurvature && !RemoveCurvature(c, x, y, r)) return false;
+        if (c.bRefraction && !AddRefraction(c, x, y, r)) return false;
     }
-    if (HasDistortion(ap)) AddDistortion(ap, x, y);
+    return !HasDistortion(ap) || AddDistortion(ap, x, y);
+}
+
+// Ideal photo coordinates to image; the null value when the corrections
+// have no solution.
+void PhotoToImageCorrected(const APInfo_t& ap, double x, double y, double dfZ, double* pdfPixel,
+                           double* pdfLine) {
+    if (!IdealToMeasured(ap, dfZ, x, y)) {
+        lumo::SetNullPair(pdfPixel, pdfLine);
+        return;
+    }
     if (ap.bPrincipalPoint != 0) {
         x += ap.dfPrincipalX;
         y += ap.dfPrincipalY;
     }
     PhotoToImage(ap.adfPhotoToImage, x, y, pdfPixel, pdfLine);
+}
+
+// Collinearity: ground to ideal photo coordinates. False for points at the
+// camera's height, in the plane of the perspective centre or behind it.
+bool GroundToIdeal(const APInfo_t& ap, double dfX, double dfY, double dfZ, double& x, double& y) {
+    const double dX = dfX - ap.dfCameraX;
+    const double dY = dfY - ap.dfCameraY;
+    const double dZ = dfZ - ap.dfCameraZ;
+    const double* R = ap.adfRotation;
+    const double N = R[6] * dX + R[7] * dY + R[8] * dZ;
+    // -f/N scales the camera-frame vector onto the photo plane; it is
+    // positive only for points in front of the camera.
+    const double dfScale = -ap.dfFocalLength / N;
+    if (dZ == 0.0 || !(dfScale > 0.0) || !std::isfinite(dfScale)) return false;
+    x = dfScale * (R[0] * dX + R[1] * dY + R[2] * dZ);
+    y = dfScale * (R[3] * dX + R[4] * dY + R[5] * dZ);
+    return true;
+}
+
+// Measured photo coordinates of an image point: the fiducial transform and
+// the principal point.
+void ImageToMeasured(const APInfo_t& ap, double dfPixel, double dfLine, double& x, double& y) {
+    const double* e = ap.adfImageToPhoto;
+    const double pl = dfPixel * dfLine;
+    x = e[0] + e[1] * dfPixel + e[2] * dfLine + e[3] * pl;
+    y = e[4] + e[5] * dfPixel + e[6] * dfLine + e[7] * pl;
+    if (ap.bPrincipalPoint != 0) {
+        x -= ap.dfPrincipalX;
+        y -= ap.dfPrincipalY;
+    }
+}
+
+// The inverse's answer projected forward lands on the measured photo point
+// it came from: within twice the distortion iteration's own tolerance (photo
+// units), or within the inverse tolerance in pixels of the fiducial
+// transform's scale at that point.
+bool ProjectsBack(const APInfo_t& ap, double dfX, double dfY, double dfZ, double xm, double ym) {
+    double x = 0.0;
+    double y = 0.0;
+    if (!GroundToIdeal(ap, dfX, dfY, dfZ, x, y) || !IdealToMeasured(ap, dfZ, x, y)) return false;
+    const double dx = x - xm;
+    const double dy = y - ym;
+    if (lumo::WithinInverseTolerance(dx, dy, 2.0 * kDistortionTolerance)) return true;
+    const double* d = ap.adfPhotoToImage;
+    const double xp = xm + (ap.bPrincipalPoint != 0 ? ap.dfPrincipalX : 0.0);
+    const double yp = ym + (ap.bPrincipalPoint != 0 ? ap.dfPrincipalY : 0.0);
+    return lumo::WithinInverseTolerance((d[1] + d[3] * yp) * dx + (d[2] + d[3] * xp) * dy,
+                                        (d[5] + d[7] * yp) * dx + (d[6] + d[7] * xp) * dy);
 }
 
 // Both outputs finite, or both the null value.
@@ -256,21 +324,12 @@ void APGeo2Img(const APInfo_t* psAP, double dfX, double dfY, double dfZ, double*
     }
     const APInfo_t& ap = *psAP;
     const double Z = GroundHeight(dfZ);
-    const double dX = dfX - ap.dfCameraX;
-    const double dY = dfY - ap.dfCameraY;
-    const double dZ = Z - ap.dfCameraZ;
-    const double* R = ap.adfRotation;
-    const double N = R[6] * dX + R[7] * dY + R[8] * dZ;
-    // -f/N scales the camera-frame vector onto the photo plane; it is
-    // positive only for points in front of the camera. Points at the camera's
-    // height, in the plane of the perspective centre or behind it have no image.
-    const double dfScale = -ap.dfFocalLength / N;
-    if (dZ == 0.0 || !(dfScale > 0.0) || !std::isfinite(dfScale)) {
+    double x = 0.0;
+    double y = 0.0;
+    if (!GroundToIdeal(ap, dfX, dfY, Z, x, y)) {
         lumo::SetNullPair(pdfPixel, pdfLine);
         return;
     }
-    const double x = dfScale * (R[0] * dX + R[1] * dY + R[2] * dZ);
-    const double y = dfScale * (R[3] * dX + R[4] * dY + R[5] * dZ);
     PhotoToImageCorrected(ap, x, y, Z, pdfPixel, pdfLine);
     FiniteOrNull(pdfPixel, pdfLine);
 }
@@ -292,14 +351,9 @@ void APImg2Photo(const APInfo_t* psAP, double dfPixel, double dfLine, double dfZ
         return;
     }
     const APInfo_t& ap = *psAP;
-    const double* e = ap.adfImageToPhoto;
-    const double pl = dfPixel * dfLine;
-    double x = e[0] + e[1] * dfPixel + e[2] * dfLine + e[3] * pl;
-    double y = e[4] + e[5] * dfPixel + e[6] * dfLine + e[7] * pl;
-    if (ap.bPrincipalPoint != 0) {
-        x -= ap.dfPrincipalX;
-        y -= ap.dfPrincipalY;
-    }
+    double x = 0.0;
+    double y = 0.0;
+    ImageToMeasured(ap, dfPixel, dfLine, x, y);
     if (HasDistortion(ap)) {
         double dx = 0.0;
         double dy = 0.0;
@@ -362,7 +416,18 @@ int APImg2GeoDem(const APInfo_t* psAP, double dfPixel, double dfLine, double* pd
     double y = 0.0;
     APImg2Photo(psAP, dfPixel, dfLine, Z, &x, &y);
     APPhoto2Geo(psAP, x, y, Z, pdfX, pdfY);
-    return *pdfX == LUMO_NULL_VALUE ? 0 : 1;
+    if (*pdfX == LUMO_NULL_VALUE) return 0;
+    // The corrections are removed in closed form; beyond the region where the
+    // forward iterations invert them (a distortion that folds over, a
+    // refraction radius past its maximum) that answer is not the model's.
+    double xm = 0.0;
+    double ym = 0.0;
+    ImageToMeasured(*psAP, dfPixel, dfLine, xm, ym);
+    if (!ProjectsBack(*psAP, *pdfX, *pdfY, Z, xm, ym)) {
+        lumo::SetNullPair(pdfX, pdfY);
+        return 0;
+    }
+    return 1;
 }
 
 void APGetModelProj(const APInfo_t* psAP, ProjInfo_t& sProj) {
@@ -383,4 +448,88 @@ void APGetModelProj(const APInfo_t* psAP, ProjInfo_t& sProj) {
     } else {
         SetPixel(sProj);
     }
+}
+
+// ---------------------------------------------------------------------------
+// Validation
+// ---------------------------------------------------------------------------
+
+namespace {
+
+// Largest deviation of R R^T from the identity that still counts as a rotation.
+constexpr double kRotationTolerance = 1e-6;
+
+// Largest |(R R^T - I)_ij|: photo to ground uses R^T as the inverse of R.
+double RotationDeviation(const double* R) {
+    double deviation = 0.0;
+    for (int i = 0; i < 3; ++i) {
+        for (int j = 0; j < 3; ++j) {
+            double dot = 0.0;
+            for (int k = 0; k < 3; ++k) dot += R[3 * i + k] * R[3 * j + k];
+            deviation = std::max(deviation, std::fabs(dot - (i == j ? 1.0 : 0.0)));
+        }
+    }
+    return deviation;
+}
+
+std::string CheckFinite(const APInfo_t& ap) {
+    const double adfScalars[] = {ap.dfFocalLength, ap.dfCameraX,    ap.dfCameraY,
+                                 ap.dfCameraZ,     ap.dfPrincipalX, ap.dfPrincipalY};
+    const char* apszScalars[] = {"dfFocalLength", "dfCameraX",    "dfCameraY",
+                                 "dfCameraZ",     "dfPrincipalX", "dfPrincipalY"};
+    for (int i = 0; i < 6; ++i) {
+        if (!std::isfinite(adfScalars[i])) {
+            return lumo::FieldProblem(apszScalars[i], adfScalars[i], "must be a finite number");
+        }
+    }
+    const struct {
+        const char* pszName;
+        const double* padf;
+        int nCount;
+    } asArrays[] = {{"adfRotation", ap.adfRotation, 9},
+                    {"adfImageToPhoto", ap.adfImageToPhoto, 8},
+                    {"adfPhotoToImage", ap.adfPhotoToImage, 8},
+                    {"adfRadial", ap.adfRadial, 8},
+                    {"adfDecentering", ap.adfDecentering, 4}};
+    for (const auto& a : asArrays) {
+        std::string problem = lumo::FirstNonFinite(a.pszName, a.padf, a.nCount);
+        if (!problem.empty()) return problem;
+    }
+    return "";
+}
+
+// A fiducial transform whose linear part is singular maps the photo onto a line.
+std::string CheckFiducial(const char* pszName, const double* t) {
+    const double det = t[1] * t[6] - t[2] * t[5];
+    if (det != 0.0 && std::isfinite(det)) return "";
+    return lumo::FieldProblem(std::string(pszName) + " determinant", det,
+                              "the linear part of the fiducial transform must be invertible");
+}
+
+}  // namespace
+
+std::string APValidate(const APInfo_t* psAP) {
+    if (psAP == nullptr) return "the record is null";
+    const APInfo_t& ap = *psAP;
+    std::string problem = CheckFinite(ap);
+    if (!problem.empty()) return problem;
+    if (ap.dfFocalLength == 0.0) return lumo::FieldProblem("dfFocalLength", 0.0, "must not be 0");
+    const double deviation = RotationDeviation(ap.adfRotation);
+    if (deviation > kRotationTolerance) {
+        return lumo::FieldProblem(
+            "adfRotation", deviation,
+            "must be a rotation matrix (R R^T = I to 1e-6); this is its largest deviation");
+    }
+    problem = CheckFiducial("adfImageToPhoto", ap.adfImageToPhoto);
+    if (problem.empty()) problem = CheckFiducial("adfPhotoToImage", ap.adfPhotoToImage);
+    if (!problem.empty()) return problem;
+    if (ap.bEarthCurvature != 0 && !(ap.dfEarthRadius > 0.0 && std::isfinite(ap.dfEarthRadius))) {
+        return lumo::FieldProblem("dfEarthRadius", ap.dfEarthRadius,
+                                  "must be positive when the Earth curvature correction is on");
+    }
+    if (ap.bRefraction != 0 && !(ap.dfCameraZ > 0.0)) {
+        return lumo::FieldProblem("dfCameraZ", ap.dfCameraZ,
+                                  "the refraction correction needs a camera above sea level");
+    }
+    return "";
 }

@@ -1,4 +1,6 @@
 // Generic dispatch of point transforms by model code.
+#include <cmath>
+
 #include "lumo_ap.h"
 #include "lumo_dispatch.h"
 #include "lumo_poly.h"
@@ -31,6 +33,19 @@ const nova::mathmodel::IMathModel* AsModelObject(void* pModel) {
     return static_cast<const nova::mathmodel::IMathModel*>(pModel);
 }
 
+// A family that gives the null value, or a value that is not finite, has not
+// mapped the point, whatever status it returns.
+int OnlyPositions(int nResult, double dfA, double dfB) {
+    const bool bPosition = std::isfinite(dfA) && std::isfinite(dfB) && dfA != LUMO_NULL_VALUE &&
+                           dfB != LUMO_NULL_VALUE;
+    return nResult != 0 && bPosition ? 1 : 0;
+}
+
+int DispatchGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
+                    double* pdfPixel, double* pdfLine);
+int DispatchImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, double* pdfZ,
+                       double* pdfX, double* pdfY);
+
 }  // namespace
 
 extern "C" LUMO_API const char* LumoVersion() {
@@ -39,6 +54,20 @@ extern "C" LUMO_API const char* LumoVersion() {
 
 int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ, double* pdfPixel,
                double* pdfLine) {
+    const int nResult = DispatchGeo2Img(nModelCode, pModel, dfX, dfY, dfZ, pdfPixel, pdfLine);
+    return nResult != 0 ? OnlyPositions(nResult, *pdfPixel, *pdfLine) : 0;
+}
+
+int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, double* pdfZ,
+                  double* pdfX, double* pdfY) {
+    const int nResult = DispatchImg2GeoDem(nModelCode, pModel, dfPixel, dfLine, pdfZ, pdfX, pdfY);
+    return nResult != 0 ? OnlyPositions(nResult, *pdfX, *pdfY) : 0;
+}
+
+namespace {
+
+int DispatchGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
+                    double* pdfPixel, double* pdfLine) {
     if (!IsKnownCode(nModelCode)) return 0;
     if (!HasRecordAndOutputs(pModel, pdfPixel, pdfLine)) return 0;
     switch (nModelCode) {
@@ -72,8 +101,8 @@ int GenGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double dfZ,
     return 0;
 }
 
-int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, double* pdfZ,
-                  double* pdfX, double* pdfY) {
+int DispatchImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, double* pdfZ,
+                       double* pdfX, double* pdfY) {
     if (!IsKnownCode(nModelCode)) return 0;
     if (!HasRecordAndOutputs(pModel, pdfX, pdfY) || pdfZ == nullptr) return 0;
     switch (nModelCode) {
@@ -118,6 +147,8 @@ int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLine, d
     }
     return 0;
 }
+
+}  // namespace
 
 int GenImg2Geo(int nModelCode, void* pModel, double dfPixel, double dfLine, double dfZ,
                double* pdfX, double* pdfY) {

@@ -227,6 +227,15 @@ void FillRigorousProjInfo(ProjInfo_t* psP, const SRITInfo_t& sModel) {
     }
 }
 
+// A record its family's validation refuses is not wrapped: the object would
+// report its values as positions.
+void RequireUsable(const std::string& osProblem, int nLine) {
+    if (!osProblem.empty()) {
+        ThrowParameter("pData", ("The model cannot be evaluated: " + osProblem).c_str(),
+                       kFnInitModel, nLine);
+    }
+}
+
 void LogPointFailure(const std::string& osMessage, int nLine) noexcept {
     try {
         if (lumo::TraceOn()) lumo::Trace(1, __FILE__, nLine, "%s", osMessage.c_str());
@@ -336,6 +345,7 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
             oRecord.pfnRelease = &ReleasePoly;
             oRecord.pData = CopyPolyRecord(pData);
             const auto* psPoly = static_cast<const POLYInfo_t*>(oRecord.pData);
+            RequireUsable(POLYValidate(psPoly), __LINE__);
             FillEmpiricalProjInfo(&sQ, FixedText(psPoly->pszGeosys, POLY_GEOSYS_SIZE),
                                   psPoly->psProjInfo);
             eType = LUMO_MODEL_POLY;
@@ -345,6 +355,7 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
             oRecord.pfnRelease = &ReleaseTps;
             oRecord.pData = CopyTpsRecord(pData);
             const auto* psTps = static_cast<const TPSMInfo_t*>(oRecord.pData);
+            RequireUsable(TPSValidate(psTps), __LINE__);
             FillEmpiricalProjInfo(&sQ, FixedText(psTps->pszGeosys, TPS_GEOSYS_SIZE),
                                   psTps->psProjInfo);
             eType = LUMO_MODEL_TPS;

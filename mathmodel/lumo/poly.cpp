@@ -7,6 +7,7 @@
 #include "errors.h"
 #include "lumo_poly.h"
 #include "projection.h"
+#include "record_check.h"
 #include "runtime.h"
 
 namespace {
@@ -176,6 +177,24 @@ void POLYDeallocate(POLYInfo_t* psPoly) {
     std::free(psPoly->padfXCoeffs);
     std::free(psPoly->padfYCoeffs);
     std::free(psPoly);
+}
+
+std::string POLYValidate(const POLYInfo_t* psPoly) {
+    if (psPoly == nullptr || psPoly->padfPixelCoeffs == nullptr ||
+        psPoly->padfLineCoeffs == nullptr || psPoly->padfXCoeffs == nullptr ||
+        psPoly->padfYCoeffs == nullptr) {
+        return "the record or its coefficient arrays are null";
+    }
+    const int n = psPoly->nCoeffs;
+    if (n < 1 || n > POLY_MAX_COEFFS) {
+        return lumo::FieldProblem("nCoeffs", n, "the model has 1 to 21 terms");
+    }
+    std::string problem = lumo::FirstNonFinite("padfPixelCoeffs", psPoly->padfPixelCoeffs, n);
+    if (problem.empty())
+        problem = lumo::FirstNonFinite("padfLineCoeffs", psPoly->padfLineCoeffs, n);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfXCoeffs", psPoly->padfXCoeffs, n);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfYCoeffs", psPoly->padfYCoeffs, n);
+    return problem;
 }
 
 void POLYGeo2Img(const POLYInfo_t* psPoly, double dfX, double dfY, double* pdfPixel,

@@ -292,7 +292,10 @@ RFInfo_t* LumoBinaryToRFInfo(int nLength, unsigned char* pabyBlock) {
     const int nTerms = bCurrentLayout ? ScanIntField(pabyBlock, kNumericAt, kTermsWidth)
                                       : ScanIntField(pabyBlock, kNumericAt, kOldIntWidth);
     // Each coefficient block has room for the model's 20 terms and no more.
-    if (nTerms < 0 || nTerms > RF_MAX_TERMS) return nullptr;
+    if (nTerms < 0 || nTerms > RF_MAX_TERMS) {
+        lumo::WarnReal(lumo::Err::kBadArgument, "Rational function block nTerms", nTerms, 0);
+        return nullptr;
+    }
 
     RecordPtr psRF(RFAllocate(nullptr, nTerms), &RFDeallocate);
     psRF->nHalfPixelShift = ScanIntField(pabyBlock, kShiftFlagAt, 1);
@@ -314,5 +317,11 @@ RFInfo_t* LumoBinaryToRFInfo(int nLength, unsigned char* pabyBlock) {
     ReadCoefficients(pabyBlock, kLineNumAt, nTerms, psRF->padfLineNum);
     ReadCoefficients(pabyBlock, kLineDenAt, nTerms, psRF->padfLineDen);
     ReadGeoreferencing(pabyBlock, psRF.get());
+    // A block is read only into a model that can be evaluated.
+    const std::string osProblem = RFValidate(psRF.get());
+    if (!osProblem.empty()) {
+        lumo::Warn(lumo::Err::kBadArgument, ("Rational function block: " + osProblem).c_str());
+        return nullptr;
+    }
     return psRF.release();
 }

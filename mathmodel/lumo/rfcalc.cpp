@@ -8,8 +8,10 @@
 #include <memory>
 
 #include "errors.h"
+#include "inverse_check.h"
 #include "lumo_rf.h"
 #include "projection.h"
+#include "record_check.h"
 #include "runtime.h"
 
 namespace {
@@ -210,21 +212,41 @@ inline Ratios EvaluateSums(const RFInfo_t* psRF, const double* t) {
 }
 
 // Image position the rational functions give, before the adjustment or the
-// half-pixel shift.
-inline void RationalImage(const RFInfo_t* psRF, double u, double v, double w, double* pdfPixel,
+// half-pixel shift. False where a denominator vanishes (a pole of the model:
+// no image position there) or the result is not finite.
+inline bool RationalImage(const RFInfo_t* psRF, double u, double v, double w, double* pdfPixel,
                           double* pdfLine) {
     TermSet sTerms;
     FormTerms(u, v, w, sTerms.t);
-    Ratios r = EvaluateSums(psRF, sTerms.t);
-    if (r.dfPixelDen == 0.0) r.dfPixelDen = 1.0;
-    if (r.dfLineDen == 0.0) r.dfLineDen = 1.0;
+    const Ratios r = EvaluateSums(psRF, sTerms.t);
+    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return false;
     *pdfPixel = r.dfPixelNum / r.dfPixelDen * psRF->dfPixelScale + psRF->dfPixelOffset;
     *pdfLine = r.dfLineNum / r.dfLineDen * psRF->dfLineScale + psRF->dfLineOffset;
+    return std::isfinite(*pdfPixel) && std::isfinite(*pdfLine);
+}
+
+bool IsGeographic(const RFInfo_t* psRF) {
+    return psRF->psProjInfo != nullptr && psRF->psProjInfo->nProjKind == NOVA_PROJ_GEOGRAPHIC;
+}
+
+// A ground position an inverse may give: for geographic models a latitude
+// within +-90 degrees and a longitude within half a turn of the model's.
+bool IsPlaceOnEarth(const RFInfo_t* psRF, double dfX, double dfY) {
+    if (!std::isfinite(dfX) || !std::isfinite(dfY)) return false;
+    if (!IsGeographic(psRF)) return true;
+    return std::fabs(dfY) <= 90.0 && std::fabs(dfX - psRF->dfXOffset) <= 180.0;
 }
 
 // Adjustment polynomial a0 + a1 p + a2 l + a3 p l + a4 p^2 + a5 l^2.
 inline double Adjustment(const double* a, double p, double l) {
     return a[0] + a[1] * p + a[2] * l + a[3] * p * l + a[4] * p * p + a[5] * l * l;
+}
+
+// The failure values of the inverse: both ground coordinates the null value.
+int NoGroundPoint(double* pdfX, double* pdfY) {
+    *pdfX = LUMO_NULL_VALUE;
+    *pdfY = LUMO_NULL_VALUE;
+    return 0;
 }
 
 // Places a new record's contents into the caller's record, or hands the new
@@ -307,7 +329,11 @@ void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPi
     const double w = (dfZ - psRF->dfZOffset) / psRF->dfZScale;
     double p = 0.0;
     double l = 0.0;
-    RationalImage(psRF, u, v, w, &p, &l);
+    if (!RationalImage(psRF, u, v, w, &p, &l)) {
+        *pdfPixel = LUMO_NULL_VALUE;
+        *pdfLine = LUMO_NULL_VALUE;
+        return;
+    }
     if (psRF->nAdjust) {
         *pdfPixel = p + Adjustment(psRF->adfPixelAdjust, p, l);
         *pdfLine = l + Adjustment(psRF->adfLineAdjust, p, l);
@@ -372,12 +398,12 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
     }
     if (!IsEvaluable(psRF)) {
         ReportUnusableRecord(psRF);
-        return 0;
+        return NoGroundPoint(pdfX, pdfY);
     }
     if (!std::isfinite(dfPixel) || !std::isfinite(dfLine)) {
         lumo::WarnReal(lumo::Err::kBadArgument, std::isfinite(dfPixel) ? "line" : "pixel",
                        std::isfinite(dfPixel) ? dfLine : dfPixel, 0);
-        return 0;
+        return NoGroundPoint(pdfX, pdfY);
     }
     const double dfHeight = *pdfZ == LUMO_NULL_VALUE ? psRF->dfZOffset : *pdfZ;
     const double dfStartX = (*pdfX == 0.0 || *pdfX == LUMO_NULL_VALUE) ? psRF->dfXOffset : *pdfX;
@@ -388,7 +414,7 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
             !std::isfinite(dfHeight) ? "height" : "starting ground coordinate",
             !std::isfinite(dfHeight) ? dfHeight : (std::isfinite(dfStartX) ? dfStartY : dfStartX),
             0);
-        return 0;
+        return NoGroundPoint(pdfX, pdfY);
     }
 
     // Remove the image-space adjustment or the half-pixel shift.
@@ -419,7 +445,143 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
     }
 
     *pdfZ = dfHeight;
-    *pdfX = WrapLongitude(u * psRF->dfXScale + psRF->dfXOffset, psRF->dfXOffset);
-    *pdfY = v * psRF->dfYScale + psRF->dfYOffset;
+    // The iteration may stop on its step limit, on a singular step, or on a
+    // small step far from any solution: its answer counts only when the
+    // rational functions map it back onto the image point asked for, and it
+    // is a place on the Earth.
+    double pBack = 0.0;
+    double lBack = 0.0;
+    const double dfX = WrapLongitude(u * psRF->dfXScale + psRF->dfXOffset, psRF->dfXOffset);
+    const double dfY = v * psRF->dfYScale + psRF->dfYOffset;
+    if (!RationalImage(psRF, u, v, w, &pBack, &lBack) ||
+        !lumo::WithinInverseTolerance(pBack - p, lBack - l) || !IsPlaceOnEarth(psRF, dfX, dfY)) {
+        return NoGroundPoint(pdfX, pdfY);
+    }
+    *pdfX = dfX;
+    *pdfY = dfY;
     return 1;
+}
+
+// ---------------------------------------------------------------------------
+// Validation
+// ---------------------------------------------------------------------------
+
+namespace {
+
+// Bounds of the normalisation: what a real image and a real place can have.
+constexpr double kMaxImageExtent = 1e9;   // pixels and lines
+constexpr double kMaxGroundExtent = 1e9;  // projected ground units
+constexpr double kMaxHeightExtent = 1e5;  // metres
+// Largest normalised image value the functions may give inside their own
+// ground cube, where real models stay within about +-1.
+constexpr double kMaxNormalisedImage = 1e3;
+
+// An offset within +-dfOffsetLimit and a non-zero scale within +-dfScaleLimit.
+std::string CheckNormalisation(const char* pszOffset, double dfOffset, const char* pszScale,
+                               double dfScale, double dfOffsetLimit, double dfScaleLimit,
+                               const char* pszDomain) {
+    if (!(std::fabs(dfOffset) <= dfOffsetLimit)) {
+        return lumo::FieldProblem(
+            pszOffset, dfOffset,
+            nova::FormatString("an offset must be finite and lie within +-%g (%s)", dfOffsetLimit,
+                               pszDomain));
+    }
+    if (dfScale == 0.0 || !(std::fabs(dfScale) <= dfScaleLimit)) {
+        return lumo::FieldProblem(
+            pszScale, dfScale,
+            nova::FormatString("a scale must be non-zero and lie within +-%g (%s)", dfScaleLimit,
+                               pszDomain));
+    }
+    return "";
+}
+
+std::string CheckNormalisations(const RFInfo_t& rf) {
+    const bool bGeographic = IsGeographic(&rf);
+    const struct {
+        const char *pszOffset, *pszScale;
+        double dfOffset, dfScale, dfOffsetLimit, dfScaleLimit;
+        const char* pszDomain;
+    } asChecks[] = {
+        {"dfXOffset", "dfXScale", rf.dfXOffset, rf.dfXScale, bGeographic ? 360.0 : kMaxGroundExtent,
+         bGeographic ? 180.0 : kMaxGroundExtent,
+         bGeographic ? "degrees of longitude" : "ground units"},
+        {"dfYOffset", "dfYScale", rf.dfYOffset, rf.dfYScale, bGeographic ? 90.0 : kMaxGroundExtent,
+         bGeographic ? 90.0 : kMaxGroundExtent,
+         bGeographic ? "degrees of latitude" : "ground units"},
+        {"dfZOffset", "dfZScale", rf.dfZOffset, rf.dfZScale, kMaxHeightExtent, kMaxHeightExtent,
+         "metres of height"},
+        {"dfPixelOffset", "dfPixelScale", rf.dfPixelOffset, rf.dfPixelScale, kMaxImageExtent,
+         kMaxImageExtent, "pixels"},
+        {"dfLineOffset", "dfLineScale", rf.dfLineOffset, rf.dfLineScale, kMaxImageExtent,
+         kMaxImageExtent, "lines"},
+    };
+    for (const auto& c : asChecks) {
+        std::string problem = CheckNormalisation(c.pszOffset, c.dfOffset, c.pszScale, c.dfScale,
+                                                 c.dfOffsetLimit, c.dfScaleLimit, c.pszDomain);
+        if (!problem.empty()) return problem;
+    }
+    return "";
+}
+
+// The functions must be evaluable over their own ground cube: at its 27
+// nodes (normalised -1, 0, 1 on each axis) both denominators are non-zero
+// and keep one sign (a sign change puts a pole inside the model's domain),
+// and the normalised image values stay bounded.
+std::string CheckDomain(const RFInfo_t& rf) {
+    const int nTerms = UsableTerms(&rf);
+    if (std::all_of(rf.padfPixelDen, rf.padfPixelDen + nTerms, [](double c) { return c == 0.0; })) {
+        return "padfPixelDen: every coefficient is 0, so the pixel denominator vanishes everywhere";
+    }
+    if (std::all_of(rf.padfLineDen, rf.padfLineDen + nTerms, [](double c) { return c == 0.0; })) {
+        return "padfLineDen: every coefficient is 0, so the line denominator vanishes everywhere";
+    }
+    double dfPixelSign = 0.0, dfLineSign = 0.0;
+    for (int k = 0; k < 27; ++k) {
+        const int nU = k % 3, nV = (k / 3) % 3, nW = k / 9;  // node indices 0..2
+        const double u = nU - 1.0, v = nV - 1.0, w = nW - 1.0;
+        TermSet sTerms;
+        FormTerms(u, v, w, sTerms.t);
+        const Ratios r = EvaluateSums(&rf, sTerms.t);
+        const double p = r.dfPixelNum / r.dfPixelDen, l = r.dfLineNum / r.dfLineDen;
+        if (dfPixelSign == 0.0) dfPixelSign = r.dfPixelDen;
+        if (dfLineSign == 0.0) dfLineSign = r.dfLineDen;
+        const bool bPoles =
+            !(r.dfPixelDen * dfPixelSign > 0.0) || !(r.dfLineDen * dfLineSign > 0.0);
+        if (bPoles || !(std::fabs(p) <= kMaxNormalisedImage) ||
+            !(std::fabs(l) <= kMaxNormalisedImage)) {
+            return nova::FormatString(
+                "at the normalised ground point (%g, %g, %g) the functions give pixel %.6g / %.6g "
+                "and line %.6g / %.6g: %s",
+                u, v, w, r.dfPixelNum, r.dfPixelDen, r.dfLineNum, r.dfLineDen,
+                bPoles ? "a denominator vanishes or changes sign inside the model's domain"
+                       : "not a bounded image position");
+        }
+    }
+    return "";
+}
+
+}  // namespace
+
+std::string RFValidate(const RFInfo_t* psRF) {
+    if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
+        psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
+        return "the record or its coefficient arrays are null";
+    }
+    const RFInfo_t& rf = *psRF;
+    if (rf.nTerms < 1 || rf.nTerms > RF_MAX_TERMS) {
+        return lumo::FieldProblem("nTerms", rf.nTerms, "the model has 1 to 20 terms");
+    }
+    std::string problem = CheckNormalisations(rf);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfPixelNum", rf.padfPixelNum, rf.nTerms);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfPixelDen", rf.padfPixelDen, rf.nTerms);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfLineNum", rf.padfLineNum, rf.nTerms);
+    if (problem.empty()) problem = lumo::FirstNonFinite("padfLineDen", rf.padfLineDen, rf.nTerms);
+    if (problem.empty() && rf.nAdjust) {
+        problem = lumo::FirstNonFinite("adfPixelAdjust", rf.adfPixelAdjust, RF_ADJUST_TERMS);
+        if (problem.empty()) {
+            problem = lumo::FirstNonFinite("adfLineAdjust", rf.adfLineAdjust, RF_ADJUST_TERMS);
+        }
+    }
+    if (problem.empty()) problem = CheckDomain(rf);
+    return problem;
 }

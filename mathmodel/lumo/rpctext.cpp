@@ -352,6 +352,15 @@ RpcValues ReadRpb(const std::string& osText, const std::string& osSource) {
 // Record
 // ---------------------------------------------------------------------------
 
+// The record when it can be evaluated; else it is released and the reason
+// thrown, naming the record field.
+RFInfo_t* CheckedRecord(RFInfo_t* psRF, const std::string& osSource) {
+    const std::string osProblem = RFValidate(psRF);
+    if (osProblem.empty()) return psRF;
+    RFDeallocate(psRF);
+    RPC_FAIL(osSource + ": the model cannot be evaluated: " + osProblem);
+}
+
 RFInfo_t* ValuesToRecord(const RpcValues& values) {
     std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)> psRF(RFAllocate(nullptr, RF_MAX_TERMS),
                                                         &RFDeallocate);
@@ -516,16 +525,20 @@ RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nFor
     if (pszText == nullptr) RPC_FAIL(osSource + ": no text");
     if (nForm == LUMO_RPC_TEXT_AUTO) nForm = LumoDetectRPCTextForm(pszText, nLength);
     const std::string osText(pszText, nLength);
+    RFInfo_t* psRF = nullptr;
     switch (nForm) {
         case LUMO_RPC_TEXT_TXT:
-            return ValuesToRecord(ReadTxt(osText, osSource));
+            psRF = ValuesToRecord(ReadTxt(osText, osSource));
+            break;
         case LUMO_RPC_TEXT_RPB:
-            return ValuesToRecord(ReadRpb(osText, osSource));
+            psRF = ValuesToRecord(ReadRpb(osText, osSource));
+            break;
         default:
             RPC_FAIL(osSource +
                      ": not RPC text (neither \"KEY: value\" lines nor \"name = value;\" "
                      "statements)");
     }
+    return CheckedRecord(psRF, osSource);
 }
 
 std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm) {

@@ -14,6 +14,7 @@
 #include "lumo_tps.h"
 #include "null_value.h"
 #include "projection.h"
+#include "record_check.h"
 #include "regression.h"
 #include "runtime.h"
 
@@ -492,6 +493,52 @@ void TPSDeallocate(TPSMInfo_t* psModel) {
     TRNDeallocate(psModel->psGeoToImage);
     TRNDeallocate(psModel->psImageToGeo);
     std::free(psModel);
+}
+
+namespace {
+
+// One direction: a fitted spline whose arrays hold its points and
+// coefficients, all finite.
+std::string CheckDirection(const TRNInfo_t* psTrn, const std::string& osName) {
+    if (psTrn == nullptr || psTrn->nType != TRN_TPS || psTrn->pModel == nullptr) {
+        return osName + ": the direction holds no spline";
+    }
+    if (psTrn->bCalculated == 0) {
+        return lumo::FieldProblem(osName + ".bCalculated", 0,
+                                  "the direction was never fitted (it would give zeros)");
+    }
+    const auto& spline = *static_cast<const TPSInfo_t*>(psTrn->pModel);
+    if (spline.nCPs < 0 || spline.nCPs > spline.nAllocCPs) {
+        return lumo::FieldProblem(
+            osName + ".nCPs", spline.nCPs,
+            "must lie in 0.." + std::to_string(spline.nAllocCPs) + " (the points the arrays hold)");
+    }
+    if (spline.padfCoefX == nullptr || spline.padfCoefY == nullptr ||
+        (spline.nCPs > 0 && (spline.padfCPX == nullptr || spline.padfCPY == nullptr))) {
+        return osName + ": the spline's arrays are null";
+    }
+    const std::string osPrefix = osName + ".";
+    std::string problem =
+        lumo::FirstNonFinite((osPrefix + "padfCoefX").c_str(), spline.padfCoefX, spline.nCPs + 3);
+    if (problem.empty()) {
+        problem = lumo::FirstNonFinite((osPrefix + "padfCoefY").c_str(), spline.padfCoefY,
+                                       spline.nCPs + 3);
+    }
+    if (problem.empty()) {
+        problem = lumo::FirstNonFinite((osPrefix + "padfCPX").c_str(), spline.padfCPX, spline.nCPs);
+    }
+    if (problem.empty()) {
+        problem = lumo::FirstNonFinite((osPrefix + "padfCPY").c_str(), spline.padfCPY, spline.nCPs);
+    }
+    return problem;
+}
+
+}  // namespace
+
+std::string TPSValidate(const TPSMInfo_t* psModel) {
+    if (psModel == nullptr) return "the record is null";
+    const std::string problem = CheckDirection(psModel->psGeoToImage, "psGeoToImage");
+    return problem.empty() ? CheckDirection(psModel->psImageToGeo, "psImageToGeo") : problem;
 }
 
 // A point the spline cannot map (not finite, or no fit) has no position:

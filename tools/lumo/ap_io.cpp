@@ -13,9 +13,6 @@ namespace {
 
 using nlohmann::json;
 
-// Largest deviation of R R^T from the identity that still counts as a rotation.
-constexpr double kRotationTolerance = 1e-6;
-
 // Arrays under "ap" name a bad item by its index in the field.
 const ArrayFormat kApArray{ArrayWording::kLengthAndValue, ItemWording::kIndexedField, ""};
 
@@ -47,37 +44,9 @@ void GetCorrections(const json& section, APInfo_t& ap, const FieldContext& ctx) 
     ap.bRefraction = GetFlag(*corrections, "refraction", flags);
 }
 
-// Largest |(R R^T - I)_ij|: photo to ground uses R^T as the inverse of R.
-double RotationDeviation(const double* R) {
-    double deviation = 0.0;
-    for (int i = 0; i < 3; ++i) {
-        for (int j = 0; j < 3; ++j) {
-            double dot = 0.0;
-            for (int k = 0; k < 3; ++k) dot += R[3 * i + k] * R[3 * j + k];
-            deviation = std::max(deviation, std::fabs(dot - (i == j ? 1.0 : 0.0)));
-        }
-    }
-    return deviation;
-}
-
 // Names item k of a written array as `"name" item k`.
 ItemLabel ApItem(const char* name) {
     return ItemLabel{Quoted(name) + " item ", ""};
-}
-
-void ValidateGeometry(const APInfo_t& ap, const FieldContext& ctx) {
-    if (ap.dfFocalLength == 0.0) ctx.Fail("focalLength", "must not be 0");
-    const double deviation = RotationDeviation(ap.adfRotation);
-    if (deviation > kRotationTolerance) {
-        ctx.Fail("rotation", "must be a rotation matrix (R R^T = I to " +
-                                 FormatDouble(kRotationTolerance) + "), deviates by " +
-                                 FormatDouble(deviation));
-    }
-    if (ap.bEarthCurvature != 0 && !(ap.dfEarthRadius > 0.0)) {
-        ctx.Fail("earthRadius",
-                 "must be positive when the Earth curvature correction is on, found " +
-                     FormatDouble(ap.dfEarthRadius));
-    }
 }
 
 }  // namespace
@@ -104,7 +73,6 @@ ApPtr ApFromJson(const ModelEnvelope& envelope, const json& section) {
         ap->dfEarthRadius = GetFiniteNumber(section, "earthRadius", ctx);
     }
     GetCorrections(section, *ap, ctx);
-    ValidateGeometry(*ap, ctx);
 
     CopyText(envelope.osGeosys, ap->pszGeosys, AP_GEOSYS_SIZE, "geosys",
              FieldContext{envelope.osSource, ""});
@@ -113,6 +81,7 @@ ApPtr ApFromJson(const ModelEnvelope& envelope, const json& section) {
                  AP_GEOSYS_SIZE, "conformalGeosys", ctx);
     }
     EnvelopeToProjInfo(envelope, ap->psProjInfo);
+    RequireValidRecord(envelope, "ap", APValidate(ap.get()));
     return ap;
 }
 

@@ -111,6 +111,13 @@ LoadedModel ReadModelFileOf(const std::string& path, const char* pszFamily) {
     return ReadModel(document, path);
 }
 
+void RequireValidRecord(const ModelEnvelope& envelope, const char* pszFamily,
+                        const std::string& problem) {
+    if (problem.empty()) return;
+    LUMO_CLI_FAIL(envelope.osSource + ": field " + Quoted(pszFamily) +
+                  ": the model cannot be evaluated: " + problem);
+}
+
 void EnvelopeToProjInfo(const ModelEnvelope& envelope, ProjInfo_t* psProjInfo) {
     if (Geosys2ProjInfo(psProjInfo, envelope.osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
         LUMO_CLI_FAIL(envelope.osSource + ": field \"geosys\": unknown georeferencing text " +
@@ -139,6 +146,7 @@ PolyPtr PolyFromJson(const ModelEnvelope& envelope, const json& section) {
     GetFiniteArray(section, "xCoeffs", count, poly->padfXCoeffs, ctx, format);
     GetFiniteArray(section, "yCoeffs", count, poly->padfYCoeffs, ctx, format);
     EnvelopeToProjInfo(envelope, poly->psProjInfo);
+    RequireValidRecord(envelope, "poly", POLYValidate(poly.get()));
     return poly;
 }
 

@@ -76,6 +76,11 @@ std::shared_ptr<void> SharePolyRecord(PolyPtr poly);
 nlohmann::json MakeEnvelope(const char* pszFamily, const char* pszGeosys,
                             const ProjInfo_t* psProjInfo, int nPixels, int nLines);
 
+// Refuses a model whose record the family's validation found unusable
+// (`problem` names the record field and value; empty: nothing to refuse).
+void RequireValidRecord(const ModelEnvelope& envelope, const char* pszFamily,
+                        const std::string& problem);
+
 // Fills a projection description from the envelope's georeferencing text and
 // parameter text.
 void EnvelopeToProjInfo(const ModelEnvelope& envelope, ProjInfo_t* psProjInfo);

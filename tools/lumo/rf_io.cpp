@@ -22,13 +22,6 @@ int OptionalInt(const json& section, const char* name, int minimum, int maximum,
     return section.contains(name) ? GetInt(section, name, minimum, maximum, ctx) : fallback;
 }
 
-// A scale the transform divides by.
-double GetScale(const json& section, const char* name, const FieldContext& ctx) {
-    const double scale = GetFiniteNumber(section, name, ctx);
-    if (scale == 0.0) ctx.Fail(name, "must not be 0");
-    return scale;
-}
-
 }  // namespace
 
 RFPtr RFFromJson(const ModelEnvelope& envelope, const json& section) {
@@ -43,15 +36,15 @@ RFPtr RFFromJson(const ModelEnvelope& envelope, const json& section) {
     rf->nExtra1 = OptionalInt(section, "extra1", kIntMin, kIntMax, 0, ctx);
     rf->nExtra2 = OptionalInt(section, "extra2", kIntMin, kIntMax, 0, ctx);
     rf->dfXOffset = GetFiniteNumber(section, "xOffset", ctx);
-    rf->dfXScale = GetScale(section, "xScale", ctx);
+    rf->dfXScale = GetFiniteNumber(section, "xScale", ctx);
     rf->dfYOffset = GetFiniteNumber(section, "yOffset", ctx);
-    rf->dfYScale = GetScale(section, "yScale", ctx);
+    rf->dfYScale = GetFiniteNumber(section, "yScale", ctx);
     rf->dfZOffset = GetFiniteNumber(section, "zOffset", ctx);
-    rf->dfZScale = GetScale(section, "zScale", ctx);
+    rf->dfZScale = GetFiniteNumber(section, "zScale", ctx);
     rf->dfPixelOffset = GetFiniteNumber(section, "pixelOffset", ctx);
-    rf->dfPixelScale = GetScale(section, "pixelScale", ctx);
+    rf->dfPixelScale = GetFiniteNumber(section, "pixelScale", ctx);
     rf->dfLineOffset = GetFiniteNumber(section, "lineOffset", ctx);
-    rf->dfLineScale = GetScale(section, "lineScale", ctx);
+    rf->dfLineScale = GetFiniteNumber(section, "lineScale", ctx);
     rf->nAdjust = OptionalInt(section, "adjust", 0, 1, 0, ctx);
     // The adjustment terms are kept when given, in force or not.
     if (rf->nAdjust || section.contains("pixelAdjust") || section.contains("lineAdjust")) {
@@ -70,6 +63,7 @@ RFPtr RFFromJson(const ModelEnvelope& envelope, const json& section) {
     CopyText(envelope.osGeosys, rf->pszGeosys, RF_TEXT_SIZE, "geosys",
              FieldContext{envelope.osSource, ""});
     EnvelopeToProjInfo(envelope, rf->psProjInfo);
+    RequireValidRecord(envelope, kFamily, RFValidate(rf.get()));
     return rf;
 }
 

@@ -77,7 +77,7 @@ InputModel ReadBinary(const std::string& path, const std::string& contents) {
     }
     std::string block = contents.substr(0, RF_BINARY_SIZE);
     RFPtr rf(LumoBinaryToRFInfo(RF_BINARY_SIZE, reinterpret_cast<unsigned char*>(&block[0])));
-    if (!rf) LUMO_CLI_FAIL(path + ": the block's term count lies outside 0..20");
+    if (!rf) LUMO_CLI_FAIL(path + ": " + nova::GetLastErrorReport().osText);
     InputModel model;
     model.psRF = rf.get();
     model.poOwner = ShareRFRecord(std::move(rf));

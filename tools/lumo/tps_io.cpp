@@ -85,6 +85,7 @@ TpsPtr TpsFromJson(const ModelEnvelope& envelope, const json& section) {
     ReadDirection(section, kGeoToImage, where, tps->psGeoToImage);
     ReadDirection(section, kImageToGeo, where, tps->psImageToGeo);
     EnvelopeToProjInfo(envelope, tps->psProjInfo);
+    RequireValidRecord(envelope, "tps", TPSValidate(tps.get()));
     return tps;
 }
 
