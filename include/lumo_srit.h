@@ -9,6 +9,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string>
 
 #include "lumo_types.h"
 
@@ -63,6 +64,12 @@ LUMO_API SRITInfo_t* SRITAllocate();
 LUMO_API void SRITCopy(SRITInfo_t* psDst, const SRITInfo_t* psSrc);
 // Releases a record with everything it owns. Null is ignored.
 LUMO_API void LumoFreeSRITInfo(SRITInfo_t* psModel);
+// Why a record cannot be evaluated, naming the field and its value; empty
+// when it can: finite coefficients, c0 (twice the Earth's radius of
+// curvature) within 1e7..1.5e7 m, non-zero divisors c2, c11, c12, c6 in
+// (0, 1], and a segment EphemerisSegValidate accepts. Every reader of a
+// model file runs it.
+LUMO_API std::string SRITValidate(const SRITInfo_t* psModel);
 
 // ---------------------------------------------------------------------------
 // Computation. (padfA, padfB) are image (pixel, line) and (padfC, padfD)
@@ -140,7 +147,9 @@ int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsMo
 // projection; LUMO_NULL_VALUE marks "no value".
 // ---------------------------------------------------------------------------
 
-// Ground (X, Y, elevation Z) to image pixel and line.
+// Ground (X, Y, elevation Z) to image pixel and line. For model class 6 the
+// radar refinement must close to 10 ground units within its four rounds;
+// otherwise both outputs are LUMO_NULL_VALUE.
 LUMO_API void SRITGeo2Img(const SRITInfo_t* psModel, double dfX, double dfY, double dfZ,
                           double* pdfPixel, double* pdfLine);
 LUMO_API void SRITGeo2Img_imp(const SRITInfo_t* psModel, double dfX, double dfY, double dfZ,

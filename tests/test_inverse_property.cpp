@@ -70,6 +70,37 @@ TEST(InverseProperty, RationalFunctions) {
     EXPECT_LT(share, 1.0);  // and far points do fail
 }
 
+// The rigorous model's iterative ground-to-image forms, checked by its
+// image-to-ground equations.
+TEST(InverseProperty, RigorousExactFormAndRadarRefinement) {
+    const lumo::cli::LoadedModel model =
+        lumo::cli::ReadModelFile(kExamples + "srit_spot5_roll20.json");
+    auto* psModel = static_cast<SRITInfo_t*>(model.poRecord.get());
+    const Map backToGround = [&](double p, double l, double z, double* x, double* y) {
+        return SRITImg2Geo_imp(psModel, p, l, z, x, y) == 1;
+    };
+    const double size = psModel->psEphemeris->dfPixelRes;
+    const double half = size * model.sEnvelope.nPixels / 2.0;
+    const Start centre{psModel->adfCoef[16], psModel->adfCoef[17], 500.0};
+    // The exact form: back within 1e-3 of a pixel's ground size.
+    const Map exact = [&](double x, double y, double z, double* p, double* l) {
+        return SRITGeo2ImgExact(psModel, x, y, z, p, l) == 1;
+    };
+    double share =
+        SuccessesProjectBack(centre, {half, half, 500.0}, exact, backToGround, 1e-3 * size);
+    EXPECT_GT(share, 0.3);
+    EXPECT_LT(share, 1.0);
+    // The radar class refines until the ground closes to 10 units.
+    psModel->nModelClass = 6;
+    const Map refined = [&](double x, double y, double z, double* p, double* l) {
+        SRITGeo2Img(psModel, x, y, z, p, l);
+        return *p != LUMO_NULL_VALUE;
+    };
+    share = SuccessesProjectBack(centre, {half, half, 500.0}, refined, backToGround, 10.0);
+    EXPECT_GT(share, 0.3);
+    EXPECT_LT(share, 1.0);
+}
+
 TEST(InverseProperty, AerialPhoto) {
     const double share = ImageInverseIsHonest("ap_frame_utm31.json", 100.0, 100.0);
     EXPECT_GT(share, 0.3);

@@ -67,6 +67,10 @@ TEST(RecordValidation, ModelFilesOfEveryFamily) {
                   {{[](json& d) { d["tps"]["imageToGeo"]["calculated"] = false; },
                     "psImageToGeo.bCalculated = 0"}},
                   ReadModelDocument);
+    ExpectRefused("srit_spot5_roll20.json",
+                  {{[](json& d) { d["srit"]["coefficients"][12] = 0; }, "adfCoef[12] = 0"},
+                   {[](json& d) { d["srit"]["segment"]["nNumLines"] = -1; }, "nNumLines = -1"}},
+                  ReadModelDocument);
     ExpectRefused("segment_optical_attitude.json",
                   {{[](json& d) { d["nNumLines"] = -1; }, "nNumLines = -1"},
                    {[](json& d) { d["nNumPixels"] = 2000000000; }, "nNumPixels = 2000000000"}},

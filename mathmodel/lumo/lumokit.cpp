@@ -334,6 +334,7 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
             oRecord.pfnRelease = &ReleaseSrit;
             oRecord.pData = CopySritRecord(pData);
             const auto* psSrit = static_cast<const SRITInfo_t*>(oRecord.pData);
+            RequireUsable(SRITValidate(psSrit), __LINE__);
             mnDownsampleFactor = psSrit->anAux[0];
             FillRigorousProjInfo(&sP, *psSrit);
             bRigorous = true;

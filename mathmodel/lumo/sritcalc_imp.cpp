@@ -92,10 +92,20 @@ void SRITGeo2Img_imp(const SRITInfo_t* psModel, double dfX, double dfY, double d
     if (m.sSelect.bRadarLike) {
         // Refine with the inverse until the ground closes to 10 ground
         // units, at most four rounds.
-        for (int nRound = 0; nRound < 4; ++nRound) {
+        for (int nRound = 0;; ++nRound) {
             const GroundTerms s = GroundOf(m, dfPixel, dfLine, dfZ);
             const double dX = s.dfX - dfX, dY = s.dfY - dfY;
-            if (std::abs(dX) < 10.0 && std::abs(dY) < 10.0) {
+            const bool bClosed = std::abs(dX) < 10.0 && std::abs(dY) < 10.0;
+            if (nRound == 4) {
+                // The fourth round's answer is checked the same way: one that
+                // does not close is no image position.
+                if (!bClosed) {
+                    lumo::SetNullPair(pdfPixel, pdfLine);
+                    return;
+                }
+                break;
+            }
+            if (bClosed) {
                 *pdfPixel = dfPixel;
                 *pdfLine = dfLine;
                 return;

@@ -39,17 +39,6 @@ void ReadText(const json& section, const char* pszName, char* pszTarget, std::si
     std::copy(text.begin(), text.end(), pszTarget);  // the field is zero-filled
 }
 
-// The coefficients that the transforms divide by must not be zero.
-void CheckDivisors(const double* c, const FieldContext& ctx) {
-    const int anDivisors[] = {0, 2, 6, 11, 12};
-    for (int k : anDivisors) {
-        if (c[k] == 0.0) {
-            ctx.Fail("coefficients",
-                     "item " + std::to_string(k) + " is 0, but the model divides by it");
-        }
-    }
-}
-
 // Per-line arrays of the record, as a computation leaves them: the columns of
 // a "PLA"/"MLA" segment's attitude table.
 void FillLineArrays(SRITInfo_t& model) {
@@ -85,7 +74,6 @@ SritPtr SritFromJson(const ModelEnvelope& envelope, const json& section) {
     SritPtr model(SRITAllocate());
     GetFiniteArray(section, "coefficients", SRIT_NUM_COEFS, model->adfCoef, ctx,
                    ArrayFormat{ArrayWording::kLengthOnly, ItemWording::kItemWord, ""});
-    CheckDivisors(model->adfCoef, ctx);
     model->nSensor = ReadInt(section, "sensorCode", 0, 186, ctx);
     model->nModelClass = ReadInt(section, "modelClass", -999, 6, ctx);
     model->anAux[0] = ReadInt(section, "downsample", 0, 1 << 20, ctx);
@@ -99,6 +87,7 @@ SritPtr SritFromJson(const ModelEnvelope& envelope, const json& section) {
     model->psEphemeris = psSegment.release();
     EnvelopeToProjInfo(envelope, model->psProjInfo);
     FillLineArrays(*model);
+    RequireValidRecord(envelope, "srit", SRITValidate(model.get()));
     return model;
 }
 
