@@ -9,13 +9,12 @@
 #include <string>
 
 #include "projection.h"
+#include "fuzz_support.h"
 #include "runtime.h"
 
 namespace {
 
-void Check(bool bCondition) {
-    if (!bCondition) std::abort();
-}
+using lumo::fuzz::Check;
 
 void FuzzGeosys(const std::string& osText) {
     char szOut[20];
@@ -57,11 +56,7 @@ void FuzzParms(const std::string& osText) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* pabyData, std::size_t nSize) {
-    static const bool bQuiet = [] {
-        nova::SetErrorSink([](const nova::ErrorReport&) {});
-        return true;
-    }();
-    (void)bQuiet;
+    lumo::fuzz::SilenceWarnings();
     // The first byte picks the parser; the rest is the text.
     if (nSize == 0) return 0;
     const std::string osText(reinterpret_cast<const char*>(pabyData + 1), nSize - 1);

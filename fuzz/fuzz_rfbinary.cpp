@@ -13,13 +13,12 @@
 #include <vector>
 
 #include "lumo_rf.h"
+#include "fuzz_support.h"
 #include "runtime.h"
 
 namespace {
 
-void Check(bool bCondition) {
-    if (!bCondition) std::abort();
-}
+using lumo::fuzz::Check;
 
 using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
 using BlockPtr = std::unique_ptr<unsigned char, nova::FreeDeleter>;
@@ -52,11 +51,7 @@ void CheckStableRoundTrip(RFInfo_t* psRF) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* pabyData, std::size_t nSize) {
-    static const bool bQuiet = [] {
-        nova::SetErrorSink([](const nova::ErrorReport&) {});
-        return true;
-    }();
-    (void)bQuiet;
+    lumo::fuzz::SilenceWarnings();
     if (nSize > 0 && nSize < static_cast<std::size_t>(RF_BINARY_SIZE)) {
         std::vector<unsigned char> abyExact(pabyData, pabyData + nSize);
         Check(Read(static_cast<int>(nSize), abyExact.data()) == nullptr);

@@ -10,13 +10,12 @@
 #include <string>
 
 #include "lumo_rf.h"
+#include "fuzz_support.h"
 #include "runtime.h"
 
 namespace {
 
-void Check(bool bCondition) {
-    if (!bCondition) std::abort();
-}
+using lumo::fuzz::Check;
 
 using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
 

@@ -9,14 +9,13 @@
 
 #include <nlohmann/json.hpp>
 
+#include "fuzz_support.h"
 #include "runtime.h"
 #include "segment_io.h"
 
 namespace {
 
-void Check(bool bCondition) {
-    if (!bCondition) std::abort();
-}
+using lumo::fuzz::Check;
 
 }  // namespace
 
