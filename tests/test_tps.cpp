@@ -362,9 +362,10 @@ TEST(TpsModel, AllocateCopyAndRelease) {
     EXPECT_EQ(model->nPixels, 0);
     ASSERT_NE(model->psProjInfo, nullptr);
 
-    // Before a fit there is no position: the null value, not zeros.
+    // Before a fit there is no position: the null value, not zeros, and the
+    // dispatch reports the failure.
     double px = 5, ln = 5;
-    EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), 1.0, 2.0, 0.0, &px, &ln), 1);
+    EXPECT_EQ(GenGeo2Img(LUMO_CODE_TPS, model.get(), 1.0, 2.0, 0.0, &px, &ln), 0);
     EXPECT_EQ(px, LUMO_NULL_VALUE);
     EXPECT_EQ(ln, LUMO_NULL_VALUE);
 

@@ -10,6 +10,7 @@
 #include "errors.h"
 #include "inverse_check.h"
 #include "lumo_rf.h"
+#include "null_value.h"
 #include "projection.h"
 #include "record_check.h"
 #include "runtime.h"
@@ -244,8 +245,7 @@ inline double Adjustment(const double* a, double p, double l) {
 
 // The failure values of the inverse: both ground coordinates the null value.
 int NoGroundPoint(double* pdfX, double* pdfY) {
-    *pdfX = LUMO_NULL_VALUE;
-    *pdfY = LUMO_NULL_VALUE;
+    lumo::SetNullPair(pdfX, pdfY);
     return 0;
 }
 
