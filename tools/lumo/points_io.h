@@ -82,5 +82,7 @@ std::string GeorefComments(const PointSet& points);
 
 // Shortest decimal text of a double that reads back to the same value.
 std::string FormatDouble(double value);
+// Four significant digits, for the summaries the commands print.
+std::string FormatShort(double value);
 
 }  // namespace lumo::cli

@@ -1,6 +1,5 @@
 // The radar model in the tool: `lumo fit --model rtcs`.
 #include <cmath>
-#include <cstdio>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -13,16 +12,6 @@
 #include "segment_io.h"
 
 namespace lumo::cli {
-namespace {
-
-std::string Short(double value) {
-    char text[32];
-    std::snprintf(text, sizeof text, "%.4g", value);
-    return text;
-}
-
-}  // namespace
-
 void RunRtcsFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
                 const std::string& heightRef, const std::string& outputPath,
                 CommandContext& context) {
@@ -71,8 +60,8 @@ void RunRtcsFit(const PointSet& gcps, const std::string& segmentPath, const std:
                 << " radar image, " << gcps.asPoints.size() << " control points, heights above "
                 << (heightRef == "E" ? "the ellipsoid" : "mean sea level") << "\n"
                 << "control point residuals ground->image: rms "
-                << Short(nDone ? std::sqrt(dfSum / nDone) : 0.0) << " px, max " << Short(dfMax)
-                << " px\n"
+                << FormatShort(nDone ? std::sqrt(dfSum / nDone) : 0.0) << " px, max "
+                << FormatShort(dfMax) << " px\n"
                 << (psModel->poRpcModel != nullptr
                         ? "rational polynomial model fitted to the model's geometry\n"
                         : "no rational polynomial model: the model answers from its own "

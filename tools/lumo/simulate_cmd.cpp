@@ -80,6 +80,21 @@ std::string Degrees(double value) {
     return text;
 }
 
+// A scene's control points (3 % margin, with the noise asked for) and, when a
+// check file is asked for, its independent check points (1 % margin).
+template <class SceneT>
+void SamplePointSets(const SceneT& oScene, const SimulateOptions& options,
+                     std::vector<lumo::sim::SimPoint>* pasGcps,
+                     std::vector<lumo::sim::SimPoint>* pasChecks) {
+    *pasGcps = oScene.SamplePoints(options.nGcps, options.nSeed, options.dfMinHeight,
+                                   options.dfMaxHeight, 0.03);
+    lumo::sim::AddImageNoise(pasGcps, options.dfNoise, options.nSeed + 1);
+    if (!options.osChecks.empty()) {
+        *pasChecks = oScene.SamplePoints(options.nChecks, options.nSeed + 2, options.dfMinHeight,
+                                         options.dfMaxHeight, 0.01);
+    }
+}
+
 // The radar scene: segment, control points and check points with longitude,
 // latitude and height above the ellipsoid.
 void RunSimulateRadar(SimulateOptions options, CommandContext& context) {
@@ -98,13 +113,7 @@ void RunSimulateRadar(SimulateOptions options, CommandContext& context) {
     SegmentPtr psSegment;
     try {
         poScene = std::make_unique<lumo::sim::RadarScene>(r);
-        asGcps = poScene->SamplePoints(options.nGcps, options.nSeed, options.dfMinHeight,
-                                       options.dfMaxHeight, 0.03);
-        lumo::sim::AddImageNoise(&asGcps, options.dfNoise, options.nSeed + 1);
-        if (!options.osChecks.empty()) {
-            asChecks = poScene->SamplePoints(options.nChecks, options.nSeed + 2,
-                                             options.dfMinHeight, options.dfMaxHeight, 0.01);
-        }
+        SamplePointSets(*poScene, options, &asGcps, &asChecks);
         psSegment.reset(poScene->MakeSegment());
     } catch (const std::exception& e) {
         LUMO_CLI_FAIL(std::string("lumo simulate --radar: ") + e.what());
@@ -136,13 +145,7 @@ void RunSimulate(const SimulateOptions& options, CommandContext& context) {
     std::vector<lumo::sim::SimPoint> asGcps, asChecks;
     try {
         poScene = std::make_unique<lumo::sim::Scene>(options.sScene);
-        asGcps = poScene->SamplePoints(options.nGcps, options.nSeed, options.dfMinHeight,
-                                       options.dfMaxHeight, 0.03);
-        lumo::sim::AddImageNoise(&asGcps, options.dfNoise, options.nSeed + 1);
-        if (!options.osChecks.empty()) {
-            asChecks = poScene->SamplePoints(options.nChecks, options.nSeed + 2,
-                                             options.dfMinHeight, options.dfMaxHeight, 0.01);
-        }
+        SamplePointSets(*poScene, options, &asGcps, &asChecks);
     } catch (const std::exception& e) {
         LUMO_CLI_FAIL(std::string("lumo simulate: ") + e.what());
     }

@@ -1,6 +1,5 @@
 // The rigorous model in the tool: `lumo fit --model srit`.
 #include <cmath>
-#include <cstdio>
 #include <cstring>
 #include <ostream>
 #include <string>
@@ -14,16 +13,6 @@
 #include "srit_io.h"
 
 namespace lumo::cli {
-namespace {
-
-std::string Number(double value) {
-    char text[32];
-    std::snprintf(text, sizeof text, "%.4g", value);
-    return text;
-}
-
-}  // namespace
-
 void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
                 const std::string& outputPath, CommandContext& context) {
     if (segmentPath.empty()) LUMO_CLI_FAIL("--model srit needs --segment");
@@ -65,8 +54,9 @@ void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std:
     context.out << "fitted srit: sensor "
                 << std::string(psModel->Sensor, strnlen(psModel->Sensor, SRIT_SENSOR_SIZE))
                 << " (code " << psModel->nSensor << ", class " << psModel->nModelClass << ") to "
-                << p.size() << " control points\nrms ground->image: pixel " << Number(dfRmsPixel)
-                << ", line " << Number(dfRmsLine) << "\nwrote " << outputPath << "\n";
+                << p.size() << " control points\nrms ground->image: pixel "
+                << FormatShort(dfRmsPixel) << ", line " << FormatShort(dfRmsLine) << "\nwrote "
+                << outputPath << "\n";
 }
 
 }  // namespace lumo::cli

@@ -243,16 +243,8 @@ void Scene::CentreGeodetic(double* pdfLat, double* pdfLon) const {
 
 std::vector<SimPoint> Scene::SamplePoints(int nPoints, std::uint32_t nSeed, double dfMinHeight,
                                           double dfMaxHeight, double dfMargin) const {
-    std::vector<SimPoint> asPoints = JitteredImagePoints(
-        nPoints, nSeed, m_sParams.nPixels, m_sParams.nLines, dfMinHeight, dfMaxHeight, dfMargin);
-    for (std::size_t k = 0; k < asPoints.size(); ++k) {
-        SimPoint& s = asPoints[k];
-        if (!ImageToGround(s.dfPixel, s.dfLine, s.dfZ, &s.dfX, &s.dfY)) {
-            throw std::runtime_error("simulated point " + std::to_string(k) +
-                                     " cannot be mapped to the ground");
-        }
-    }
-    return asPoints;
+    return SampleScenePoints(*this, nPoints, nSeed, m_sParams.nPixels, m_sParams.nLines,
+                             dfMinHeight, dfMaxHeight, dfMargin, "simulated point");
 }
 
 void AddImageNoise(std::vector<SimPoint>* pasPoints, double dfSigma, std::uint32_t nSeed) {

@@ -334,16 +334,8 @@ double RadarScene::IncidenceAt(double dfPixel, double dfLine) const {
 
 std::vector<SimPoint> RadarScene::SamplePoints(int nPoints, std::uint32_t nSeed, double dfMinHeight,
                                                double dfMaxHeight, double dfMargin) const {
-    std::vector<SimPoint> asPoints = JitteredImagePoints(
-        nPoints, nSeed, m_sParams.nPixels, m_sParams.nLines, dfMinHeight, dfMaxHeight, dfMargin);
-    for (std::size_t k = 0; k < asPoints.size(); ++k) {
-        SimPoint& s = asPoints[k];
-        if (!ImageToGround(s.dfPixel, s.dfLine, s.dfZ, &s.dfX, &s.dfY)) {
-            throw std::runtime_error("simulated radar point " + std::to_string(k) +
-                                     " cannot be mapped to the ground");
-        }
-    }
-    return asPoints;
+    return SampleScenePoints(*this, nPoints, nSeed, m_sParams.nPixels, m_sParams.nLines,
+                             dfMinHeight, dfMaxHeight, dfMargin, "simulated radar point");
 }
 
 EphemerisSeg_t* RadarScene::MakeSegment() const {

@@ -103,4 +103,23 @@ inline std::vector<SimPoint> JitteredImagePoints(int nPoints, std::uint32_t nSee
     return asPoints;
 }
 
+// Jittered points over a scene's image (as JitteredImagePoints) placed on the
+// ground by the scene's own ImageToGround; throws naming the first point
+// that misses the ground. pszWhat names the points in that message.
+template <class SceneT>
+std::vector<SimPoint> SampleScenePoints(const SceneT& oScene, int nPoints, std::uint32_t nSeed,
+                                        int nPixels, int nLines, double dfMinHeight,
+                                        double dfMaxHeight, double dfMargin, const char* pszWhat) {
+    std::vector<SimPoint> asPoints =
+        JitteredImagePoints(nPoints, nSeed, nPixels, nLines, dfMinHeight, dfMaxHeight, dfMargin);
+    for (std::size_t k = 0; k < asPoints.size(); ++k) {
+        SimPoint& s = asPoints[k];
+        if (!oScene.ImageToGround(s.dfPixel, s.dfLine, s.dfZ, &s.dfX, &s.dfY)) {
+            throw std::runtime_error(std::string(pszWhat) + " " + std::to_string(k) +
+                                     " cannot be mapped to the ground");
+        }
+    }
+    return asPoints;
+}
+
 }  // namespace lumo::sim
