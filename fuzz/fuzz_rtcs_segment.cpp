@@ -7,11 +7,11 @@
 #include <cmath>
 #include <cstddef>
 #include <cstdint>
-#include <cstdlib>
 #include <memory>
 
 #include <nlohmann/json.hpp>
 
+#include "fuzz_support.h"
 #include "lumo.h"
 #include "runtime.h"
 #include "segment_io.h"
@@ -21,9 +21,7 @@ namespace {
 // Larger scenes only cost time: generation scales with the line count.
 constexpr int kMaxLines = 64;
 
-void Check(bool bCondition) {
-    if (!bCondition) std::abort();
-}
+using lumo::fuzz::Check;
 
 struct ModelDeleter {
     void operator()(RTCSInfo_t* p) const { RTCSFreeModel(p); }
@@ -76,6 +74,7 @@ void Exercise(const RTCSInfo_t* psModel, const EphemerisSeg_t& s) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* pabyData, std::size_t nSize) {
+    lumo::fuzz::SilenceWarnings();
     const auto document = nlohmann::ordered_json::parse(pabyData, pabyData + nSize, nullptr,
                                                         /*allow_exceptions=*/false);
     if (document.is_discarded()) return 0;
