@@ -9,6 +9,7 @@ PACKAGES=(
   libeigen3-dev nlohmann-json3-dev libcli11-dev
   libopenblas-dev liblapack-dev liblapacke-dev
   libgtest-dev libgmock-dev googletest libbenchmark-dev
+  libgdal-dev
 )
 
 missing=()
