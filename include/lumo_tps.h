@@ -28,7 +28,7 @@ class LUMO_API TPSInfo_t {
     double* padfCoefY;    // the same for the second output
     double adfAffine[6];  // affine regression of the last fit of >= 2 points (carried only)
     int nRank;            // numerical rank of the last solve
-    double dfCondition;   // |R00 / R(k-1,k-1)| of the last solve; 0 when not computed
+    double dfCondition;   // estimated condition number of the last solve; 0 when not computed
     int nAllocCPs;        // points the arrays are sized for
 
   private:

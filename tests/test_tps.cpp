@@ -244,7 +244,7 @@ TEST(TpsFit, FailuresRaiseErrorHundredAndKeepTheSpline) {
     EXPECT_EQ(t.nCPs, 10);
 }
 
-TEST(TpsFit, RepeatedPointsLowerTheRankAndLargeSetsInterpolate) {
+TEST(TpsFit, DegenerateSetsLowerTheRankAndStillInterpolate) {
     // Enough points for the solver's block-pivoted path, with repeated
     // points, each of which lowers the rank by one.
     Points p = SmoothPoints(400, 0.0, 5000.0, 13);
@@ -262,6 +262,20 @@ TEST(TpsFit, RepeatedPointsLowerTheRankAndLargeSetsInterpolate) {
         worst = std::max({worst, std::abs(X - p.X[i]), std::abs(Y - p.Y[i])});
     }
     EXPECT_LT(worst, 1e-8 * 4000.0);
+
+    // Collinear points leave the affine part one short: the rank-revealing
+    // solve takes them and still passes through every point.
+    Points line;
+    for (int i = 0; i < 12; ++i)
+        line.Add(100.0 * i, 50.0 * i + 3.0, 7.0 * i + 20.0 * std::sin(i), 2.0 * i * i);
+    Fit(t, line);
+    EXPECT_EQ(t.nRank, line.Size() + 2);
+    for (int i = 0; i < line.Size(); ++i) {
+        double X = 0.0, Y = 0.0;
+        TPSTransform(&t, line.x[i], line.y[i], &X, &Y);
+        EXPECT_NEAR(X, line.X[i], 1e-9 * 100.0);
+        EXPECT_NEAR(Y, line.Y[i], 1e-9 * 250.0);
+    }
 }
 
 TEST(TpsResiduals, KnownOffsetsAndEmptySets) {

@@ -1,6 +1,6 @@
-// Thin plate spline: fitting by a dense symmetric system solved with the
-// host's column-pivoted QR, evaluation with a vectorised radial sum, and the
-// two-direction spline model record.
+// Thin plate spline: fitting by a dense symmetric system solved through its
+// structure, or with the host's column-pivoted QR for degenerate point sets, evaluation with a
+// vectorised radial sum, and the two-direction spline model record.
 #include <algorithm>
 #include <cmath>
 #include <cstddef>
@@ -17,6 +17,7 @@
 #include "record_check.h"
 #include "regression.h"
 #include "runtime.h"
+#include "tps_solve.h"
 
 #if defined(__x86_64__) && defined(__GLIBC__) && defined(__GNUC__)
 #include <immintrin.h>
@@ -157,6 +158,8 @@ struct NormalisedFit {
     double scale;   // input scale s
     double scaleX;  // output scales S_X, S_Y
     double scaleY;
+    double offsetX;  // output offsets, subtracted before scaling
+    double offsetY;
 };
 
 double OutputScale(double lo, double hi) {
@@ -164,25 +167,62 @@ double OutputScale(double lo, double hi) {
     return s > 0.0 ? s : 1.0;
 }
 
+// Largest residual of a control point accepted from the structured solve,
+// relative to the output extent: a margin below the 1e-12 the fit promises,
+// leaving room for the rounding of evaluation.
+constexpr double kStructuredResidual = 2e-13;
+
+// The structured solve, on outputs centred and scaled to [-1, 1] so that
+// map coordinates far from the origin keep their precision. False when the
+// points are degenerate for it.
+bool SolveStructured(TPSInfo_t& t, int n, const std::vector<double>& xi,
+                     const std::vector<double>& eta, const double* X, const double* Y,
+                     const Extent& out, NormalisedFit& f) {
+    auto centre = [](double lo, double hi, double& offset, double& scale) {
+        offset = 0.5 * (lo + hi);
+        scale = hi > lo ? 0.5 * (hi - lo) : 1.0;
+    };
+    NormalisedFit g = f;
+    centre(out.minX, out.maxX, g.offsetX, g.scaleX);
+    centre(out.minY, out.maxY, g.offsetY, g.scaleY);
+    std::vector<double> vx(n), vy(n);
+    for (int i = 0; i < n; ++i) {
+        vx[i] = (X[i] - g.offsetX) / g.scaleX;
+        vy[i] = (Y[i] - g.offsetY) / g.scaleY;
+    }
+    double condition = 0.0;
+    if (!lumo::SolveSplineStructured(n, xi.data(), eta.data(), vx.data(), vy.data(),
+                                     2.0 * kStructuredResidual, t.padfCoefX, t.padfCoefY,
+                                     &condition))
+        return false;
+    t.nRank = n + 3;
+    t.dfCondition = condition;
+    f = g;
+    return true;
+}
+
 // Builds and solves the (n + 3) x (n + 3) spline system into the coefficient
-// arrays of t; raises error 100 when it is singular. The matrix and solver
-// state live in this call only.
+// arrays of t: by the structured solve when the points allow it, otherwise
+// by the rank-revealing pivoted QR (duplicates, collinear points), which
+// raises error 100 when the system is singular. All working storage lives in
+// this call only.
 NormalisedFit SolveNormalised(TPSInfo_t& t, int n, const double* x, const double* y,
                               const double* X, const double* Y, const Extent& in,
                               const Extent& out) {
     NormalisedFit f{};
     f.scale = std::max(in.maxX - in.minX, in.maxY - in.minY);
     if (!(f.scale > 0.0)) f.scale = 1.0;
-    f.scaleX = OutputScale(out.minX, out.maxX);
-    f.scaleY = OutputScale(out.minY, out.maxY);
-
-    const int m = n + 3;
-    const auto ld = static_cast<std::size_t>(m);
     std::vector<double> xi(n), eta(n);
     for (int i = 0; i < n; ++i) {
         xi[i] = (x[i] - in.minX) / f.scale;
         eta[i] = (y[i] - in.minY) / f.scale;
     }
+    if (SolveStructured(t, n, xi, eta, X, Y, out, f)) return f;
+
+    f.scaleX = OutputScale(out.minX, out.maxX);
+    f.scaleY = OutputScale(out.minY, out.maxY);
+    const int m = n + 3;
+    const auto ld = static_cast<std::size_t>(m);
     std::vector<double> a(ld * ld, 0.0);  // column-major
     auto at = [&](int r, int c) -> double& { return a[static_cast<std::size_t>(c) * ld + r]; };
     double largest = 1.0;
@@ -244,10 +284,12 @@ void Unnormalise(TPSInfo_t& t, int n, const double* x, const double* y, const Ex
     }
     double* cx = t.padfCoefX;
     double* cy = t.padfCoefY;
-    cx[0] = (cx[0] - (in.minY * cx[2] + in.minX * cx[1]) / f.scale - logTerm * sumX) * f.scaleX;
+    cx[0] = (cx[0] - (in.minY * cx[2] + in.minX * cx[1]) / f.scale - logTerm * sumX) * f.scaleX +
+            f.offsetX;
     cx[1] = cx[1] * f.scaleX / f.scale;
     cx[2] = cx[2] * f.scaleX / f.scale;
-    cy[0] = (cy[0] - (in.minY * cy[2] + in.minX * cy[1]) / f.scale - logTerm * sumY) * f.scaleY;
+    cy[0] = (cy[0] - (in.minY * cy[2] + in.minX * cy[1]) / f.scale - logTerm * sumY) * f.scaleY +
+            f.offsetY;
     cy[1] = cy[1] * f.scaleY / f.scale;
     cy[2] = cy[2] * f.scaleY / f.scale;
 }
