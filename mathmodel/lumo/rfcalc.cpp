@@ -21,9 +21,17 @@ constexpr const char* kDefaultGeosys = "LON D0";
 constexpr int kMaxNewtonSteps = 20;
 constexpr double kStepTolerance = 1e-5;     // normalised units
 constexpr double kSingularJacobian = 1e-5;  // |det| below this stops the iteration
+// The inverse also stops as soon as the functions map its estimate within
+// this many pixels of the point asked for: a further step changes nothing
+// that matters.
+constexpr double kResidualPixels = 1e-9;
+// A first guess farther than this from the cube's centre (normalised units)
+// is not trusted; the iteration then starts at the centre.
+constexpr double kMaxStartDistance = 10.0;
 
-// The forward transform is the hot loop of orthorectification: on x86-64
-// Linux it is also built for AVX2/FMA processors and picked at load time.
+// The forward transform is the hot loop of orthorectification, the inverse
+// that of georeferencing: on x86-64 Linux both are also built for AVX2/FMA
+// processors and picked at load time.
 #if defined(__x86_64__) && defined(__linux__) && defined(__GNUC__) && !defined(__clang__)
 #define LUMO_HOT_CLONES __attribute__((flatten, target_clones("arch=x86-64-v3", "default")))
 #else
@@ -346,12 +354,14 @@ void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPi
     }
 }
 
-int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double dfV, double dfW,
-           double* pdfU, double* pdfV) {
-    if (psRF == nullptr || pdfU == nullptr || pdfV == nullptr || !IsEvaluable(psRF)) return 0;
-    TermSet sT;
-    FormTerms(dfU, dfV, dfW, sT.t);
-    const Ratios r = EvaluateSums(psRF, sT.t);
+namespace {
+
+// Partial derivatives of the normalised pixel and line by u and v.
+struct Jacobian {
+    double pu, pv, lu, lv;
+};
+
+Jacobian JacobianAt(const RFInfo_t* psRF, const Ratios& r, double dfU, double dfV, double dfW) {
     Ratios ru, rv;
     if (UsableTerms(psRF) == RF_MAX_TERMS) {
         ru = {DerivativeU(psRF->padfPixelNum, dfU, dfV, dfW),
@@ -370,26 +380,116 @@ int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double d
         ru = EvaluateSums(psRF, sDu.t);
         rv = EvaluateSums(psRF, sDv.t);
     }
-    // A vanishing denominator has no ratio and no derivative: no step.
-    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return 0;
-    const double fp = r.dfPixelNum / r.dfPixelDen - dfPixelN;
-    const double fl = r.dfLineNum / r.dfLineDen - dfLineN;
     const double dp2 = r.dfPixelDen * r.dfPixelDen;
     const double dl2 = r.dfLineDen * r.dfLineDen;
-    const double pu = (ru.dfPixelNum * r.dfPixelDen - r.dfPixelNum * ru.dfPixelDen) / dp2;
-    const double pv = (rv.dfPixelNum * r.dfPixelDen - r.dfPixelNum * rv.dfPixelDen) / dp2;
-    const double lu = (ru.dfLineNum * r.dfLineDen - r.dfLineNum * ru.dfLineDen) / dl2;
-    const double lv = (rv.dfLineNum * r.dfLineDen - r.dfLineNum * rv.dfLineDen) / dl2;
-    const double det = pu * lv - pv * lu;
-    if (!(std::fabs(det) >= kSingularJacobian)) return 0;  // also refuses NaN
-    const double u = dfU - (lv * fp - pv * fl) / det;
-    const double v = dfV - (pu * fl - lu * fp) / det;
-    if (!std::isfinite(u) || !std::isfinite(v)) return 0;
+    return {(ru.dfPixelNum * r.dfPixelDen - r.dfPixelNum * ru.dfPixelDen) / dp2,
+            (rv.dfPixelNum * r.dfPixelDen - r.dfPixelNum * rv.dfPixelDen) / dp2,
+            (ru.dfLineNum * r.dfLineDen - r.dfLineNum * ru.dfLineDen) / dl2,
+            (rv.dfLineNum * r.dfLineDen - r.dfLineNum * rv.dfLineDen) / dl2};
+}
+
+// What the inverse carries from step to step: the Jacobian of its last full
+// step, reused (a chord step, which needs the values only) near the answer,
+// where the steps are short and the residual keeps falling at least tenfold
+// per step; and the residual target, in normalised image units.
+struct InverseState {
+    bool bHaveJacobian = false;
+    Jacobian sJacobian{};
+    double dfLastResidual = HUGE_VAL;
+    double dfLastStep = HUGE_VAL;
+    double dfPixelLimit = -1.0;  // negative: never converged, every step full
+    double dfLineLimit = -1.0;
+};
+constexpr double kChordRatio = 0.1;
+constexpr double kChordStep = 1e-2;  // normalised units
+
+struct NewtonOutcome {
+    bool bConverged = false;  // (u, v) maps within the limits: no step made
+    bool bStep = false;       // a step was made: (dfU, dfV) holds it
+    bool bChord = false;      // with an earlier step's Jacobian
+    double dfU = 0.0;
+    double dfV = 0.0;
+};
+
+// One step from (u, v) towards the normalised image point (pn, ln) at the
+// height w. No step is made when the functions map (u, v) within the
+// state's limits, cannot be evaluated there or the Jacobian is singular.
+NewtonOutcome NewtonStep(const RFInfo_t* psRF, double pn, double ln, double dfU, double dfV,
+                         double dfW, InverseState& state) {
+    NewtonOutcome s;
+    TermSet sT;
+    FormTerms(dfU, dfV, dfW, sT.t);
+    const Ratios r = EvaluateSums(psRF, sT.t);
+    // A vanishing denominator has no ratio and no derivative: no step.
+    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return s;
+    const double fp = r.dfPixelNum / r.dfPixelDen - pn;
+    const double fl = r.dfLineNum / r.dfLineDen - ln;
+    if (std::fabs(fp) <= state.dfPixelLimit && std::fabs(fl) <= state.dfLineLimit) {
+        s.bConverged = true;
+        return s;
+    }
+    const double dfResidual = std::max(std::fabs(fp), std::fabs(fl));
+    s.bChord = state.bHaveJacobian && state.dfLastStep <= kChordStep &&
+               dfResidual <= kChordRatio * state.dfLastResidual;
+    if (!s.bChord) {
+        state.sJacobian = JacobianAt(psRF, r, dfU, dfV, dfW);
+        state.bHaveJacobian = state.dfPixelLimit >= 0.0;  // only the inverse reuses it
+    }
+    state.dfLastResidual = dfResidual;
+    const Jacobian& j = state.sJacobian;
+    const double det = j.pu * j.lv - j.pv * j.lu;
+    if (!(std::fabs(det) >= kSingularJacobian)) return s;  // also refuses NaN
+    const double u = dfU - (j.lv * fp - j.pv * fl) / det;
+    const double v = dfV - (j.pu * fl - j.lu * fp) / det;
+    if (!std::isfinite(u) || !std::isfinite(v)) return s;
+    state.dfLastStep = std::max(std::fabs(u - dfU), std::fabs(v - dfV));
+    s.bStep = true;
+    s.dfU = u;
+    s.dfV = v;
+    return s;
+}
+
+// Starting point of the inverse: the exact inverse of the functions' first
+// order part at the height w, where pN (D0 + D1 u + D2 v + D3 w) =
+// N0 + N1 u + N2 v + N3 w is linear in (u, v). Real models are nearly that,
+// so Newton starts close and needs a step or two. False when that part is
+// singular or its answer implausible.
+bool FirstOrderStart(const RFInfo_t* psRF, double pn, double ln, double w, double* pdfU,
+                     double* pdfV) {
+    const int n = UsableTerms(psRF);
+    auto c = [n](const double* a, int i) { return i < n ? a[i] : 0.0; };
+    auto row = [&](const double* num, const double* den, double target, double* a) {
+        a[0] = c(num, 1) - target * c(den, 1);
+        a[1] = c(num, 2) - target * c(den, 2);
+        a[2] = target * (c(den, 0) + c(den, 3) * w) - c(num, 0) - c(num, 3) * w;
+    };
+    double p[3], l[3];
+    row(psRF->padfPixelNum, psRF->padfPixelDen, pn, p);
+    row(psRF->padfLineNum, psRF->padfLineDen, ln, l);
+    const double det = p[0] * l[1] - p[1] * l[0];
+    if (!(std::fabs(det) >= kSingularJacobian)) return false;
+    const double u = (p[2] * l[1] - p[1] * l[2]) / det;
+    const double v = (p[0] * l[2] - p[2] * l[0]) / det;
+    if (!(std::fabs(u) <= kMaxStartDistance && std::fabs(v) <= kMaxStartDistance)) return false;
     *pdfU = u;
     *pdfV = v;
+    return true;
+}
+
+}  // namespace
+
+int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double dfV, double dfW,
+           double* pdfU, double* pdfV) {
+    if (psRF == nullptr || pdfU == nullptr || pdfV == nullptr || !IsEvaluable(psRF)) return 0;
+    InverseState state;  // a full step, whatever the residual
+    const NewtonOutcome s = NewtonStep(psRF, dfPixelN, dfLineN, dfU, dfV, dfW, state);
+    if (!s.bStep) return 0;
+    *pdfU = s.dfU;
+    *pdfV = s.dfV;
     return 1;
 }
 
+LUMO_HOT_CLONES
 int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
               double* pdfZ) {
     if (pdfX == nullptr || pdfY == nullptr || pdfZ == nullptr) {
@@ -406,8 +506,11 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
         return NoGroundPoint(pdfX, pdfY);
     }
     const double dfHeight = *pdfZ == LUMO_NULL_VALUE ? psRF->dfZOffset : *pdfZ;
-    const double dfStartX = (*pdfX == 0.0 || *pdfX == LUMO_NULL_VALUE) ? psRF->dfXOffset : *pdfX;
-    const double dfStartY = (*pdfY == 0.0 || *pdfY == LUMO_NULL_VALUE) ? psRF->dfYOffset : *pdfY;
+    const bool bNoGuessX = *pdfX == 0.0 || *pdfX == LUMO_NULL_VALUE;
+    const bool bNoGuessY = *pdfY == 0.0 || *pdfY == LUMO_NULL_VALUE;
+    const bool bNoGuess = bNoGuessX && bNoGuessY;  // then the first-order start is used
+    const double dfStartX = bNoGuessX ? psRF->dfXOffset : *pdfX;
+    const double dfStartY = bNoGuessY ? psRF->dfYOffset : *pdfY;
     if (!std::isfinite(dfHeight) || !std::isfinite(dfStartX) || !std::isfinite(dfStartY)) {
         lumo::WarnReal(
             lumo::Err::kBadArgument,
@@ -433,27 +536,35 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
     double u = (dfStartX - psRF->dfXOffset) / psRF->dfXScale;
     double v = (dfStartY - psRF->dfYOffset) / psRF->dfYScale;
     const double w = (dfHeight - psRF->dfZOffset) / psRF->dfZScale;
+    if (bNoGuess) FirstOrderStart(psRF, pn, ln, w, &u, &v);
+    InverseState state;
+    state.dfPixelLimit = kResidualPixels / std::fabs(psRF->dfPixelScale);
+    state.dfLineLimit = kResidualPixels / std::fabs(psRF->dfLineScale);
+    bool bConverged = false;
     for (int nSteps = 1; nSteps <= kMaxNewtonSteps; ++nSteps) {
-        double uNext = u;
-        double vNext = v;
-        if (!Newton(psRF, pn, ln, u, v, w, &uNext, &vNext)) break;
-        const bool bSmallStep =
-            std::fabs(uNext - u) < kStepTolerance && std::fabs(vNext - v) < kStepTolerance;
-        u = uNext;
-        v = vNext;
+        const NewtonOutcome s = NewtonStep(psRF, pn, ln, u, v, w, state);
+        bConverged = s.bConverged;
+        if (!s.bStep) break;
+        // A small full step ends the iteration; after a chord step, whose
+        // convergence is only linear, the residual decides.
+        const bool bSmallStep = !s.bChord && std::fabs(s.dfU - u) < kStepTolerance &&
+                                std::fabs(s.dfV - v) < kStepTolerance;
+        u = s.dfU;
+        v = s.dfV;
         if (bSmallStep) break;
     }
 
     *pdfZ = dfHeight;
     // The iteration may stop on its step limit, on a singular step, or on a
     // small step far from any solution: its answer counts only when the
-    // rational functions map it back onto the image point asked for, and it
-    // is a place on the Earth.
-    double pBack = 0.0;
-    double lBack = 0.0;
+    // rational functions map it back onto the image point asked for (which
+    // the last step has just found when it converged), and it is a place on
+    // the Earth.
+    double pBack = p;
+    double lBack = l;
     const double dfX = WrapLongitude(u * psRF->dfXScale + psRF->dfXOffset, psRF->dfXOffset);
     const double dfY = v * psRF->dfYScale + psRF->dfYOffset;
-    if (!RationalImage(psRF, u, v, w, &pBack, &lBack) ||
+    if ((!bConverged && !RationalImage(psRF, u, v, w, &pBack, &lBack)) ||
         !lumo::WithinInverseTolerance(pBack - p, lBack - l) || !IsPlaceOnEarth(psRF, dfX, dfY)) {
         return NoGroundPoint(pdfX, pdfY);
     }
