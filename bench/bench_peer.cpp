@@ -64,8 +64,10 @@ ControlPoints Spread(int n) {
     const int side = static_cast<int>(std::ceil(std::sqrt(n)));
     ControlPoints p;
     for (int k = 0; k < n; ++k) {
-        const double u = (k % side + 0.5 + jitter(rng)) / side;
-        const double v = (static_cast<double>(k / side) + 0.5 + jitter(rng)) / side;
+        const int column = k % side;
+        const int row = k / side;
+        const double u = (column + 0.5 + jitter(rng)) / side;
+        const double v = (row + 0.5 + jitter(rng)) / side;
         p.pixel.push_back(6000.0 * u + 40.0 * std::sin(5.0 * v) + 12.0 * u * v);
         p.line.push_back(5000.0 * (1.0 - v) + 25.0 * std::cos(4.0 * u));
         p.x.push_back(350000.0 + 30000.0 * u);
