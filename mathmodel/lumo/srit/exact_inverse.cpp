@@ -138,6 +138,14 @@ void DerivativesByDifferences(const ModelTerms& m, const GroundTerms& s, double 
     j[3] = (sY.dfAlong - s.dfAlong) / kDerivativeStep;
 }
 
+// Whether the axes miss (rA, rB), taken to the image through the derivatives
+// j, lies within the inverse tolerance (false where j is singular).
+bool MissWithinTolerance(const double* j, double rA, double rB) {
+    const double det = j[0] * j[3] - j[1] * j[2];
+    if (!(std::isfinite(det) && det != 0.0)) return false;
+    return WithinInverseTolerance((j[3] * rA - j[1] * rB) / det, (j[0] * rB - j[2] * rA) / det);
+}
+
 }  // namespace
 
 bool GroundToImageExact(const ModelTerms& m, double dfX, double dfY, double dfZ, double* pdfPixel,
@@ -176,11 +184,23 @@ bool GroundToImageExact(const ModelTerms& m, double dfX, double dfY, double dfZ,
         yc += dyc;
         s = ImageToAxes(m, xc, yc, dfZ);
     }
-    // (xc, yc) is accepted when its forward projection lies within the
-    // tolerance; its last correction then makes the answer exact.
-    if (!WithinInverseTolerance(dxc, dyc)) return false;
-    *pdfPixel = m.dfCentreColumn - (xc + dxc);
-    *pdfLine = m.dfCentreLine + (yc + dyc);
+    if (!WithinInverseTolerance(dxc, dyc)) return false;  // the steps did not close
+    // The answer is (xc, yc) with its last correction. It counts only when
+    // its own forward projection lands within the tolerance, the miss taken
+    // to pixels through the derivatives at the answer: the start's
+    // derivatives that drove the steps could understate a miss far from the
+    // start.
+    xc += dxc;
+    yc += dyc;
+    s = ImageToAxes(m, xc, yc, dfZ);
+    if (m.sSelect.bLens) {
+        DerivativesByDifferences(m, s, xc, yc, dfZ, j);
+    } else {
+        AxesDerivatives(m, c, s, xc, j);
+    }
+    if (!MissWithinTolerance(j, dfAcross - s.dfAcross, dfAlong - s.dfAlong)) return false;
+    *pdfPixel = m.dfCentreColumn - xc;
+    *pdfLine = m.dfCentreLine + yc;
     return true;
 }
 

@@ -157,10 +157,12 @@ void GroundToAxes(const ModelTerms& m, double dfX, double dfY, double* pdfAcross
 void AxesToImage(const ModelTerms& m, double dfAcross, double dfAlong, double dfZ, double* pdfPixel,
                  double* pdfLine);
 // Ground to image pixel and line as the exact inverse of ImageToGround:
-// Newton steps on the image position from the closed form's answer, until a
-// step is below 1e-9 pixel. The answer is accepted only when its ground
-// position, mapped back through the local derivatives, lies within the
-// inverse tolerance of (dfX, dfY); false (outputs untouched) otherwise.
+// chord steps on the image position from a start solved on the ground axes,
+// until a step is below 1e-4 pixel (the answer, with that step, is within
+// 1e-9 pixel of the exact solution). The answer is accepted only when its
+// forward projection, its miss taken to pixels through the derivatives at
+// the answer, lies within the inverse tolerance of (dfX, dfY); false
+// (outputs untouched) otherwise.
 bool GroundToImageExact(const ModelTerms& m, double dfX, double dfY, double dfZ, double* pdfPixel,
                         double* pdfLine);
 
