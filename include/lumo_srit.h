@@ -154,10 +154,14 @@ LUMO_API void SRITGeo2Img(const SRITInfo_t* psModel, double dfX, double dfY, dou
                           double* pdfPixel, double* pdfLine);
 LUMO_API void SRITGeo2Img_imp(const SRITInfo_t* psModel, double dfX, double dfY, double dfZ,
                               double* pdfPixel, double* pdfLine);
-// Image to ground at elevation dfZ; 0 when dfZ is LUMO_NULL_VALUE.
+// Image to ground at elevation dfZ; 0 (outputs LUMO_NULL_VALUE) when dfZ is
+// LUMO_NULL_VALUE, the model is missing its segment or the record gives no
+// finite ground point. Ground to image likewise gives LUMO_NULL_VALUE for a
+// position that is not finite.
 LUMO_API int SRITImg2Geo_imp(const SRITInfo_t* psModel, double dfPixel, double dfLine, double dfZ,
                              double* pdfX, double* pdfY);
-// Image to ground at *pdfZ (LUMO_NULL_VALUE is replaced by 0 and written back).
+// Image to ground at *pdfZ (LUMO_NULL_VALUE is replaced by 0 and written
+// back); returns what SRITImg2Geo_imp returns.
 LUMO_API int SRITImg2GeoDem(const SRITInfo_t* psModel, double dfPixel, double dfLine, double* pdfZ,
                             double* pdfX, double* pdfY);
 LUMO_API int SRITImg2GeoDem_imp(const SRITInfo_t* psModel, double dfPixel, double dfLine,

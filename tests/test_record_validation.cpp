@@ -83,6 +83,22 @@ TEST(RecordValidation, ModelFilesOfEveryFamily) {
     EXPECT_NE(EphemerisSegValidate(nullptr), "");
 }
 
+// A record no reader accepts, handed straight to the transforms, gives
+// failures and the null value, never NaN reported as a position.
+TEST(RecordValidation, UnreadableRigorousRecordGivesNoPositions) {
+    const auto model = lumo::cli::ReadModelFile(kExamples + "srit_spot5_roll20.json");
+    auto* psModel = static_cast<SRITInfo_t*>(model.poRecord.get());
+    const double x0 = psModel->adfCoef[16], y0 = psModel->adfCoef[17];
+    psModel->adfCoef[0] = 0.0;  // no Earth radius
+    double z = 0.0, x = 0.0, y = 0.0, p = 0.0, l = 0.0;
+    EXPECT_EQ(SRITImg2GeoDem(psModel, 100.0, 100.0, &z, &x, &y), 0);
+    EXPECT_EQ(GenImg2Geo(LUMO_CODE_SRIT, psModel, 100.0, 100.0, 0.0, &x, &y), 0);
+    EXPECT_EQ(x, LUMO_NULL_VALUE);
+    SRITGeo2Img(psModel, x0, y0, 0.0, &p, &l);
+    EXPECT_EQ(p, LUMO_NULL_VALUE);
+    EXPECT_EQ(SRITGeo2ImgExact(psModel, x0, y0, 0.0, &p, &l), 0);
+}
+
 TEST(RecordValidation, RationalFunctionTextAndBlock) {
     // RPC text with a latitude offset outside the Earth.
     std::string text = ReadText(kExamples + "rf_scene_RPC.TXT");

@@ -114,6 +114,10 @@ void SRITGeo2Img_imp(const SRITInfo_t* psModel, double dfX, double dfY, double d
         }
     }
     if (lumo::srit::IsLevelSensor(psModel->nSensor)) SPOT1ATo1B_imp(psModel, &dfPixel, &dfLine);
+    if (!std::isfinite(dfPixel) || !std::isfinite(dfLine)) {
+        lumo::SetNullPair(pdfPixel, pdfLine);  // a record SRITValidate refuses
+        return;
+    }
     *pdfPixel = dfPixel;
     *pdfLine = dfLine;
 }
@@ -128,6 +132,12 @@ int SRITImg2Geo_imp(const SRITInfo_t* psModel, double dfPixel, double dfLine, do
         SPOT1BTo1A_imp(psModel, &dfPixel, &dfLine);
     }
     const GroundTerms s = GroundOf(lumo::srit::TermsOfRecord(*psModel), dfPixel, dfLine, dfZ);
+    // A record SRITValidate refuses (a zero radius, say) gives no numbers:
+    // no ground point rather than NaN reported as one.
+    if (!std::isfinite(s.dfX) || !std::isfinite(s.dfY)) {
+        lumo::SetNullPair(pdfX, pdfY);
+        return 0;
+    }
     *pdfX = s.dfX;
     *pdfY = s.dfY;
     return 1;
@@ -138,8 +148,9 @@ int SRITImg2GeoDem_imp(const SRITInfo_t* psModel, double dfPixel, double dfLine,
     lumo::SetNullPair(pdfX, pdfY);
     if (pdfZ == nullptr) return 0;
     if (*pdfZ == kNull) *pdfZ = 0.0;
-    SRITImg2Geo_imp(psModel, dfPixel, dfLine, *pdfZ, pdfX, pdfY);
-    return 1;
+    // The answer's status is the transform's: a point it could not map is no
+    // success.
+    return SRITImg2Geo_imp(psModel, dfPixel, dfLine, *pdfZ, pdfX, pdfY);
 }
 
 int SRITGeo2ImgExact(const SRITInfo_t* psModel, double dfX, double dfY, double dfZ,
