@@ -113,10 +113,36 @@ enum LumoRPCTextForm {
 // record (RFDeallocate).
 LUMO_API RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
                                        const char* pszSource);
-// Writes a model as RPC text in the given form. Throws nova::DataException
-// when the model has no RPC equivalent (image-space adjustment in force,
-// ground coordinates not geographic, more than 20 terms, values not finite).
+// Writes a model as RPC text in the given form. An image-space adjustment in
+// force is folded into the offsets, scales and numerators when that is
+// exact: a shift, or an affine change whose cross terms join pixel and line
+// of one shared denominator. Throws nova::DataException when the model has
+// no RPC equivalent (second-order adjustment, cross terms over different
+// denominators, ground coordinates not geographic, more than 20 terms,
+// values not finite).
 LUMO_API std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm);
 // The form of a text: LUMO_RPC_TEXT_TXT, LUMO_RPC_TEXT_RPB, or
 // LUMO_RPC_TEXT_AUTO when it looks like neither.
 LUMO_API int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength);
+
+// The image-space adjustment a fit computes, by its number of terms: a
+// shift (a0, b0), an affine change (a0..a2, b0..b2) or all six terms.
+enum RFAdjustKind {
+    RF_ADJUST_SHIFT = 1,
+    RF_ADJUST_AFFINE = 3,
+    RF_ADJUST_SECOND = 6,
+};
+
+// Fits the image-space adjustment of psRF to nGCP control points (ground X,
+// Y, height and measured pixel, line) by least squares, the bias
+// compensation of a delivered model: the terms of nKind are computed from
+// the rational functions' own pixel and line (the half-pixel shift is the
+// constant's to carry), the others set to 0, and nAdjust to 1. Returns 1,
+// or 0 with the record unchanged when the points do not determine the
+// terms (fewer points than terms; for the affine and second-order kinds,
+// points on a line). A null record or array, an unknown kind, a negative
+// count, a coordinate that is not a number or a point the rational
+// functions cannot map raise fatal error 11 naming it.
+LUMO_API int RFComputeAdjustment(RFInfo_t* psRF, int nKind, int nGCP, const double* padfX,
+                                 const double* padfY, const double* padfZ, const double* padfPixel,
+                                 const double* padfLine);

@@ -216,6 +216,7 @@ TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
 TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
     RecordPtr psRF = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     psRF->nAdjust = 1;
+    psRF->adfPixelAdjust[4] = 1e-9;  // second order: no rational equivalent
     EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT).find("adjustment"), std::string::npos);
     psRF->nAdjust = 0;
     std::strcpy(psRF->pszGeosys, "UTM 31 U D000");

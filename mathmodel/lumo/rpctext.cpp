@@ -403,13 +403,61 @@ void CheckFinite(double dfValue, const char* pszField) {
     }
 }
 
+// True when the pixel and line share one denominator over the terms in use.
+bool SameDenominators(const RFInfo_t* psRF) {
+    for (int i = 0; i < psRF->nTerms; ++i) {
+        if (psRF->padfPixelDen[i] != psRF->padfLineDen[i]) return false;
+    }
+    return true;
+}
+
+// Folds an image-space adjustment in force into the RPC values. With the
+// rational functions' p = SampOff + SampScale Np/Dp (and l likewise), an
+// affine adjustment pixel = a0 + (1 + a1) p + a2 l is again a rational
+// function: a new offset and, without the cross term a2, a new scale. The
+// cross term adds l's Nl/Dl to the pixel's numerator, which needs the line's
+// denominator to be the pixel's. The adjustment's constant carries the
+// half-pixel shift while RPC positions are centre-based, hence the 0.5.
+// Second-order terms have no rational equivalent of third degree.
+void FoldAdjustment(const RFInfo_t* psRF, RpcValues& values) {
+    const double* a = psRF->adfPixelAdjust;
+    const double* b = psRF->adfLineAdjust;
+    for (int k = 3; k < RF_ADJUST_TERMS; ++k) {
+        if (a[k] != 0.0 || b[k] != 0.0) {
+            RPC_REFUSE("the second-order image-space adjustment has no RPC equivalent");
+        }
+    }
+    const bool bCross = a[2] != 0.0 || b[1] != 0.0;
+    if (bCross && !SameDenominators(psRF)) {
+        RPC_REFUSE(
+            "the image-space adjustment mixes pixel and line while their denominators "
+            "differ: no RPC equivalent");
+    }
+    const double Op = psRF->dfPixelOffset, Sp = psRF->dfPixelScale;
+    const double Ol = psRF->dfLineOffset, Sl = psRF->dfLineScale;
+    values.adfScalar[kSampOff] = (1.0 + a[1]) * Op + a[2] * Ol + a[0] - 0.5;
+    values.adfScalar[kLineOff] = b[1] * Op + (1.0 + b[2]) * Ol + b[0] - 0.5;
+    if (!bCross) {
+        values.adfScalar[kSampScale] = (1.0 + a[1]) * Sp;
+        values.adfScalar[kLineScale] = (1.0 + b[2]) * Sl;
+        return;
+    }
+    auto& sampNum = values.aadfCoeff[kSampNum];
+    auto& lineNum = values.aadfCoeff[kLineNum];
+    for (int i = 0; i < std::max(psRF->nTerms, 0); ++i) {
+        const double dfPixelPart = Sp * psRF->padfPixelNum[i];
+        const double dfLinePart = Sl * psRF->padfLineNum[i];
+        sampNum[i] = ((1.0 + a[1]) * dfPixelPart + a[2] * dfLinePart) / Sp;
+        lineNum[i] = (b[1] * dfPixelPart + (1.0 + b[2]) * dfLinePart) / Sl;
+    }
+}
+
 // The record as RPC values; refuses what the text forms cannot express.
 RpcValues RecordToValues(const RFInfo_t* psRF) {
     if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
         psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
         RPC_REFUSE("the model or its coefficient arrays are null");
     }
-    if (psRF->nAdjust) RPC_REFUSE("the image-space adjustment has no RPC equivalent");
     if (psRF->nTerms > RF_MAX_TERMS) {
         RPC_REFUSE("nTerms = " + std::to_string(psRF->nTerms) + " exceeds 20");
     }
@@ -431,12 +479,6 @@ RpcValues RecordToValues(const RFInfo_t* psRF) {
     values.adfScalar[kSampScale] = psRF->dfPixelScale;
     values.adfScalar[kLineOff] = psRF->dfLineOffset + dfShift;
     values.adfScalar[kLineScale] = psRF->dfLineScale;
-    for (int k = 0; k < kScalarCount; ++k) {
-        CheckFinite(values.adfScalar[k], kTxtScalarKeys[k]);
-        if (k >= kLineScale && values.adfScalar[k] == 0.0) {
-            RPC_REFUSE(std::string(kTxtScalarKeys[k]) + " is 0");
-        }
-    }
     // Terms beyond nTerms do not take part in the model: written as 0.
     const int nTerms = std::max(psRF->nTerms, 0);
     for (int i = 0; i < nTerms; ++i) {
@@ -444,6 +486,15 @@ RpcValues RecordToValues(const RFInfo_t* psRF) {
         values.aadfCoeff[kSampDen][i] = psRF->padfPixelDen[i];
         values.aadfCoeff[kLineNum][i] = psRF->padfLineNum[i];
         values.aadfCoeff[kLineDen][i] = psRF->padfLineDen[i];
+    }
+    if (psRF->nAdjust) FoldAdjustment(psRF, values);
+    for (int k = 0; k < kScalarCount; ++k) {
+        CheckFinite(values.adfScalar[k], kTxtScalarKeys[k]);
+        if (k >= kLineScale && values.adfScalar[k] == 0.0) {
+            RPC_REFUSE(std::string(kTxtScalarKeys[k]) + " is 0");
+        }
+    }
+    for (int i = 0; i < nTerms; ++i) {
         for (int nList = 0; nList < kListCount; ++nList) {
             CheckFinite(values.aadfCoeff[nList][i], kTxtListPrefixes[nList]);
         }
