@@ -18,6 +18,7 @@
 #include "block_io.h"
 #include "cli_error.h"
 #include "commands.h"
+#include "fit_refine.h"
 #include "model_io.h"
 #include "nova/projection.h"
 #include "segment_io.h"
@@ -30,8 +31,13 @@ namespace {
 struct BlockOptions {
     std::string osProject;
     std::string osOutputDir;
-    bool bConstrain = false;  // hold every image's P3 ... P7 near their orbit values
+    bool bConstrain = false;      // hold every image's P3 ... P7 near their orbit values
+    bool bNoLeaveOneOut = false;  // skip the one adjustment per control observation
+    std::string osRefine;         // --refine TOLERANCE[,MIN_POINTS]
 };
+
+// A block needs 3 control observations.
+constexpr int kBlockLeastControl = 3;
 
 // Identifier padded with blanks to the library's fixed width.
 std::string Padded(const std::string& text) {
@@ -235,8 +241,106 @@ std::vector<std::size_t> FirstTieObservations(const BlockProject& project) {
     return first;
 }
 
+// The control observations that take part in the adjustment (not check
+// points, with a height), named IMAGE/POINT for the residual table.
+struct ControlObservations {
+    PointSet points;
+    std::vector<std::size_t> index;  // into the project's control observations
+};
+
+ControlObservations UsedControl(const BlockProject& project) {
+    ControlObservations c;
+    c.points.osSource = project.osSource;
+    c.points.bHasId = true;
+    for (std::size_t i = 0; i < project.asGcps.size(); ++i) {
+        const BlockGcp& g = project.asGcps[i];
+        if (g.bCheck || g.dfZ == LUMO_NULL_VALUE) continue;
+        PointRecord p;
+        p.osId = g.osImage + "/" + g.osPoint;
+        p.dfPixel = g.dfPixel;
+        p.dfLine = g.dfLine;
+        c.points.asPoints.push_back(p);
+        c.index.push_back(i);
+    }
+    return c;
+}
+
+// The project without the control observations whose flag in `use` is clear.
+BlockProject Without(const BlockProject& project, const ControlObservations& c,
+                     const std::vector<char>& use) {
+    std::vector<char> drop(project.asGcps.size(), 0);
+    for (std::size_t k = 0; k < use.size(); ++k) drop[c.index[k]] = use[k] ? 0 : 1;
+    BlockProject kept = project;
+    kept.asGcps.clear();
+    for (std::size_t i = 0; i < project.asGcps.size(); ++i) {
+        if (!drop[i]) kept.asGcps.push_back(project.asGcps[i]);
+    }
+    return kept;
+}
+
+std::size_t ImageIndex(const BlockProject& project, const std::string& id) {
+    for (std::size_t k = 0; k < project.asImages.size(); ++k) {
+        if (Upper(project.asImages[k].osId) == Upper(id)) return k;
+    }
+    return 0;  // MakeArrays has refused observations of unknown images
+}
+
+// The block adjusted with some of the control observations, mapping every
+// observation into its image.
+ImageFit BlockImageFit(const BlockProject& project, const ControlObservations& c, bool bConstrain) {
+    return [&project, &c, bConstrain](const std::vector<char>& use, std::vector<double>& pixel,
+                                      std::vector<double>& line) {
+        try {
+            const BlockResult r = ComputeBlock(Without(project, c, use), bConstrain);
+            pixel.resize(c.index.size());
+            line.resize(c.index.size());
+            for (std::size_t k = 0; k < c.index.size(); ++k) {
+                const BlockGcp& g = project.asGcps[c.index[k]];
+                const SRITInfo_t& model = *r.models[ImageIndex(project, g.osImage)];
+                if (!SritToImage(model, g.dfX, g.dfY, g.dfZ, &pixel[k], &line[k]) ||
+                    !IsPosition(pixel[k], line[k])) {
+                    return false;
+                }
+            }
+        } catch (const nova::DataException&) {
+            return false;  // too few observations left; the final run says why
+        }
+        return true;
+    };
+}
+
+// Each control observation's residual and leave-one-out residual for the
+// report.
+nlohmann::json ObservationResiduals(const ControlObservations& c, const FitResiduals& residuals) {
+    nlohmann::json list = nlohmann::json::array();
+    for (std::size_t k = 0; k < c.index.size(); ++k) {
+        const PointResidual& r = residuals.asPoints[k];
+        nlohmann::json item{{"observation", c.points.asPoints[k].osId},
+                            {"residual", {r.dfPixel, r.dfLine}}};
+        if (r.bLoo) item["leaveOneOut"] = {r.dfLooPixel, r.dfLooLine};
+        if (r.bDropped) item["dropped"] = true;
+        list.push_back(item);
+    }
+    return list;
+}
+
 void RunBlock(const BlockOptions& options, CommandContext& context) {
-    const BlockProject project = ReadBlockProject(options.osProject);
+    const BlockProject allControl = ReadBlockProject(options.osProject);
+    const RefineOptions refine =
+        options.osRefine.empty() ? RefineOptions{} : ParseRefine(options.osRefine);
+    if (refine.bEnabled && options.bNoLeaveOneOut) {
+        throw CLI::ValidationError(
+            "--refine needs the leave-one-out residuals: drop "
+            "--no-leave-one-out");
+    }
+    const ControlObservations control = UsedControl(allControl);
+    FitResiduals residuals;
+    if (!options.bNoLeaveOneOut) {
+        residuals = RefineAndMeasure(BlockImageFit(allControl, control, options.bConstrain),
+                                     control.points, kBlockLeastControl, refine);
+    }
+    const BlockProject project =
+        residuals.anDropped.empty() ? allControl : Without(allControl, control, residuals.use);
     BlockResult r = ComputeBlock(project, options.bConstrain);
     const BlockArrays& a = r.a;
     const auto& models = r.models;
@@ -278,6 +382,10 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
         report["tiePoints"].push_back({{"point", tie.osPoint},
                                        {"elevationGiven", tie.dfZ != LUMO_NULL_VALUE},
                                        {"ground", Triple(a.tx[i], a.ty[i], a.tz[i])}});
+    }
+    if (residuals.bFitted) {
+        report["controlObservations"] = ObservationResiduals(control, residuals);
+        PrintPointResiduals(context.out, control.points, residuals);
     }
     const std::string reportPath =
         (std::filesystem::path(options.osOutputDir) / "report.json").string();
@@ -325,6 +433,13 @@ void AddBlockCommand(CLI::App& app, CommandContext& context) {
                       "hold every image's scale, obliquity and shear terms near the values of "
                       "its orbit (as a segment's constraint flag does); steadies images whose "
                       "few control points cannot separate the elevation terms");
+    command->add_option("--refine", options->osRefine,
+                        "TOLERANCE[,MIN_POINTS]: drop the control observation with the largest "
+                        "leave-one-out residual beyond TOLERANCE pixels and adjust again, until "
+                        "none is beyond it or MIN_POINTS are left");
+    command->add_flag("--no-leave-one-out", options->bNoLeaveOneOut,
+                      "skip the leave-one-out residuals (one more adjustment per control "
+                      "observation)");
     command->callback([options, &context] { RunBlock(*options, context); });
 }
 

@@ -6,6 +6,7 @@
 #include <iosfwd>
 #include <string>
 
+#include "fit_refine.h"
 #include "model_io.h"
 #include "point_prep.h"
 #include "transform.h"
@@ -48,8 +49,24 @@ void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 // `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
 // from control points with heights, ground coordinates in `geosys` (empty:
 // the segment's), written to `outputPath`.
+// With `refine` enabled, blunders are dropped first (see fit_refine.h).
 void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
-                const std::string& outputPath, CommandContext& context);
+                const std::string& outputPath, const RefineOptions& refine,
+                CommandContext& context);
+
+// `lumo fit --model rf`: the image-space adjustment of the model in `osRpc`
+// (any of its forms) fitted to control points with heights, written to
+// `osOutput` in the form its extension names.
+struct RFFitOptions {
+    std::string osRpc;
+    std::string osAdjust = "affine";  // shift, affine or second
+    std::string osOutput;
+    int nPixels = -1;  // -1: the input model file's, else 0
+    int nLines = -1;
+    PointFileOptions sPoints;  // --geosys of the control points
+    RefineOptions sRefine;
+};
+void RunRFFit(PointSet& gcps, const RFFitOptions& options, CommandContext& context);
 
 // `lumo fit --model rtcs`: the radar model of the image of `segmentPath` from
 // the control points (with heights in `heightRef`, "E" or "M") of `gcps`,

@@ -1,6 +1,7 @@
-// `lumo fit --model poly|tps --gcps FILE [--order N] --geosys TEXT -o MODEL`:
-// fits a polynomial or thin plate spline model to control points, both
-// directions, and writes it as a model file.
+// `lumo fit --model poly|tps|srit|rf --gcps FILE ... -o MODEL`: fits a
+// polynomial or thin plate spline model to control points, both directions,
+// and writes it as a model file; the rigorous model and the rational
+// function adjustment have their own files.
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
@@ -15,6 +16,7 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#include "fit_refine.h"
 #include "nova/projection.h"
 #include "nova/regression.h"
 #include "points_io.h"
@@ -37,11 +39,14 @@ struct FitOptions {
     std::string osOutput;
     std::string osSegment;    // srit and rtcs only
     std::string osHeightRef;  // rtcs only
+    std::string osRpc;        // rf only
+    std::string osAdjust;     // rf only
     int nOrder = 0;           // 0: not given
     int nPixels = -1;         // -1: from the control points
     int nLines = -1;
     bool bAllowLowerOrder = false;  // write a lower order than asked for instead of failing
     PointFileOptions sPoints;       // --height
+    std::string osRefine;           // --refine TOLERANCE[,MIN_POINTS]
 };
 
 // The control points as the parallel arrays the fitting functions take.
@@ -214,6 +219,48 @@ TpsPtr FitTps(ControlArrays& c, CommandContext& context) {
     return tps;
 }
 
+// Ground-to-image polynomial of the given order, fitted to some of the points.
+ImageFit PolyImageFit(const ControlArrays& c, const std::string& geosys, int order) {
+    return [&c, geosys, order](const std::vector<char>& use, std::vector<double>& pixel,
+                               std::vector<double>& line) {
+        std::vector<double> x = Subset(c.x, use), y = Subset(c.y, use);
+        std::vector<double> p = Subset(c.pixel, use), l = Subset(c.line, use);
+        if (static_cast<int>(x.size()) < (order + 1) * (order + 2) / 2) return false;
+        GEOInfo_t fit{};
+        int nOrder = order;
+        GCPRegression2(&fit, geosys.c_str(), x.data(), y.data(), "PIXEL", p.data(), l.data(),
+                       static_cast<int>(x.size()), &nOrder, 0, nullptr, nullptr);
+        if (fit.nFitKind != GCP_FIT_POLYNOMIAL || nOrder != order) return false;
+        pixel.resize(c.pixel.size());
+        line.resize(c.pixel.size());
+        for (int i = 0; i < c.Count(); ++i) GCPTransform(&fit, c.x[i], c.y[i], &pixel[i], &line[i]);
+        return true;
+    };
+}
+
+// Ground-to-image spline through some of the points; false where the
+// points make the system singular.
+ImageFit TpsImageFit(const ControlArrays& c) {
+    return
+        [&c](const std::vector<char>& use, std::vector<double>& pixel, std::vector<double>& line) {
+            std::vector<double> x = Subset(c.x, use), y = Subset(c.y, use);
+            std::vector<double> p = Subset(c.pixel, use), l = Subset(c.line, use);
+            if (x.empty()) return false;
+            TPSInfo_t spline(static_cast<int>(x.size()));
+            try {
+                TPSCalculate(&spline, static_cast<int>(x.size()), x.data(), y.data(), p.data(),
+                             l.data());
+            } catch (const nova::NumberedError&) {
+                return false;
+            }
+            pixel.resize(c.pixel.size());
+            line.resize(c.pixel.size());
+            for (int i = 0; i < c.Count(); ++i)
+                TPSTransform(&spline, c.x[i], c.y[i], &pixel[i], &line[i]);
+            return true;
+        };
+}
+
 // The georeferencing of the control points' ground coordinates: --geosys,
 // else the file's "# geosys:" comment (the two must agree).
 std::string FitGeosys(const FitOptions& options, const PointSet& gcps) {
@@ -240,14 +287,41 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     if (!bRadar && !options.osHeightRef.empty()) {
         throw CLI::ValidationError("--height-ref applies to --model rtcs only");
     }
+    if (options.osModel != "rf" && (!options.osRpc.empty() || !options.osAdjust.empty())) {
+        throw CLI::ValidationError("--rpc and --adjust apply to --model rf only");
+    }
+    if (options.osModel == "tps" && !options.osRefine.empty()) {
+        throw CLI::ValidationError(
+            "--refine does not apply to --model tps: a spline passes through every control "
+            "point; its leave-one-out residuals are reported without it");
+    }
+    if (bRadar && !options.osRefine.empty()) {
+        throw CLI::ValidationError("--refine applies to --model poly, srit and rf");
+    }
+    const RefineOptions refine =
+        options.osRefine.empty() ? RefineOptions{} : ParseRefine(options.osRefine);
     PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    if (options.osModel == "rf") {
+        ApplyHeights(gcps, options.sPoints, true, "the rational function model");
+        RFFitOptions rf;
+        rf.osRpc = options.osRpc;
+        if (!options.osAdjust.empty()) rf.osAdjust = options.osAdjust;
+        rf.osOutput = options.osOutput;
+        rf.nPixels = options.nPixels;
+        rf.nLines = options.nLines;
+        rf.sPoints = options.sPoints;
+        rf.sPoints.osGeosys = options.osGeosys;
+        rf.sRefine = refine;
+        RunRFFit(gcps, rf, context);
+        return;
+    }
     const bool bRigorous = options.osModel == "srit";
     ApplyHeights(gcps, options.sPoints, bRigorous || bRadar,
                  bRadar ? "the radar model" : "the rigorous model");
     const std::string geosys = FitGeosys(options, gcps);
     if (bRigorous) {
-        RunSritFit(gcps, options.osSegment, geosys, options.osOutput, context);
+        RunSritFit(gcps, options.osSegment, geosys, options.osOutput, refine, context);
         return;
     }
     if (bRadar) {
@@ -262,6 +336,13 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     ProjInfo_t projInfo{};
     CheckGeosys(geosys, &projInfo);
     ControlArrays c = ToArrays(gcps);
+    const bool bPoly = options.osModel == "poly";
+    const int requested = options.nOrder == 0 ? 1 : options.nOrder;
+    const FitResiduals residuals =
+        bPoly ? RefineAndMeasure(PolyImageFit(c, geosys, requested), gcps,
+                                 (requested + 1) * (requested + 2) / 2, refine)
+              : RefineAndMeasure(TpsImageFit(c), gcps, 1, refine);
+    if (!residuals.anDropped.empty()) c = ToArrays(KeptPoints(gcps, residuals));
     int nPixels = 0;
     int nLines = 0;
     ImageSize(options, c, nPixels, nLines);
@@ -282,6 +363,7 @@ void RunFit(const FitOptions& options, CommandContext& context) {
         *tps->psProjInfo = projInfo;
         document = TpsToJson(*tps);
     }
+    PrintPointResiduals(context.out, gcps, residuals);
     WriteModelFile(options.osOutput, document);
     context.out << "wrote " << options.osOutput << "\n";
 }
@@ -291,10 +373,12 @@ void RunFit(const FitOptions& options, CommandContext& context) {
 void AddFitCommand(CLI::App& app, CommandContext& context) {
     auto options = std::make_shared<FitOptions>();
     CLI::App* command = app.add_subcommand(
-        "fit", "Fit a polynomial, thin plate spline, rigorous or radar model to control points");
-    command->add_option("--model", options->osModel, "model family: poly, tps, srit or rtcs")
+        "fit",
+        "Fit a polynomial, thin plate spline, rigorous or radar model to control points, or "
+        "adjust a rational function model to them");
+    command->add_option("--model", options->osModel, "model family: poly, tps, srit, rtcs or rf")
         ->required()
-        ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs"}));
+        ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs", "rf"}));
     command->add_option("--segment", options->osSegment,
                         "ephemeris segment of the image (JSON; srit and rtcs)");
     command
@@ -302,13 +386,20 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
                      "rtcs: heights of the control points are above the ellipsoid (E) or mean "
                      "sea level (M); the model then takes heights the same way")
         ->check(CLI::IsMember({"E", "M"}));
+    command->add_option("--rpc", options->osRpc,
+                        "rf: the model to adjust (RPC text, binary block or JSON model file)");
+    command
+        ->add_option("--adjust", options->osAdjust,
+                     "rf: image-space adjustment fitted to the control points: shift (1 point "
+                     "or more), affine (3; the default) or second (second order, 6)")
+        ->check(CLI::IsMember({"shift", "affine", "second"}));
     command->add_option("--gcps", options->osGcps, "control points (CSV with pixel,line,x,y)")
         ->required();
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
         ->check(CLI::Range(1, GCP_MAX_ORDER));
     command->add_option("--geosys", options->osGeosys,
                         "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
-                        "(srit: default the segment's)");
+                        "(srit: default the segment's; rf: converted to the model's)");
     command
         ->add_option("--pixels", options->nPixels,
                      "image width (default: just above the largest control point pixel)")
@@ -321,7 +412,14 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
                       "poly: write the lower order the control points determine instead of "
                       "failing");
     AddHeightOption(*command, options->sPoints);
-    command->add_option("-o,--output", options->osOutput, "model file to write (JSON)")->required();
+    command->add_option("--refine", options->osRefine,
+                        "TOLERANCE[,MIN_POINTS]: drop the control point with the largest "
+                        "leave-one-out residual beyond TOLERANCE pixels and refit, until none "
+                        "is beyond it or MIN_POINTS are left (poly, srit, rf)");
+    command
+        ->add_option("-o,--output", options->osOutput,
+                     "model file to write (JSON; rf: .txt, .rpb, .bin or .json by extension)")
+        ->required();
     command->callback([options, &context] { RunFit(*options, context); });
 }
 

@@ -18,12 +18,6 @@ namespace {
 // Failed points named one by one on standard error; the rest are counted.
 constexpr std::size_t kNamedFailures = 5;
 
-std::string PointName(const PointSet& points, const PointRecord& p) {
-    std::string name = points.osSource + ":" + std::to_string(p.nSourceLine);
-    if (!p.osId.empty()) name += " (id " + Quoted(p.osId) + ")";
-    return name;
-}
-
 Georef MakeGeoref(const std::string& osGeosys, const std::string& osProjParms,
                   const std::string& osWhere) {
     Georef g;
@@ -109,6 +103,12 @@ void AddPointFileOptions(CLI::App& command, PointFileOptions& options) {
     AddHeightOption(command, options);
     command.add_flag("--keep-going", options.bKeepGoing,
                      "exit with status 0 even when some points fail");
+}
+
+std::string PointName(const PointSet& points, const PointRecord& p) {
+    std::string name = points.osSource + ":" + std::to_string(p.nSourceLine);
+    if (!p.osId.empty()) name += " (id " + Quoted(p.osId) + ")";
+    return name;
 }
 
 bool IsPosition(double a, double b) {

@@ -32,6 +32,9 @@ void AddHeightOption(CLI::App& command, PointFileOptions& options);
 // Adds --geosys, --height and --keep-going to a command.
 void AddPointFileOptions(CLI::App& command, PointFileOptions& options);
 
+// A point as messages name it: file and line, and its id when it has one.
+std::string PointName(const PointSet& points, const PointRecord& p);
+
 // True for a real position: both values finite and neither the null value.
 bool IsPosition(double a, double b);
 

@@ -1,0 +1,190 @@
+// Control point blunders: `lumo fit --refine` finds and drops them for the
+// polynomial and the rational function adjustment, the refit equals the fit
+// without them, and leave-one-out residuals agree with a fit made here
+// without the point.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <filesystem>
+#include <random>
+#include <regex>
+#include <string>
+#include <vector>
+
+#include <nlohmann/json.hpp>
+
+#include "lumo.h"
+#include "points_io.h"
+#include "support/cli_runner.h"
+#include "support/model_records.h"
+
+namespace {
+
+using lumo::cli::FormatDouble;
+using lumo::support::ReadText;
+using lumo::support::RunTool;
+
+class FitRefine : public lumo::support::ScratchDirTest {
+  protected:
+    FitRefine() : ScratchDirTest("lumo_refine_") {}
+
+    // 30 control points of the scene: an affine image of a 60 km UTM square
+    // with 0.2 px noise, or (rf) the bundled rational function model's
+    // image of the same area in longitude and latitude. Points 4, 17 and 25
+    // are blunders of 20, 35 and 50 px. Writes the file with and without
+    // them.
+    void WritePoints(bool bRf) {
+        RFInfo_t* psRF = nullptr;
+        lumo::support::RfPtr rf;
+        if (bRf) {
+            const std::string text =
+                ReadText(std::string(LUMO_SOURCE_DIR) + "/examples/rf_scene_RPC.TXT");
+            rf.reset(LumoRPCTextToRFInfo(text.data(), text.size(), LUMO_RPC_TEXT_AUTO, "t"));
+            psRF = rf.get();
+        }
+        std::mt19937 rng(11);
+        std::normal_distribution<double> noise(0.0, 0.2);
+        std::uniform_real_distribution<double> unit(0.0, 1.0);
+        std::string all = "id,pixel,line,x,y,z\n", clean = all;
+        for (int i = 1; i <= 30; ++i) {
+            const double u = unit(rng), v = unit(rng), z = 300.0 + 1000.0 * unit(rng);
+            double x = 0.0, y = 0.0, p = 0.0, l = 0.0;
+            if (bRf) {
+                x = 7.35 + 0.2 * u;
+                y = 46.88 + 0.14 * v;
+                RFGeo2Img(psRF, x, y, z, &p, &l);
+                p += 4.0 + 1e-4 * p;  // the bias the adjustment takes out
+                l -= 3.0;
+            } else {
+                x = 440000.0 + 60000.0 * u;
+                y = 5660000.0 + 60000.0 * v;
+                p = (x - 440000.0) / 10.0 + 0.002 * (y - 5660000.0);
+                l = (5720000.0 - y) / 10.0 + 0.001 * (x - 440000.0);
+            }
+            p += noise(rng);
+            l += noise(rng);
+            const std::string row =
+                "," + FormatDouble(x) + "," + FormatDouble(y) + "," + FormatDouble(z) + "\n";
+            const std::string id = "P" + std::to_string(i);
+            clean += i == 4 || i == 17 || i == 25
+                         ? ""
+                         : id + "," + FormatDouble(p) + "," + FormatDouble(l) + row;
+            if (i == 4) p += 20.0;
+            if (i == 17) l -= 35.0;
+            if (i == 25) p += 30.0, l += 40.0;
+            all += id + "," + FormatDouble(p) + "," + FormatDouble(l) + row;
+        }
+        Write("all.csv", all);
+        Write("clean.csv", clean);
+    }
+
+    std::vector<std::string> FitArgs(bool bRf, const std::string& gcps,
+                                     const std::string& out) const {
+        if (bRf) {
+            return {"fit",
+                    "--model",
+                    "rf",
+                    "--rpc",
+                    std::string(LUMO_SOURCE_DIR) + "/examples/rf_scene_RPC.TXT",
+                    "--gcps",
+                    gcps,
+                    "-o",
+                    out};
+        }
+        return {"fit", "--model", "poly", "--geosys", "UTM 31 U D000", "--gcps", gcps, "-o", out};
+    }
+};
+
+TEST_F(FitRefine, BlundersAreDroppedAndTheRefitEqualsTheCleanFit) {
+    for (const bool bRf : {false, true}) {
+        WritePoints(bRf);
+        std::vector<std::string> args = FitArgs(bRf, Path("all.csv"), Path("refined.json"));
+        args.insert(args.end(), {"--refine", "3"});
+        const auto refined = RunTool(args);
+        ASSERT_EQ(refined.nCode, 0) << refined.osErr;
+        std::smatch dropped;
+        const std::string out = refined.osOut;
+        ASSERT_TRUE(std::regex_search(out, dropped, std::regex("dropped by --refine.*")));
+        const std::string list = dropped.str();
+        for (const char* id : {"P4 ", "P17 ", "P25 "}) {
+            EXPECT_NE(list.find(id), std::string::npos) << id << " in " << out;
+        }
+        EXPECT_EQ(std::count(list.begin(), list.end(), '('), 3) << out;
+        ASSERT_EQ(RunTool(FitArgs(bRf, Path("clean.csv"), Path("clean.json"))).nCode, 0);
+        const auto a = nlohmann::json::parse(ReadText(Path("refined.json")));
+        const auto b = nlohmann::json::parse(ReadText(Path("clean.json")));
+        const char* section = bRf ? "rf" : "poly";
+        for (const char* key : bRf ? std::vector<const char*>{"pixelAdjust", "lineAdjust"}
+                                   : std::vector<const char*>{"pixelCoeffs", "lineCoeffs"}) {
+            ASSERT_TRUE(a[section].contains(key)) << key;
+            for (std::size_t k = 0; k < a[section][key].size(); ++k) {
+                const double va = a[section][key][k], vb = b[section][key][k];
+                EXPECT_NEAR(va, vb, 1e-9 * (1.0 + std::fabs(vb))) << key << k;
+            }
+        }
+        // Without --refine the blunders are only reported: the leave-one-out
+        // residual of P25 is the blunder's size and beyond that of any other.
+        const auto reported = RunTool(FitArgs(bRf, Path("all.csv"), Path("all.json")));
+        ASSERT_EQ(reported.nCode, 0);
+        std::smatch row;
+        ASSERT_TRUE(
+            std::regex_search(reported.osOut, row, std::regex("P25 +\\S+ +\\S+ +(\\S+) +(\\S+)")));
+        EXPECT_NEAR(std::hypot(std::stod(row[1]), std::stod(row[2])), 50.0, 4.0) << row.str();
+        EXPECT_EQ(reported.osOut.find("dropped"), std::string::npos);
+    }
+}
+
+TEST_F(FitRefine, BadValuesAndTheSplineAreRefused) {
+    WritePoints(false);
+    for (const char* bad : {"0", "-1", "x", "3,", "3,0", "3,a", "nan"}) {
+        std::vector<std::string> args = FitArgs(false, Path("all.csv"), Path("m.json"));
+        args.insert(args.end(), {"--refine", bad});
+        const auto run = RunTool(args);
+        EXPECT_EQ(run.nCode, 2) << bad;
+        EXPECT_NE(run.osErr.find("--refine"), std::string::npos) << run.osErr;
+    }
+    std::vector<std::string> args = FitArgs(false, Path("all.csv"), Path("m.json"));
+    args.insert(args.end(), {"--refine", "3,2"});  // below the 3 points of order 1
+    EXPECT_EQ(RunTool(args).nCode, 1);
+    const auto tps = RunTool({"fit", "--model", "tps", "--geosys", "UTM 31 U D000", "--gcps",
+                              Path("all.csv"), "--refine", "3", "-o", Path("t.json")});
+    EXPECT_EQ(tps.nCode, 2);
+    EXPECT_NE(tps.osErr.find("leave-one-out"), std::string::npos) << tps.osErr;
+    EXPECT_FALSE(std::filesystem::exists(Path("m.json")));
+}
+
+// In a block the check points of the bundled stereo pair become control
+// points and one observation is a 30 px blunder: --refine drops it alone,
+// and the report gives every observation's residuals.
+TEST_F(FitRefine, BlockDropsTheBlunderedObservation) {
+    const std::string examples = std::string(LUMO_SOURCE_DIR) + "/examples/";
+    nlohmann::json project = nlohmann::json::parse(ReadText(examples + "block_stereo.json"));
+    for (auto& image : project["images"])
+        image["segment"] = examples + image["segment"].get<std::string>();
+    for (auto& g : project["gcps"]) {
+        g.erase("check");
+        if (g["image"] == "left" && g["point"] == "G3")
+            g["pixel"] = g["pixel"].get<double>() + 30.0;
+    }
+    const std::string path = Write("block.json", project.dump());
+    const auto run = RunTool({"block", path, "-o", Path("out"), "--refine", "2"});
+    ASSERT_EQ(run.nCode, 0) << run.osErr;
+    std::smatch dropped;
+    ASSERT_TRUE(std::regex_search(run.osOut, dropped, std::regex("dropped by --refine.*")))
+        << run.osOut;
+    const std::string list = dropped.str();
+    EXPECT_NE(list.find("left/G3 "), std::string::npos) << list;
+    EXPECT_EQ(std::count(list.begin(), list.end(), '('), 1) << list;
+    const auto report = nlohmann::json::parse(ReadText(Path("out/report.json")));
+    ASSERT_EQ(report["controlObservations"].size(), 24u);
+    for (const auto& item : report["controlObservations"]) {
+        const bool bBlunder = item["observation"] == "left/G3";
+        EXPECT_EQ(item.value("dropped", false), bBlunder);
+        const double d =
+            std::hypot(item["leaveOneOut"][0].get<double>(), item["leaveOneOut"][1].get<double>());
+        EXPECT_TRUE(bBlunder ? d > 25.0 : d < 2.0) << item.dump();
+    }
+}
+
+}  // namespace
