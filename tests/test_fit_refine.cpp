@@ -1,7 +1,6 @@
-// Control point blunders: `lumo fit --refine` finds and drops them for the
-// polynomial and the rational function adjustment, the refit equals the fit
-// without them, and leave-one-out residuals agree with a fit made here
-// without the point.
+// Control point blunders: `lumo fit --refine` and `lumo block --refine` find
+// and drop them, the refit equals the fit without them, leave-one-out
+// residuals show a blunder whole; and the refusals of fit.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -22,6 +21,7 @@
 namespace {
 
 using lumo::cli::FormatDouble;
+const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples/";
 using lumo::support::ReadText;
 using lumo::support::RunTool;
 
@@ -38,8 +38,7 @@ class FitRefine : public lumo::support::ScratchDirTest {
         RFInfo_t* psRF = nullptr;
         lumo::support::RfPtr rf;
         if (bRf) {
-            const std::string text =
-                ReadText(std::string(LUMO_SOURCE_DIR) + "/examples/rf_scene_RPC.TXT");
+            const std::string text = ReadText(kExamples + "rf_scene_RPC.TXT");
             rf.reset(LumoRPCTextToRFInfo(text.data(), text.size(), LUMO_RPC_TEXT_AUTO, "t"));
             psRF = rf.get();
         }
@@ -81,18 +80,13 @@ class FitRefine : public lumo::support::ScratchDirTest {
 
     std::vector<std::string> FitArgs(bool bRf, const std::string& gcps,
                                      const std::string& out) const {
+        std::vector<std::string> args = {"fit", "--gcps", gcps, "-o", out, "--model"};
         if (bRf) {
-            return {"fit",
-                    "--model",
-                    "rf",
-                    "--rpc",
-                    std::string(LUMO_SOURCE_DIR) + "/examples/rf_scene_RPC.TXT",
-                    "--gcps",
-                    gcps,
-                    "-o",
-                    out};
+            args.insert(args.end(), {"rf", "--rpc", kExamples + "rf_scene_RPC.TXT"});
+        } else {
+            args.insert(args.end(), {"poly", "--geosys", "UTM 31 U D000"});
         }
-        return {"fit", "--model", "poly", "--geosys", "UTM 31 U D000", "--gcps", gcps, "-o", out};
+        return args;
     }
 };
 
@@ -103,6 +97,7 @@ TEST_F(FitRefine, BlundersAreDroppedAndTheRefitEqualsTheCleanFit) {
         args.insert(args.end(), {"--refine", "3"});
         const auto refined = RunTool(args);
         ASSERT_EQ(refined.nCode, 0) << refined.osErr;
+        EXPECT_EQ(refined.osOut.find("residuals before") != std::string::npos, bRf);
         std::smatch dropped;
         const std::string out = refined.osOut;
         ASSERT_TRUE(std::regex_search(out, dropped, std::regex("dropped by --refine.*")));
@@ -135,37 +130,54 @@ TEST_F(FitRefine, BlundersAreDroppedAndTheRefitEqualsTheCleanFit) {
     }
 }
 
-TEST_F(FitRefine, BadValuesAndTheSplineAreRefused) {
+// Bad --refine values, the spline, and for the rational function model an
+// output form that cannot carry the adjustment (the bundled model's pixel
+// and line denominators differ) or too few points are refused, and nothing
+// is written; a shift goes to RPC text.
+TEST_F(FitRefine, RefusalsWriteNothing) {
     WritePoints(false);
-    for (const char* bad : {"0", "-1", "x", "3,", "3,0", "3,a", "nan"}) {
-        std::vector<std::string> args = FitArgs(false, Path("all.csv"), Path("m.json"));
-        args.insert(args.end(), {"--refine", bad});
-        const auto run = RunTool(args);
+    const auto fit = [this](bool bRf, const std::string& out, std::vector<std::string> extra) {
+        std::vector<std::string> args = FitArgs(bRf, Path(bRf ? "all.csv" : "poly.csv"), Path(out));
+        args.insert(args.end(), extra.begin(), extra.end());
+        return RunTool(args);
+    };
+    std::filesystem::rename(Path("all.csv"), Path("poly.csv"));
+    for (const char* bad : {"0", "x", "3,0", "nan"}) {
+        const auto run = fit(false, "m.json", {"--refine", bad});
         EXPECT_EQ(run.nCode, 2) << bad;
         EXPECT_NE(run.osErr.find("--refine"), std::string::npos) << run.osErr;
     }
-    std::vector<std::string> args = FitArgs(false, Path("all.csv"), Path("m.json"));
-    args.insert(args.end(), {"--refine", "3,2"});  // below the 3 points of order 1
-    EXPECT_EQ(RunTool(args).nCode, 1);
+    EXPECT_EQ(fit(false, "m.json", {"--refine", "3,2"}).nCode, 1);  // below order 1's 3 points
+    EXPECT_EQ(fit(false, "m.json", {"--adjust", "shift"}).nCode, 2);
     const auto tps = RunTool({"fit", "--model", "tps", "--geosys", "UTM 31 U D000", "--gcps",
-                              Path("all.csv"), "--refine", "3", "-o", Path("t.json")});
+                              Path("poly.csv"), "--refine", "3", "-o", Path("m.json")});
     EXPECT_EQ(tps.nCode, 2);
     EXPECT_NE(tps.osErr.find("leave-one-out"), std::string::npos) << tps.osErr;
-    EXPECT_FALSE(std::filesystem::exists(Path("m.json")));
+
+    WritePoints(true);
+    const auto text = fit(true, "adj_RPC.TXT", {});
+    EXPECT_EQ(text.nCode, 1);
+    EXPECT_NE(text.osErr.find("no RPC equivalent"), std::string::npos) << text.osErr;
+    EXPECT_EQ(fit(true, "shift.RPB", {"--adjust", "shift"}).nCode, 0);
+    Write("all.csv", "pixel,line,x,y,z\n1,2,7.4,46.9,0\n3,4,7.5,47,0\n");
+    const auto few = fit(true, "few.json", {});
+    EXPECT_NE(few.osErr.find("found 2"), std::string::npos) << few.osErr;
+    for (const char* name : {"m.json", "adj_RPC.TXT", "few.json"}) {
+        EXPECT_FALSE(std::filesystem::exists(Path(name))) << name;
+    }
 }
 
 // In a block the check points of the bundled stereo pair become control
 // points and one observation is a 30 px blunder: --refine drops it alone,
 // and the report gives every observation's residuals.
 TEST_F(FitRefine, BlockDropsTheBlunderedObservation) {
-    const std::string examples = std::string(LUMO_SOURCE_DIR) + "/examples/";
-    nlohmann::json project = nlohmann::json::parse(ReadText(examples + "block_stereo.json"));
-    for (auto& image : project["images"])
-        image["segment"] = examples + image["segment"].get<std::string>();
+    nlohmann::json project = nlohmann::json::parse(ReadText(kExamples + "block_stereo.json"));
+    for (auto& image : project["images"]) {
+        image["segment"] = kExamples + image["segment"].get<std::string>();
+    }
     for (auto& g : project["gcps"]) {
         g.erase("check");
-        if (g["image"] == "left" && g["point"] == "G3")
-            g["pixel"] = g["pixel"].get<double>() + 30.0;
+        if (g["image"] == "left" && g["point"] == "G3") g["pixel"] = g["pixel"].get<double>() + 30;
     }
     const std::string path = Write("block.json", project.dump());
     const auto run = RunTool({"block", path, "-o", Path("out"), "--refine", "2"});

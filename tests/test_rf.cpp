@@ -30,26 +30,8 @@ class QuietWarnings {
     nova::ErrorSink moPrevious;
 };
 
-// A frame-like scene near 7.45 E 46.95 N: mostly linear, with cubic terms
-// and a first-order denominator as a perspective view has.
 RecordPtr SceneModel() {
-    RecordPtr psRF = AllocateRf(20);
-    lumo::support::SetRfSceneFrame(*psRF);
-    const std::array<double, 20> adfPixelNum = {0.002, 1.2,   0.05, 0.012, 0.003, 1e-4,  2e-4,
-                                                4e-3,  -2e-3, 1e-5, 1e-6,  3e-4,  -2e-4, 1e-6,
-                                                2e-4,  1e-4,  2e-6, -1e-6, 3e-6,  1e-7};
-    const std::array<double, 20> adfLineNum = {-0.001, 0.04, -1.21, 0.004, -0.002, 1e-4, -3e-4,
-                                               1e-3,   3e-3, 2e-5,  -1e-6, 1e-4,   2e-4, 1e-6,
-                                               -1e-4,  2e-4, 1e-6,  2e-6,  -2e-6,  -1e-7};
-    for (int i = 0; i < 20; ++i) {
-        psRF->padfPixelNum[i] = adfPixelNum[i];
-        psRF->padfLineNum[i] = adfLineNum[i];
-    }
-    psRF->padfPixelDen[0] = psRF->padfLineDen[0] = 1.0;
-    psRF->padfPixelDen[1] = psRF->padfLineDen[1] = 0.01;
-    psRF->padfPixelDen[2] = psRF->padfLineDen[2] = -0.02;
-    psRF->padfPixelDen[3] = psRF->padfLineDen[3] = 0.001;
-    return psRF;
+    return lumo::support::RfSceneModel();
 }
 
 // Independent evaluation of one polynomial, term by term from the table.

@@ -49,23 +49,6 @@ struct FitOptions {
     std::string osRefine;           // --refine TOLERANCE[,MIN_POINTS]
 };
 
-// The control points as the parallel arrays the fitting functions take.
-struct ControlArrays {
-    std::vector<double> pixel, line, x, y;
-    int Count() const { return static_cast<int>(pixel.size()); }
-};
-
-ControlArrays ToArrays(const PointSet& gcps) {
-    ControlArrays c;
-    for (const PointRecord& p : gcps.asPoints) {
-        c.pixel.push_back(p.dfPixel);
-        c.line.push_back(p.dfLine);
-        c.x.push_back(p.dfX);
-        c.y.push_back(p.dfY);
-    }
-    return c;
-}
-
 std::string Number(double value) {
     char text[32];
     std::snprintf(text, sizeof text, "%.6g", value);
@@ -223,13 +206,12 @@ TpsPtr FitTps(ControlArrays& c, CommandContext& context) {
 ImageFit PolyImageFit(const ControlArrays& c, const std::string& geosys, int order) {
     return [&c, geosys, order](const std::vector<char>& use, std::vector<double>& pixel,
                                std::vector<double>& line) {
-        std::vector<double> x = Subset(c.x, use), y = Subset(c.y, use);
-        std::vector<double> p = Subset(c.pixel, use), l = Subset(c.line, use);
-        if (static_cast<int>(x.size()) < (order + 1) * (order + 2) / 2) return false;
+        ControlArrays k = Subset(c, use);
+        if (k.Count() < (order + 1) * (order + 2) / 2) return false;
         GEOInfo_t fit{};
         int nOrder = order;
-        GCPRegression2(&fit, geosys.c_str(), x.data(), y.data(), "PIXEL", p.data(), l.data(),
-                       static_cast<int>(x.size()), &nOrder, 0, nullptr, nullptr);
+        GCPRegression2(&fit, geosys.c_str(), k.x.data(), k.y.data(), "PIXEL", k.pixel.data(),
+                       k.line.data(), k.Count(), &nOrder, 0, nullptr, nullptr);
         if (fit.nFitKind != GCP_FIT_POLYNOMIAL || nOrder != order) return false;
         pixel.resize(c.pixel.size());
         line.resize(c.pixel.size());
@@ -241,24 +223,23 @@ ImageFit PolyImageFit(const ControlArrays& c, const std::string& geosys, int ord
 // Ground-to-image spline through some of the points; false where the
 // points make the system singular.
 ImageFit TpsImageFit(const ControlArrays& c) {
-    return
-        [&c](const std::vector<char>& use, std::vector<double>& pixel, std::vector<double>& line) {
-            std::vector<double> x = Subset(c.x, use), y = Subset(c.y, use);
-            std::vector<double> p = Subset(c.pixel, use), l = Subset(c.line, use);
-            if (x.empty()) return false;
-            TPSInfo_t spline(static_cast<int>(x.size()));
-            try {
-                TPSCalculate(&spline, static_cast<int>(x.size()), x.data(), y.data(), p.data(),
-                             l.data());
-            } catch (const nova::NumberedError&) {
-                return false;
-            }
-            pixel.resize(c.pixel.size());
-            line.resize(c.pixel.size());
-            for (int i = 0; i < c.Count(); ++i)
-                TPSTransform(&spline, c.x[i], c.y[i], &pixel[i], &line[i]);
-            return true;
-        };
+    return [&c](const std::vector<char>& use, std::vector<double>& pixel,
+                std::vector<double>& line) {
+        ControlArrays k = Subset(c, use);
+        if (k.Count() == 0) return false;
+        TPSInfo_t spline(k.Count());
+        try {
+            TPSCalculate(&spline, k.Count(), k.x.data(), k.y.data(), k.pixel.data(), k.line.data());
+        } catch (const nova::NumberedError&) {
+            return false;
+        }
+        pixel.resize(c.pixel.size());
+        line.resize(c.pixel.size());
+        for (int i = 0; i < c.Count(); ++i) {
+            TPSTransform(&spline, c.x[i], c.y[i], &pixel[i], &line[i]);
+        }
+        return true;
+    };
 }
 
 // The georeferencing of the control points' ground coordinates: --geosys,

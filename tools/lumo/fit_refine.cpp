@@ -187,10 +187,27 @@ void PrintPointResiduals(std::ostream& out, const PointSet& gcps, const FitResid
     out << "\n";
 }
 
-std::vector<double> Subset(const std::vector<double>& values, const std::vector<char>& use) {
-    std::vector<double> kept;
-    for (std::size_t i = 0; i < values.size(); ++i) {
-        if (use[i]) kept.push_back(values[i]);
+ControlArrays ToArrays(const PointSet& gcps) {
+    ControlArrays c;
+    for (const PointRecord& p : gcps.asPoints) {
+        c.pixel.push_back(p.dfPixel);
+        c.line.push_back(p.dfLine);
+        c.x.push_back(p.dfX);
+        c.y.push_back(p.dfY);
+        c.z.push_back(p.dfZ);
+    }
+    return c;
+}
+
+ControlArrays Subset(const ControlArrays& c, const std::vector<char>& use) {
+    ControlArrays kept;
+    for (std::size_t i = 0; i < c.pixel.size(); ++i) {
+        if (!use[i]) continue;
+        kept.pixel.push_back(c.pixel[i]);
+        kept.line.push_back(c.line[i]);
+        kept.x.push_back(c.x[i]);
+        kept.y.push_back(c.y[i]);
+        kept.z.push_back(c.z[i]);
     }
     return kept;
 }

@@ -56,8 +56,16 @@ FitResiduals RefineAndMeasure(const ImageFit& fit, const PointSet& gcps, int nLe
 // listed, on `out`; nothing without a final fit.
 void PrintPointResiduals(std::ostream& out, const PointSet& gcps, const FitResiduals& residuals);
 
-// The values whose flag in `use` is set, in order.
-std::vector<double> Subset(const std::vector<double>& values, const std::vector<char>& use);
+// Control points as the parallel arrays the library's fits take (ground
+// coordinates as the set holds them).
+struct ControlArrays {
+    std::vector<double> pixel, line, x, y, z;
+    int Count() const { return static_cast<int>(pixel.size()); }
+};
+ControlArrays ToArrays(const PointSet& gcps);
+
+// The points whose flag in `use` is set, in order.
+ControlArrays Subset(const ControlArrays& c, const std::vector<char>& use);
 
 // The control points of the final fit.
 PointSet KeptPoints(const PointSet& gcps, const FitResiduals& residuals);

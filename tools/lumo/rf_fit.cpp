@@ -4,7 +4,6 @@
 // and after, and writes the adjusted model in the form the output names.
 #include <algorithm>
 #include <cmath>
-#include <cstdio>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -18,47 +17,33 @@
 namespace lumo::cli {
 namespace {
 
-std::string Number(double value) {
-    char text[32];
-    std::snprintf(text, sizeof text, "%.4g", value);
-    return text;
-}
-
 int AdjustKind(const std::string& adjust) {
     if (adjust == "shift") return RF_ADJUST_SHIFT;
     if (adjust == "second") return RF_ADJUST_SECOND;
     return RF_ADJUST_AFFINE;
 }
 
-// Control points as the parallel arrays of the library's fit, ground
-// coordinates in the model's georeferencing.
-struct RFControl {
-    std::vector<double> x, y, z, pixel, line;
-    int Count() const { return static_cast<int>(pixel.size()); }
-};
-
-RFControl ControlInModelSystem(PointSet& gcps, const PointFileOptions& points, const RFInfo_t& rf,
-                               CommandContext& context) {
+// The control points with their ground coordinates in the model's
+// georeferencing.
+ControlArrays ControlInModelSystem(PointSet& gcps, const PointFileOptions& points,
+                                   const RFInfo_t& rf, CommandContext& context) {
     Georef model;
     model.osGeosys = BufferText(rf.pszGeosys, RF_TEXT_SIZE - 1);
     model.sProj = *rf.psProjInfo;
     const std::vector<GroundXY> ground =
         GroundInModelSystem(gcps, DeclaredGeoref(gcps, points), model, kFailedToImage, context.err);
-    RFControl c;
+    ControlArrays c = ToArrays(gcps);
     for (std::size_t i = 0; i < ground.size(); ++i) {
         const PointRecord& p = gcps.asPoints[i];
         if (p.Failed()) LUMO_CLI_FAIL(PointName(gcps, p) + ": " + p.osProblem);
-        c.x.push_back(ground[i].x);
-        c.y.push_back(ground[i].y);
-        c.z.push_back(p.dfZ);
-        c.pixel.push_back(p.dfPixel);
-        c.line.push_back(p.dfLine);
+        c.x[i] = ground[i].x;
+        c.y[i] = ground[i].y;
     }
     return c;
 }
 
 // Residual summary of the model on the control points, in pixels.
-std::string ResidualSummary(RFInfo_t* psRF, const RFControl& c) {
+std::string ResidualSummary(RFInfo_t* psRF, const ControlArrays& c) {
     double sumPixel = 0.0, sumLine = 0.0, worst = 0.0;
     for (int i = 0; i < c.Count(); ++i) {
         double p = 0.0, l = 0.0;
@@ -69,20 +54,19 @@ std::string ResidualSummary(RFInfo_t* psRF, const RFControl& c) {
         worst = std::max(worst, std::hypot(dp, dl));
     }
     const double n = c.Count();
-    return "rms pixel " + Number(std::sqrt(sumPixel / n)) + ", line " +
-           Number(std::sqrt(sumLine / n)) + ", total " +
-           Number(std::sqrt((sumPixel + sumLine) / n)) + ", largest " + Number(worst);
+    return "rms pixel " + FormatShort(std::sqrt(sumPixel / n)) + ", line " +
+           FormatShort(std::sqrt(sumLine / n)) + ", total " +
+           FormatShort(std::sqrt((sumPixel + sumLine) / n)) + ", largest " + FormatShort(worst);
 }
 
 // The adjustment of `psRF` fitted to some of the points; the record keeps
 // the last successful fit.
-ImageFit RFImageFit(RFInfo_t* psRF, int nKind, const RFControl& c) {
+ImageFit RFImageFit(RFInfo_t* psRF, int nKind, const ControlArrays& c) {
     return [psRF, nKind, &c](const std::vector<char>& use, std::vector<double>& pixel,
                              std::vector<double>& line) {
-        std::vector<double> x = Subset(c.x, use), y = Subset(c.y, use), z = Subset(c.z, use);
-        std::vector<double> p = Subset(c.pixel, use), l = Subset(c.line, use);
-        if (!RFComputeAdjustment(psRF, nKind, static_cast<int>(x.size()), x.data(), y.data(),
-                                 z.data(), p.data(), l.data())) {
+        ControlArrays k = Subset(c, use);
+        if (!RFComputeAdjustment(psRF, nKind, k.Count(), k.x.data(), k.y.data(), k.z.data(),
+                                 k.pixel.data(), k.line.data())) {
             return false;
         }
         pixel.resize(c.x.size());
@@ -101,7 +85,7 @@ void RunRFFit(PointSet& gcps, const RFFitOptions& options, CommandContext& conte
     // The output form first, so that a bad name fails before any work.
     const std::string form = RFOutputForm("", options.osOutput);
     RFModelInput model = ReadRFModelAnyForm(options.osRpc);
-    const RFControl c = ControlInModelSystem(gcps, options.sPoints, *model.psRF, context);
+    const ControlArrays c = ControlInModelSystem(gcps, options.sPoints, *model.psRF, context);
     const int nKind = AdjustKind(options.osAdjust);
     if (c.Count() < nKind) {
         LUMO_CLI_FAIL(gcps.osSource + ": --adjust " + options.osAdjust + " has " +
@@ -121,9 +105,7 @@ void RunRFFit(PointSet& gcps, const RFFitOptions& options, CommandContext& conte
     const FitResiduals residuals =
         RefineAndMeasure(RFImageFit(psRF, nKind, c), gcps, nKind, options.sRefine);
     // The adjustment of the points kept, whatever fit ran last.
-    const RFControl kept{Subset(c.x, residuals.use), Subset(c.y, residuals.use),
-                         Subset(c.z, residuals.use), Subset(c.pixel, residuals.use),
-                         Subset(c.line, residuals.use)};
+    ControlArrays kept = Subset(c, residuals.use);
     if (!RFComputeAdjustment(psRF, nKind, kept.Count(), kept.x.data(), kept.y.data(), kept.z.data(),
                              kept.pixel.data(), kept.line.data())) {
         LUMO_CLI_FAIL(gcps.osSource + ": the " + std::to_string(kept.Count()) +
