@@ -8,6 +8,7 @@ PACKAGES=(
   libproj-dev proj-data proj-bin
   libeigen3-dev nlohmann-json3-dev libcli11-dev
   libopenblas-dev liblapack-dev liblapacke-dev
+  liberfa-dev
   libgtest-dev libgmock-dev googletest libbenchmark-dev
   libgdal-dev
 )
