@@ -5,6 +5,7 @@
 #include "lumo_dispatch.h"
 #include "lumo_ephemeris.h"
 #include "lumo_gcp.h"
+#include "lumo_lrs.h"
 #include "lumo_mathmodel.h"
 #include "lumo_poly.h"
 #include "lumo_rf.h"
