@@ -3,6 +3,7 @@
 
 #include "lumo_ap.h"
 #include "lumo_dispatch.h"
+#include "lumo_lrs.h"
 #include "lumo_poly.h"
 #include "lumo_rf.h"
 #include "lumo_rtcs.h"
@@ -89,6 +90,10 @@ int DispatchGeo2Img(int nModelCode, void* pModel, double dfX, double dfY, double
         case LUMO_CODE_RTCS:
             return RTCSGeo2Img(static_cast<const RTCSInfo_t*>(pModel), dfX, dfY, dfZ, pdfPixel,
                                pdfLine);
+        case LUMO_CODE_LRS:
+            // 0 when the point is not seen by the pass (line -10000, pixel 0).
+            return LRSGeodeticToImage(static_cast<const LRSOrbitModel_t*>(pModel), dfX, dfY, dfZ,
+                                      pdfPixel, pdfLine);
         default:
             break;
     }
@@ -116,6 +121,12 @@ int DispatchImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double dfLi
                                   pdfX, pdfY) != 0
                        ? 1
                        : 0;
+        case LUMO_CODE_LRS:
+            // The line of sight meets the ellipsoid at the given height (0 when
+            // none is given); the height is not written back.
+            return LRSImageToGeodeticAtHeight(static_cast<const LRSOrbitModel_t*>(pModel), dfPixel,
+                                              dfLine, *pdfZ == LUMO_NULL_VALUE ? 0.0 : *pdfZ, pdfX,
+                                              pdfY);
         case LUMO_CODE_POLY:
             POLYImg2Geo(static_cast<const POLYInfo_t*>(pModel), dfPixel, dfLine, pdfX, pdfY);
             return 1;

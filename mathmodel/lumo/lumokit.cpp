@@ -14,6 +14,7 @@
 
 #include "crs.h"
 #include "errors.h"
+#include "lumo_lrs.h"
 #include "lumo_poly.h"
 #include "lumo_rtcs.h"
 #include "lumo_srit.h"
@@ -104,6 +105,9 @@ void ReleaseSrit(void* p) {
 void ReleaseRtcs(void* p) {
     RTCSFreeModel(static_cast<RTCSInfo_t*>(p));
 }
+void ReleaseLrs(void* p) {
+    delete static_cast<LRSOrbitModel_t*>(p);
+}
 
 RecordRelease ReleaseFor(LumoModelType eType) {
     switch (eType) {
@@ -115,8 +119,8 @@ RecordRelease ReleaseFor(LumoModelType eType) {
             return &ReleaseSrit;
         case LUMO_MODEL_RTCS:
             return &ReleaseRtcs;
-        // The orbit record is released here when that family joins the
-        // object.
+        case LUMO_MODEL_LRS:
+            return &ReleaseLrs;
         default:
             return nullptr;
     }
@@ -174,6 +178,12 @@ ogc::cs::ICRS* RadarCRS(const ogc::IProjInfoFactory* poFactory, const RTCSInfo_t
     } catch (...) {
         return nullptr;
     }
+}
+
+void* CopyLrsRecord(const void* pSource) {
+    LRSOrbitModel_t* psCopy = static_cast<const LRSOrbitModel_t*>(pSource)->Clone();
+    if (psCopy == nullptr) throw OutOfMemoryException(sizeof(LRSOrbitModel_t));
+    return psCopy;
 }
 
 void* CopyTpsRecord(const void* pSource) {
@@ -372,8 +382,13 @@ void LumoMathModel::InitModel(int nModelCode, const void* pData) {
             eType = LUMO_MODEL_RTCS;
             break;
         }
-        // The orbit record (3) joins here when its family is built; until
-        // then it is an unknown model.
+        case 3: {
+            oRecord.pfnRelease = &ReleaseLrs;
+            oRecord.pData = CopyLrsRecord(pData);
+            Geosys2ProjInfo(&sQ, "LONG/LAT D000", 0.0, 0.0, 1.0, 1.0);
+            eType = LUMO_MODEL_LRS;
+            break;
+        }
         default:
             ThrowParameter("eType", kUnknownModel, kFnInitModel, 466);
     }
@@ -426,8 +441,10 @@ void LumoMathModel::CopyFrom(const LumoMathModel& oOther) {
             oRecord.pfnRelease = &ReleaseRtcs;
             oRecord.pData = CopyRtcsRecord(oOther.mpData);
             break;
-        // The rigorous, radar and orbit types are copied here when their
-        // families join the object.
+        case LUMO_MODEL_LRS:
+            oRecord.pfnRelease = &ReleaseLrs;
+            oRecord.pData = CopyLrsRecord(oOther.mpData);
+            break;
         default:
             ThrowParameter("eType", "Model not supported", kFnCopyFrom, 221);
     }
@@ -486,8 +503,7 @@ int LumoMathModel::GetNumColumns() const {
             }
             return psRtcs->psCOpt->sLines.nPixels;
         }
-        // The rigorous and radar sizes (lines 528 and 549) join with their
-        // families; the orbit model cannot report its size.
+        // The orbit model cannot report its size.
         default:
             ThrowParameter("eType", kUnknownModel, kFnGetNumColumns, 563);
     }
