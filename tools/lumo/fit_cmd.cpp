@@ -17,6 +17,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "fit_refine.h"
+#include "lrs_io.h"
 #include "nova/projection.h"
 #include "nova/regression.h"
 #include "points_io.h"
@@ -262,8 +263,9 @@ void RunFit(const FitOptions& options, CommandContext& context) {
         throw CLI::ValidationError("--allow-lower-order applies to --model poly only");
     }
     const bool bRadar = options.osModel == "rtcs";
-    if (options.osModel != "srit" && !bRadar && !options.osSegment.empty()) {
-        throw CLI::ValidationError("--segment applies to --model srit and rtcs only");
+    const bool bOrbit = options.osModel == "lrs";
+    if (options.osModel != "srit" && !bRadar && !bOrbit && !options.osSegment.empty()) {
+        throw CLI::ValidationError("--segment applies to --model srit, rtcs and lrs only");
     }
     if (!bRadar && !options.osHeightRef.empty()) {
         throw CLI::ValidationError("--height-ref applies to --model rtcs only");
@@ -276,7 +278,7 @@ void RunFit(const FitOptions& options, CommandContext& context) {
             "--refine does not apply to --model tps: a spline passes through every control "
             "point; its leave-one-out residuals are reported without it");
     }
-    if (bRadar && !options.osRefine.empty()) {
+    if ((bRadar || bOrbit) && !options.osRefine.empty()) {
         throw CLI::ValidationError("--refine applies to --model poly, srit and rf");
     }
     const RefineOptions refine =
@@ -298,9 +300,13 @@ void RunFit(const FitOptions& options, CommandContext& context) {
         return;
     }
     const bool bRigorous = options.osModel == "srit";
-    ApplyHeights(gcps, options.sPoints, bRigorous || bRadar,
-                 bRadar ? "the radar model" : "the rigorous model");
+    ApplyHeights(gcps, options.sPoints, bRigorous || bRadar || bOrbit,
+                 bRadar ? "the radar model" : bOrbit ? "the orbit model" : "the rigorous model");
     const std::string geosys = FitGeosys(options, gcps);
+    if (bOrbit) {
+        RunLrsFit(gcps, options.osSegment, geosys, options.osOutput, context);
+        return;
+    }
     if (bRigorous) {
         RunSritFit(gcps, options.osSegment, geosys, options.osOutput, refine, context);
         return;
@@ -355,13 +361,14 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
     auto options = std::make_shared<FitOptions>();
     CLI::App* command = app.add_subcommand(
         "fit",
-        "Fit a polynomial, thin plate spline, rigorous or radar model to control points, or "
-        "adjust a rational function model to them");
-    command->add_option("--model", options->osModel, "model family: poly, tps, srit, rtcs or rf")
+        "Fit a polynomial, thin plate spline, rigorous, radar or orbit model to control points, "
+        "or adjust a rational function model to them");
+    command->add_option("--model", options->osModel,
+                        "model family: poly, tps, srit, rtcs, lrs or rf")
         ->required()
-        ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs", "rf"}));
+        ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs", "lrs", "rf"}));
     command->add_option("--segment", options->osSegment,
-                        "ephemeris segment of the image (JSON; srit and rtcs)");
+                        "ephemeris segment of the image (JSON; srit, rtcs and lrs)");
     command
         ->add_option("--height-ref", options->osHeightRef,
                      "rtcs: heights of the control points are above the ellipsoid (E) or mean "
@@ -380,7 +387,8 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
         ->check(CLI::Range(1, GCP_MAX_ORDER));
     command->add_option("--geosys", options->osGeosys,
                         "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
-                        "(srit: default the segment's; rf: converted to the model's)");
+                        "(srit: default the segment's; rf: converted to the model's; lrs: "
+                        "default longitude and latitude)");
     command
         ->add_option("--pixels", options->nPixels,
                      "image width (default: just above the largest control point pixel)")

@@ -8,6 +8,7 @@
 #include "ap_io.h"
 #include "cli_error.h"
 #include "json_fields.h"
+#include "lrs_io.h"
 #include "nova/projection.h"
 #include "rf_io.h"
 #include "rtcs_io.h"
@@ -68,6 +69,7 @@ const std::vector<ModelFamilyCodec>& ModelFamilies() {
         {"ap", LUMO_CODE_AP, "aerial photo model", &ReadApRecord},
         {"srit", LUMO_CODE_SRIT, "satellite rigorous model", &ReadSritRecord},
         {"rtcs", LUMO_CODE_RTCS, "radar model", &ReadRtcsRecord},
+        {"lrs", LUMO_CODE_LRS, "low-resolution orbit model", &ReadLrsRecord},
     };
     return families;
 }
