@@ -19,9 +19,9 @@ namespace {
 // Every subcommand; a new family adds its Add...Command here.
 // (A plain array, so that adding a line needs no count.)
 constexpr AddCommandFn kCommands[] = {
-    &AddDemoCommand,     &AddTransformCommand, &AddPolyCommand, &AddRpcCommand,
-    &AddFitCommand,      &AddResidualsCommand, &AddGcpsCommand, &AddSegmentCommand,
-    &AddSimulateCommand, &AddBlockCommand,
+    &AddDemoCommand,     &AddTransformCommand, &AddPolyCommand,          &AddRpcCommand,
+    &AddFitCommand,      &AddResidualsCommand, &AddGcpsCommand,          &AddSegmentCommand,
+    &AddSimulateCommand, &AddBlockCommand,     &AddSimulateAvhrrCommand, &AddAnglesCommand,
 };
 
 std::string VersionText() {

@@ -42,9 +42,13 @@ void AddGcpsCommand(CLI::App& app, CommandContext& context);
 void AddSegmentCommand(CLI::App& app, CommandContext& context);
 void AddSimulateCommand(CLI::App& app, CommandContext& context);
 void AddBlockCommand(CLI::App& app, CommandContext& context);
+void AddSimulateAvhrrCommand(CLI::App& app, CommandContext& context);
+void AddAnglesCommand(CLI::App& app, CommandContext& context);
 // `lumo demo`'s last part: the block adjustment of the bundled stereo pair
 // with tie points (examples/block_stereo.json).
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
+// `lumo demo`'s orbit part: the bundled AVHRR pass, its refinement and angles.
+void PrintOrbitDemo(const std::string& examplesDir, std::ostream& out);
 
 // `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
 // from control points with heights, ground coordinates in `geosys` (empty:
