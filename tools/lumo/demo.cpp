@@ -103,6 +103,7 @@ const std::vector<FamilyDemo>& FamilyDemos() {
         {"ap", "ap_frame_utm31.json", "ap_frame_utm31_gcps.csv"},
         {"srit", "srit_spot5_roll20.json", "srit_spot5_roll20_checks.csv"},
         {"rtcs", "rtcs_scene.json", "rtcs_scene_checks.csv"},
+        {"lrs", "lrs_avhrr_pass.json", "avhrr_pass_checks.csv"},
     };
     return demos;
 }
@@ -174,6 +175,7 @@ void PrintDemo(const std::string& examplesDir, std::ostream& out) {
                       Pair(r.sGroundRoundTrip).c_str(), Pair(r.sImageRoundTrip).c_str());
         out << line;
     }
+    PrintOrbitDemo(examplesDir, out);
     PrintBlockDemo(examplesDir, out);
 }
 
