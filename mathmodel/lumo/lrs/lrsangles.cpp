@@ -142,7 +142,7 @@ void TrueAngles(const double* G, double dfLon, double dfLat, const double* S, do
 }
 
 bool RightHalf(const LRSOrbitModel_t& m, double dfPixel) {
-    return dfPixel >= m.sSensor.nNumPixels / 2;
+    return dfPixel >= static_cast<double>(m.sSensor.nNumPixels / 2);  // whole pixels
 }
 
 // LRSComputeAngles without the model check, for the grid.

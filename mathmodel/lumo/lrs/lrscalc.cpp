@@ -119,7 +119,7 @@ LRSOrbitModel_t::LRSOrbitModel_t(const LRSOrbitModel_t& oOther)
 }
 
 LRSOrbitModel_t& LRSOrbitModel_t::operator=(const LRSOrbitModel_t& oOther) {
-    CopyFrom(oOther);
+    if (this != &oOther) CopyFrom(oOther);
     return *this;
 }
 

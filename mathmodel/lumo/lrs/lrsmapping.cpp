@@ -158,6 +158,7 @@ double InversePixelErr(const LRSOrbitModel_t* psModel, const double* padfGround,
 int EcrToImage(const LRSOrbitModel_t* psModel, const double* padfGround, double* pdfPixel,
                double* pdfLine) {
     double t0 = psModel->dfFirstStateTime, t1 = psModel->dfLastStateTime;
+    if (!(std::isfinite(t0) && std::isfinite(t1) && t1 > t0)) return FailImage(pdfPixel, pdfLine);
     double f0 = InversePixelErr(psModel, padfGround, t0, pdfLine, pdfPixel);
     double f1 = InversePixelErr(psModel, padfGround, t1, pdfLine, pdfPixel);
     if (!(f0 * f1 <= 0.0)) {

@@ -168,7 +168,7 @@ AcquisitionDay ReadAcquisitionDay(const EphemerisSeg_t& sSeg, int nEpochYear) {
     const int nDay = ScanInt(d + 8, 2);
     const nova::tsys::TimeSystemConverter oConverter;
     AcquisitionDay sDay;
-    if (std::strlen(d) < 10 ||
+    if (strnlen(d, EPH_DATE_SIZE) < 10 ||
         oConverter.CalendarToDoy(nYear, nMonth, nDay, sDay.nDayOfYear) != 0) {
         sDay.nDayOfYear = 0;
         return sDay;
