@@ -5,8 +5,10 @@
 
 #include <iosfwd>
 #include <string>
+#include <vector>
 
 #include "fit_refine.h"
+#include "lumo_sim.h"
 #include "model_io.h"
 #include "point_prep.h"
 #include "transform.h"
@@ -49,6 +51,11 @@ void AddAnglesCommand(CLI::App& app, CommandContext& context);
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
 // `lumo demo`'s orbit part: the bundled AVHRR pass, its refinement and angles.
 void PrintOrbitDemo(const std::string& examplesDir, std::ostream& out);
+
+// The points of a simulated scene as a point file (id, pixel, line, x, y, z),
+// ids made of pszPrefix and a count; osGeosys is declared when not empty.
+std::string SimulatedPointText(const std::vector<lumo::sim::SimPoint>& asPoints,
+                               const char* pszPrefix, const std::string& osGeosys = "");
 
 // `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
 // from control points with heights, ground coordinates in `geosys` (empty:

@@ -6,7 +6,6 @@
 #include <cstdint>
 #include <memory>
 #include <ostream>
-#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -37,26 +36,11 @@ struct SimulateAvhrrOptions {
 };
 
 std::string PointText(const std::vector<ControlPoint_t>& asPoints, const char* pszPrefix) {
-    PointSet points;
-    points.bHasId = true;
-    points.bHasZ = true;
-    points.osGeosys = kLrsGeosys;
-    for (std::size_t i = 0; i < asPoints.size(); ++i) {
-        const ControlPoint_t& c = asPoints[i];
-        PointRecord p;
-        p.osId = pszPrefix + std::to_string(i + 1);
-        p.dfPixel = c.dfImageX;
-        p.dfLine = c.dfImageY;
-        p.dfX = c.dfGroundX;
-        p.dfY = c.dfGroundY;
-        p.dfZ = c.dfGroundZ;
-        points.asPoints.push_back(p);
+    std::vector<lumo::sim::SimPoint> asSim;
+    for (const ControlPoint_t& c : asPoints) {
+        asSim.push_back({c.dfImageX, c.dfImageY, c.dfGroundX, c.dfGroundY, c.dfGroundZ});
     }
-    std::ostringstream text;
-    WritePoints(text, points,
-                {PointColumn::Id, PointColumn::Pixel, PointColumn::Line, PointColumn::X,
-                 PointColumn::Y, PointColumn::Z});
-    return text.str();
+    return SimulatedPointText(asSim, pszPrefix, kLrsGeosys);
 }
 
 void RunSimulateAvhrr(const SimulateAvhrrOptions& options, CommandContext& context) {

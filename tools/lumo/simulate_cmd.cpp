@@ -50,30 +50,6 @@ struct SimulateOptions {
     double dfMaxHeight = 2000.0;
 };
 
-std::string PointText(const std::vector<lumo::sim::SimPoint>& asPoints, const char* pszPrefix,
-                      const char* pszGeosys = "") {
-    PointSet points;
-    points.osGeosys = pszGeosys;
-    points.bHasId = true;
-    points.bHasZ = true;
-    for (std::size_t i = 0; i < asPoints.size(); ++i) {
-        const lumo::sim::SimPoint& s = asPoints[i];
-        PointRecord p;
-        p.osId = pszPrefix + std::to_string(i + 1);
-        p.dfPixel = s.dfPixel;
-        p.dfLine = s.dfLine;
-        p.dfX = s.dfX;
-        p.dfY = s.dfY;
-        p.dfZ = s.dfZ;
-        points.asPoints.push_back(p);
-    }
-    std::ostringstream text;
-    WritePoints(text, points,
-                {PointColumn::Id, PointColumn::Pixel, PointColumn::Line, PointColumn::X,
-                 PointColumn::Y, PointColumn::Z});
-    return text.str();
-}
-
 std::string Degrees(double value) {
     char text[32];
     std::snprintf(text, sizeof text, "%.2f", value);
@@ -119,9 +95,9 @@ void RunSimulateRadar(SimulateOptions options, CommandContext& context) {
         LUMO_CLI_FAIL(std::string("lumo simulate --radar: ") + e.what());
     }
     WriteSegmentFile(options.osSegment, *psSegment);
-    WriteFileReplacing(options.osGcps, PointText(asGcps, "GCP", "LONG/LAT D000"));
+    WriteFileReplacing(options.osGcps, SimulatedPointText(asGcps, "GCP", "LONG/LAT D000"));
     if (!options.osChecks.empty()) {
-        WriteFileReplacing(options.osChecks, PointText(asChecks, "CHK", "LONG/LAT D000"));
+        WriteFileReplacing(options.osChecks, SimulatedPointText(asChecks, "CHK", "LONG/LAT D000"));
     }
     context.out << "simulated radar scene " << r.nPixels << " x " << r.nLines << ", pixel "
                 << FormatDouble(r.dfPixelSpacing) << " m, incidence "
@@ -151,9 +127,9 @@ void RunSimulate(const SimulateOptions& options, CommandContext& context) {
     }
     SegmentPtr psSegment(poScene->MakeSegment());
     WriteSegmentFile(options.osSegment, *psSegment);
-    WriteFileReplacing(options.osGcps, PointText(asGcps, "GCP"));
+    WriteFileReplacing(options.osGcps, SimulatedPointText(asGcps, "GCP"));
     if (!options.osChecks.empty()) {
-        WriteFileReplacing(options.osChecks, PointText(asChecks, "CHK"));
+        WriteFileReplacing(options.osChecks, SimulatedPointText(asChecks, "CHK"));
     }
     context.out << "simulated " << psSegment->szSensorName << " scene in "
                 << poScene->Projection().szProj << ": " << options.sScene.nPixels << " x "
@@ -168,6 +144,32 @@ void RunSimulate(const SimulateOptions& options, CommandContext& context) {
 }
 
 }  // namespace
+
+// Simulated points as a point file: id, pixel, line, x, y, z, declaring
+// osGeosys when it is given.
+std::string SimulatedPointText(const std::vector<lumo::sim::SimPoint>& asPoints,
+                               const char* pszPrefix, const std::string& osGeosys) {
+    PointSet points;
+    points.bHasId = true;
+    points.bHasZ = true;
+    points.osGeosys = osGeosys;
+    for (std::size_t i = 0; i < asPoints.size(); ++i) {
+        const lumo::sim::SimPoint& s = asPoints[i];
+        PointRecord p;
+        p.osId = pszPrefix + std::to_string(i + 1);
+        p.dfPixel = s.dfPixel;
+        p.dfLine = s.dfLine;
+        p.dfX = s.dfX;
+        p.dfY = s.dfY;
+        p.dfZ = s.dfZ;
+        points.asPoints.push_back(p);
+    }
+    std::ostringstream text;
+    WritePoints(text, points,
+                {PointColumn::Id, PointColumn::Pixel, PointColumn::Line, PointColumn::X,
+                 PointColumn::Y, PointColumn::Z});
+    return text.str();
+}
 
 void AddSimulateCommand(CLI::App& app, CommandContext& context) {
     auto options = std::make_shared<SimulateOptions>();
