@@ -5,8 +5,6 @@
 // Header fields must hold a number in the width the header gives them
 // (blanks around it allowed); anything else is an error naming the field,
 // since a misread epoch or element would silently misplace the whole image.
-#include <strings.h>
-
 #include <cctype>
 #include <cmath>
 #include <cstdlib>
@@ -16,6 +14,7 @@
 #include "errors.h"
 #include "lrs_internal.h"
 #include "runtime.h"
+#include "segment_access.h"
 #include "timesys.h"
 
 namespace lumo::lrs {
@@ -90,7 +89,7 @@ int ParseIntField(const char* pszField, int nWidth, const char* pszName, int nMi
 }
 
 bool IsAvhrr(const EphemerisSeg_t& sSeg) {
-    return strncasecmp(sSeg.szSensorName, "AVHRR", 5) == 0;
+    return SensorNameStartsWith(sSeg, "AVHRR");
 }
 
 const AvhrrData_t& RequireAvhrr(const EphemerisSeg_t& sSeg) {
@@ -309,11 +308,13 @@ void CheckPassTimes(const OrbitSetup& sOut) {
                        "epoch (szEpochYearDay); one element set cannot model them.\n"),
                      sOut.dfStart / kSecondsPerDay, sOut.dfEnd / kSecondsPerDay));
     }
-    if (std::fabs(sOut.dfEnd - sOut.dfStart) > kMaxPassSeconds) {
+    // The state table spans the pass and one more line interval.
+    const double dfSpan = std::fabs(sOut.dfEnd - sOut.dfStart);
+    if (dfSpan * sOut.nLines / (sOut.nLines - 1) > kMaxPassSeconds) {
         Fatal(Err::kBadArgument,
-              MkName(_("AVHRR segment: the first and last scan lines are %.6g s apart, more than "
-                       "one pass (check the scan-line time codes).\n"),
-                     std::fabs(sOut.dfEnd - sOut.dfStart)));
+              MkName(_("AVHRR segment: the first and last of %d scan lines are %.6g s apart, more "
+                       "than one pass (check the scan-line time codes).\n"),
+                     sOut.nLines, dfSpan));
     }
 }
 
