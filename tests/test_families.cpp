@@ -111,6 +111,7 @@ INSTANTIATE_TEST_SUITE_P(Examples, FamilyProperty,
                                          Family{"rf_scene.json", 1e-6, 1e-9, true, false},
                                          Family{"ap_frame_utm31.json", 1e-4, 1e-3, true, false},
                                          Family{"srit_spot5_roll20.json", 1.0, 6.0, true, true},
-                                         Family{"rtcs_scene.json", 1e-6, 1e-9, true, true}));
+                                         Family{"rtcs_scene.json", 1e-6, 1e-9, true, true},
+                                         Family{"lrs_avhrr_pass.json", 0.01, 1e-4, true, true}));
 
 }  // namespace

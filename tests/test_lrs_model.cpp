@@ -336,19 +336,14 @@ TEST(OrbitModel, RefinementRecoversAttitudeAndOrbitBiases) {
     EXPECT_EQ(exact.oModel.asControlPoints.size(), 1U);
 }
 
+// Round trips, heights, failure values and the array form are the family
+// property test's; here what is the orbit model's own.
 TEST(OrbitModel, DispatchAndModelObject) {
     Pass pass;
     void* pModel = &pass.oModel;
     double lon = 0, lat = 0, p = 0, l = 0, z = 1500.0;
     ASSERT_EQ(GenImg2GeoDem(LUMO_CODE_LRS, pModel, 600.0, 900.0, &z, &lon, &lat), 1);
     EXPECT_EQ(z, 1500.0);
-    ASSERT_EQ(GenGeo2Img(LUMO_CODE_LRS, pModel, lon, lat, 1500.0, &p, &l), 1);
-    EXPECT_NEAR(p, 600.0, 0.01);
-    EXPECT_NEAR(l, 900.0, 0.01);
-    // At 1500 m the line of sight meets the ground elsewhere than at 0 m.
-    double lon0 = 0, lat0 = 0;
-    ASSERT_EQ(GenImg2Geo(LUMO_CODE_LRS, pModel, 600.0, 900.0, 0.0, &lon0, &lat0), 1);
-    EXPECT_GT(std::hypot(lon - lon0, lat - lat0), 0.005);
     EXPECT_EQ(GenGeo2Img(LUMO_CODE_LRS, pModel, -170.0, -45.0, 0.0, &p, &l), 0);
 
     nova::mathmodel::LumoMathModel oObject(nova::mathmodel::LUMO_MODEL_LRS, &pass.oModel);
@@ -357,6 +352,7 @@ TEST(OrbitModel, DispatchAndModelObject) {
     double p2 = 0, l2 = 0;
     ASSERT_EQ(pClone->GroundToImage(lon, lat, 1500.0, p2, l2, false), 0);
     EXPECT_NEAR(p2, 600.0, 0.01);
+    EXPECT_NEAR(l2, 900.0, 0.01);
     EXPECT_THROW(oObject.GetNumColumns(), nova::ParameterException);
 }
 

@@ -38,7 +38,7 @@ struct FitOptions {
     std::string osGcps;
     std::string osGeosys;
     std::string osOutput;
-    std::string osSegment;    // srit and rtcs only
+    std::string osSegment;    // srit, rtcs and lrs only
     std::string osHeightRef;  // rtcs only
     std::string osRpc;        // rf only
     std::string osAdjust;     // rf only
@@ -301,7 +301,9 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     }
     const bool bRigorous = options.osModel == "srit";
     ApplyHeights(gcps, options.sPoints, bRigorous || bRadar || bOrbit,
-                 bRadar ? "the radar model" : bOrbit ? "the orbit model" : "the rigorous model");
+                 bRadar   ? "the radar model"
+                 : bOrbit ? "the orbit model"
+                          : "the rigorous model");
     const std::string geosys = FitGeosys(options, gcps);
     if (bOrbit) {
         RunLrsFit(gcps, options.osSegment, geosys, options.osOutput, context);
