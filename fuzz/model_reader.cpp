@@ -14,6 +14,7 @@
 #include <nlohmann/json.hpp>
 
 #include "ap_io.h"
+#include "lrs_io.h"
 #include "lumo.h"
 #include "model_io.h"
 #include "rf_io.h"
@@ -49,6 +50,8 @@ json WriteModel(const LoadedModel& model) {
             return lumo::cli::TpsToJson(*static_cast<TPSMInfo_t*>(record));
         case LUMO_CODE_AP:
             return lumo::cli::ApToJson(*static_cast<APInfo_t*>(record), nPixels, nLines);
+        case LUMO_CODE_LRS:
+            return lumo::cli::LrsToJson(*static_cast<LRSOrbitModel_t*>(record));
         default:
             return lumo::cli::SritToJson(*static_cast<SRITInfo_t*>(record));
     }
