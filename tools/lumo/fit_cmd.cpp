@@ -365,8 +365,8 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
         "fit",
         "Fit a polynomial, thin plate spline, rigorous, radar or orbit model to control points, "
         "or adjust a rational function model to them");
-    command->add_option("--model", options->osModel,
-                        "model family: poly, tps, srit, rtcs, lrs or rf")
+    command
+        ->add_option("--model", options->osModel, "model family: poly, tps, srit, rtcs, lrs or rf")
         ->required()
         ->check(CLI::IsMember({"poly", "tps", "srit", "rtcs", "lrs", "rf"}));
     command->add_option("--segment", options->osSegment,
