@@ -194,6 +194,12 @@ TEST(OrbitModel, RefusesSegmentsItCannotModel) {
     };
     for (const auto& [pszField, fnEdit] : aCases) {
         SegmentPtr pSeg(lumo::sim::MakeAvhrrSegment(AvhrrPassSpec()));
+        // The release frees the sub-record by its kind: give the kind back first.
+        struct KindBack {
+            EphemerisSeg_t& s;
+            int32_t n;
+            ~KindBack() { s.nOrbitType = n; }
+        } back{*pSeg, pSeg->nOrbitType};
         fnEdit(*pSeg);
         Pass kept;  // a model that must survive the refusal unchanged
         const double dfOrigin = kept.oModel.dfTimeOrigin;

@@ -79,6 +79,7 @@ TEST(RtcsModel, BadSegmentsAndPointsAreRefusedByName) {
     s = CopySegment();
     s->nOrbitType = EPH_ORBIT_NONE;
     ExpectRefused(s.get(), Gcps(), 11, "no radar line table");
+    s->nOrbitType = EPH_ORBIT_RADAR;  // the release frees the sub-record by its kind
     std::vector<ControlPoint_t> g = Gcps();
     g[4].dfImageX = -1.0;
     ExpectRefused(&Fixture().Segment(), g, 189, "X_img");

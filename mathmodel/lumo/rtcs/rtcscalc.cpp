@@ -237,7 +237,9 @@ RTCSInfo_t::RTCSInfo_t()
 
 RTCSInfo_t::~RTCSInfo_t() {
     LumoSatEphemerisFree(psEphemeris);
-    if (psCOpt != nullptr) AllocateTables(this, 0);
+    // The derived tables belong to the model even when its option block was
+    // handed to a container, so they are freed whether or not it is still here.
+    lumo::rtcs::FreeDerivedTables(this);
     lumo::rtcs::FreeOptionBlock(psCOpt);
     delete poRpcModel;
 }
