@@ -14,11 +14,10 @@
 #include <cstdlib>
 #include <cstring>
 
-#include <nlohmann/json.hpp>
-
 #include "avhrr_sim.h"
 #include "lumo.h"
 #include "runtime.h"
+#include "segment_input.h"
 #include "segment_io.h"
 
 namespace {
@@ -58,17 +57,6 @@ lumo::cli::SegmentPtr HeaderSegment(const std::uint8_t* p, const std::uint8_t* p
     return psSeg;
 }
 
-lumo::cli::SegmentPtr FileSegment(const std::uint8_t* p, std::size_t nSize) {
-    const auto document =
-        nlohmann::ordered_json::parse(p, p + nSize, nullptr, /*allow_exceptions=*/false);
-    if (document.is_discarded()) return nullptr;
-    try {
-        return lumo::cli::SegmentFromJson(document, "fuzz");
-    } catch (const nova::DataException&) {
-        return nullptr;
-    }
-}
-
 void Exercise(LRSOrbitModel_t& m) {
     LRSSetupCoordinateMapping(&m);
     for (double p : {0.5, 1024.0, 2047.5}) {
@@ -90,7 +78,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* pabyData, std::size_t 
     static_cast<void>(gbQuiet);
     if (nSize == 0) return 0;
     lumo::cli::SegmentPtr psSeg = pabyData[0] == '{'
-                                      ? FileSegment(pabyData, nSize)
+                                      ? lumo::fuzz::SegmentFromBytes(pabyData, nSize)
                                       : HeaderSegment(pabyData + 1, pabyData + nSize);
     if (!psSeg) return 0;
     LRSOrbitModel_t m;

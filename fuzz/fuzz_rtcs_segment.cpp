@@ -9,11 +9,10 @@
 #include <cstdint>
 #include <memory>
 
-#include <nlohmann/json.hpp>
-
 #include "fuzz_support.h"
 #include "lumo.h"
 #include "runtime.h"
+#include "segment_input.h"
 #include "segment_io.h"
 
 namespace {
@@ -75,16 +74,8 @@ void Exercise(const RTCSInfo_t* psModel, const EphemerisSeg_t& s) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* pabyData, std::size_t nSize) {
     lumo::fuzz::SilenceWarnings();
-    const auto document = nlohmann::ordered_json::parse(pabyData, pabyData + nSize, nullptr,
-                                                        /*allow_exceptions=*/false);
-    if (document.is_discarded()) return 0;
-    lumo::cli::SegmentPtr psSegment;
-    try {
-        psSegment = lumo::cli::SegmentFromJson(document, "fuzz");
-    } catch (const nova::DataException&) {
-        return 0;
-    }
-    if (psSegment->nNumLines > kMaxLines) return 0;
+    const lumo::cli::SegmentPtr psSegment = lumo::fuzz::SegmentFromBytes(pabyData, nSize);
+    if (psSegment == nullptr || psSegment->nNumLines > kMaxLines) return 0;
     ProjInfo_t sProj{};
     Geosys2ProjInfo(&sProj, "LONG/LAT D000", 0.0, 0.0, 1.0, 1.0);
     std::unique_ptr<RTCSInfo_t, ModelDeleter> psModel;

@@ -4,14 +4,15 @@
 
 #include <cmath>
 
+#include "angles.h"
 #include "lumo_lrs.h"
 
 namespace lumo::lrs {
 
-constexpr double kPi = 3.141592653589793;
-constexpr double kTwoPi = 6.283185307179586;
-constexpr double kDegToRad = kPi / 180.0;
-constexpr double kRadToDeg = 180.0 / kPi;
+using lumo::kDegToRad;
+using lumo::kPi;
+using lumo::kRadToDeg;
+using lumo::kTwoPi;
 constexpr double kSecondsPerDay = 86400.0;
 
 // Squares of the mapping ellipsoid's axes (km^2), as the mapping uses them.

@@ -5,11 +5,13 @@
 
 #include <cmath>
 
+#include "angles.h"
+
 namespace lumo::rtcs {
 
-constexpr double kPi = 3.14159265358979323846;
-constexpr double kDegToRad = kPi / 180.0;
-constexpr double kRadToDeg = 180.0 / kPi;
+using lumo::kDegToRad;
+using lumo::kPi;
+using lumo::kRadToDeg;
 
 // WGS 84 equatorial radius, the squared ratio of polar to equatorial radius
 // and its square: the radius at latitude phi is
