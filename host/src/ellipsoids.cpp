@@ -105,7 +105,10 @@ int DatumCount() {
 
 bool ResolveEarthModel(const ProjInfo_t& sInfo, const ParsedGeosys& sParsed, EarthModel* psOut) {
     EarthModel sModel;
-    if (sInfo.nEarthModelKind == NOVA_EARTH_SPHEROID_PARMS) {
+    if (sParsed.nEpsg != 0) {
+        // The code defines the system whole; parameters cannot override it.
+        sModel = LookupEpsg(sParsed.nEpsg).sModel;
+    } else if (sInfo.nEarthModelKind == NOVA_EARTH_SPHEROID_PARMS) {
         if (sInfo.adfProjParms[0] == 0.0) {
             if (!FindSpheroid(sInfo.nSpheroid)) return false;
             FromSpheroid(sInfo.nSpheroid, &sModel);
@@ -160,7 +163,10 @@ bool GetEllipsoidData(const char* pszCode, int* pnIndex, double* pdfSemiMajor,
     return true;
 }
 
-std::string EllipsoidInfoList::GetEllipsoidCode(double dfSemiMajor, double dfSemiMinor) {
+namespace nova {
+namespace detail {
+
+int NearestSpheroid(double dfSemiMajor, double dfSemiMinor) {
     constexpr double kTolerance = 1e-3;  // metres, on each axis
     int nBest = -1;
     double dfBestDistance = 0.0;
@@ -177,6 +183,14 @@ std::string EllipsoidInfoList::GetEllipsoidCode(double dfSemiMajor, double dfSem
             dfBestDistance = dfDistance;
         }
     }
+    return nBest;
+}
+
+}  // namespace detail
+}  // namespace nova
+
+std::string EllipsoidInfoList::GetEllipsoidCode(double dfSemiMajor, double dfSemiMinor) {
+    const int nBest = nova::detail::NearestSpheroid(dfSemiMajor, dfSemiMinor);
     if (nBest < 0) return std::string();
     char szCode[16];
     std::snprintf(szCode, sizeof(szCode), "E%03d", nBest);
@@ -201,7 +215,13 @@ int GetEarthModel(const ProjInfo_t* psInfo, char* pszOut) {
         nova::detail::GeosysError::kNone) {
         return -1;
     }
-    if (sParsed.cModel == '\0') {
+    if (sParsed.nEpsg != 0) {
+        // The datum or spheroid of ours that the system's earth model matches.
+        const EarthModel& sModel = nova::detail::LookupEpsg(sParsed.nEpsg).sModel;
+        if (sModel.nDatum < 0 && sModel.nSpheroid < 0) return -1;
+        std::snprintf(pszOut, 16, sModel.nDatum >= 0 ? "D%03d" : "E%03d",
+                      sModel.nDatum >= 0 ? sModel.nDatum : sModel.nSpheroid);
+    } else if (sParsed.cModel == '\0') {
         std::snprintf(pszOut, 16, "D000");
     } else {
         std::snprintf(pszOut, 16, "%c%03d", sParsed.cModel, sParsed.nModelCode);

@@ -37,6 +37,8 @@ PJ_CONTEXT* ThreadProjContext();
 constexpr std::size_t kMaxNormalisedGeosys = 19;
 // Input texts longer than this are rejected without being read further.
 constexpr std::size_t kMaxGeosysInput = 256;
+// The same for PROJ strings, WKT and PROJJSON, which run long.
+constexpr std::size_t kMaxDefinitionInput = 65536;
 // nMaxLen for a terminated C string of unknown length.
 constexpr std::size_t kUnboundedText = static_cast<std::size_t>(-1);
 
@@ -46,20 +48,28 @@ enum class GeosysError {
     kTooLong,     // longer than kMaxGeosysInput
     kUnit,        // unknown keyword, bad zone, band or extra tokens
     kEarthModel,  // malformed or unknown Dnnn / Ennn code
+    kDefinition,  // an EPSG code, PROJ string or WKT that does not give a usable system
 };
 
 struct ParsedGeosys {
     int nKind = NOVA_PROJ_UNKNOWN;
+    int nEpsg = 0;        // the code of an "EPSG:n" text, else 0
     int nZone = 0;        // UTM: 1..60, negative in the southern hemisphere
     char cBand = '\0';    // UTM latitude band letter, '\0' when not given
     char cModel = '\0';   // 'D', 'E' or '\0' (no earth model in the text)
     int nModelCode = -1;  // number after the model letter
     char szNormalised[kMaxNormalisedGeosys + 1] = {};
+    // Projection parameters that a translated PROJ string or WKT brings
+    // (GCTP convention); the text alone does not carry them.
+    bool bHasParms = false;
+    double adfParms[NOVA_PROJ_PARMS] = {};
 };
 
 // Parses at most nMaxLen characters of pszText (a terminator may come
 // earlier). Quiet: reports nothing. On failure *psOut holds the unknown kind.
 GeosysError ParseGeosys(const char* pszText, std::size_t nMaxLen, ParsedGeosys* psOut);
+// Why a text is refused, in a sentence; empty when it is accepted.
+std::string GeosysProblemText(const char* pszText, std::size_t nMaxLen);
 
 // ---------------------------------------------------------------------------
 // Earth models
@@ -99,6 +109,41 @@ struct EarthModel {
 // from the text's Dnnn / Ennn code, WGS 84 when it has none. False when the
 // model is unknown or its axes are unusable.
 bool ResolveEarthModel(const ProjInfo_t& sInfo, const ParsedGeosys& sParsed, EarthModel* psOut);
+// GCTP code of the listed spheroid nearest to these axes (both within 1 mm),
+// or -1.
+int NearestSpheroid(double dfSemiMajor, double dfSemiMinor);
+
+// ---------------------------------------------------------------------------
+// Coordinate reference systems by EPSG code, and PROJ strings, WKT and
+// PROJJSON definitions (projection_foreign.cpp)
+// ---------------------------------------------------------------------------
+
+// What a description needs to know of a system that PROJ defines.
+struct ForeignSystem {
+    int nKind = NOVA_PROJ_UNKNOWN;  // NOVA_PROJ_UNKNOWN when the system is refused
+    int nZone = 0;                  // UTM zone, negative in the southern hemisphere
+    bool bConformal = false;
+    bool bDatumless = false;  // an ellipsoid without a datum (PROJ string with +ellps)
+    EarthModel sModel;        // nDatum -1 when the datum is not in our table
+    double adfParms[NOVA_PROJ_PARMS] = {};  // GCTP parameters of TM, LCC, PS, MER
+    std::string osName;                     // the system's name
+    std::string osProblem;                  // why it is refused
+};
+
+// True when a text is a PROJ string, WKT or PROJJSON rather than our grammar.
+bool IsProjDefinition(const char* pszText, std::size_t nLen);
+// The system of an EPSG code (looked up once per thread).
+const ForeignSystem& LookupEpsg(int nCode);
+// A PROJ string, WKT or PROJJSON definition as one of our texts: "EPSG:n"
+// when PROJ identifies it with exactly one EPSG system, else a text of our
+// grammar with its parameters. An empty text and osProblem on refusal.
+struct TranslatedDefinition {
+    std::string osText;
+    bool bHasParms = false;
+    double adfParms[NOVA_PROJ_PARMS] = {};
+    std::string osProblem;
+};
+const TranslatedDefinition& TranslateDefinition(const std::string& osDefinition);
 
 }  // namespace detail
 }  // namespace nova

@@ -88,17 +88,62 @@ int FindKeyword(const std::string& osToken, const char** ppszKeyword) {
     return NOVA_PROJ_UNKNOWN;
 }
 
+// "EPSG:n", n of one to seven digits: the code, else 0.
+int EpsgCode(const std::string& osToken) {
+    if (osToken.compare(0, 5, "EPSG:") != 0) return 0;
+    const std::string osDigits = osToken.substr(5);
+    if (!AllDigits(osDigits) || osDigits.size() > 7) return 0;
+    return std::atoi(osDigits.c_str());
+}
+
+// A system PROJ's database defines: its code is the normalised text.
+GeosysError ParseEpsg(int nCode, ParsedGeosys* psOut) {
+    const ForeignSystem& sSystem = LookupEpsg(nCode);
+    if (sSystem.nKind == NOVA_PROJ_UNKNOWN) return GeosysError::kDefinition;
+    ParsedGeosys sParsed;
+    sParsed.nKind = sSystem.nKind;
+    sParsed.nZone = sSystem.nZone;
+    sParsed.nEpsg = nCode;
+    sParsed.bHasParms = RequiresProjInfo(sSystem.nKind) != 0;
+    std::copy_n(sSystem.adfParms, NOVA_PROJ_PARMS, sParsed.adfParms);
+    std::snprintf(sParsed.szNormalised, sizeof(sParsed.szNormalised), "EPSG:%d", nCode);
+    *psOut = sParsed;
+    return GeosysError::kNone;
+}
+
+// A PROJ string, WKT or PROJJSON: parsed as the text it translates into,
+// with the parameters the translation brings.
+GeosysError ParseDefinition(const char* pszText, std::size_t nLen, ParsedGeosys* psOut) {
+    if (nLen > kMaxDefinitionInput) return GeosysError::kTooLong;
+    const TranslatedDefinition& sTranslated = TranslateDefinition(std::string(pszText, nLen));
+    if (sTranslated.osText.empty()) return GeosysError::kDefinition;
+    ParsedGeosys sParsed;
+    const GeosysError eError =
+        ParseGeosys(sTranslated.osText.c_str(), sTranslated.osText.size(), &sParsed);
+    if (eError != GeosysError::kNone) return eError;
+    if (sTranslated.bHasParms) {
+        sParsed.bHasParms = true;
+        std::copy_n(sTranslated.adfParms, NOVA_PROJ_PARMS, sParsed.adfParms);
+    }
+    *psOut = sParsed;
+    return GeosysError::kNone;
+}
+
 }  // namespace
 
 GeosysError ParseGeosys(const char* pszText, std::size_t nMaxLen, ParsedGeosys* psOut) {
     *psOut = ParsedGeosys();
     if (pszText == nullptr) return GeosysError::kEmpty;
-    const std::size_t nLen = strnlen(pszText, std::min(nMaxLen, kMaxGeosysInput + 1));
+    const std::size_t nLen = strnlen(pszText, std::min(nMaxLen, kMaxDefinitionInput + 1));
+    if (IsProjDefinition(pszText, nLen)) return ParseDefinition(pszText, nLen, psOut);
     if (nLen > kMaxGeosysInput) return GeosysError::kTooLong;
 
     std::vector<std::string> aoTokens;
     if (!Tokenise(pszText, nLen, &aoTokens, 4)) return GeosysError::kUnit;
     if (aoTokens.empty()) return GeosysError::kEmpty;
+    if (const int nCode = EpsgCode(aoTokens[0])) {
+        return aoTokens.size() == 1 ? ParseEpsg(nCode, psOut) : GeosysError::kUnit;
+    }
 
     const char* pszKeyword = nullptr;
     const int nKind = FindKeyword(aoTokens[0], &pszKeyword);
@@ -155,11 +200,44 @@ GeosysError ParseGeosys(const char* pszText, std::size_t nMaxLen, ParsedGeosys* 
     return GeosysError::kNone;
 }
 
+std::string GeosysProblemText(const char* pszText, std::size_t nMaxLen) {
+    ParsedGeosys sParsed;
+    switch (ParseGeosys(pszText, nMaxLen, &sParsed)) {
+        case GeosysError::kNone:
+            return std::string();
+        case GeosysError::kEmpty:
+            return "the text is empty";
+        case GeosysError::kTooLong:
+            return "the text is too long to be a georeferencing text";
+        case GeosysError::kEarthModel:
+            return "its earth model is unknown (datums D000 to D011, ellipsoids E000 to E019)";
+        case GeosysError::kUnit:
+            return "it is not a georeferencing text: expected PIXEL, METRE, LONG/LAT, "
+                   "UTM <zone> [<band>], TM, LCC, PS or MER with an optional earth model "
+                   "(D000, E012), an EPSG code (EPSG:32631), a PROJ string or WKT";
+        case GeosysError::kDefinition:
+            break;
+    }
+    const std::size_t nLen = strnlen(pszText, std::min(nMaxLen, kMaxDefinitionInput));
+    if (IsProjDefinition(pszText, nLen)) {
+        return TranslateDefinition(std::string(pszText, nLen)).osProblem;
+    }
+    std::vector<std::string> aoTokens;
+    Tokenise(pszText, nLen, &aoTokens, 1);
+    const ForeignSystem& sSystem = LookupEpsg(aoTokens.empty() ? 0 : EpsgCode(aoTokens[0]));
+    return sSystem.osName.empty() ? sSystem.osProblem
+                                  : "\"" + sSystem.osName + "\": " + sSystem.osProblem;
+}
+
 }  // namespace detail
 }  // namespace nova
 
 using nova::detail::GeosysError;
 using nova::detail::ParsedGeosys;
+
+std::string ExplainGeosys(const char* pszGeosys) {
+    return nova::detail::GeosysProblemText(pszGeosys, nova::detail::kUnboundedText);
+}
 
 namespace {
 
@@ -231,10 +309,16 @@ int Geosys2ProjInfo(ProjInfo_t* psInfo, const char* pszGeosys, double dfXOffset,
     if (bGround) {
         sNew.nSpheroid = sModel.nSpheroid;
         sNew.nDatum = sModel.nDatum;
-        sNew.nEarthModelKind = sParsed.cModel == 'D'   ? NOVA_EARTH_DATUM
-                               : sParsed.cModel == 'E' ? NOVA_EARTH_ELLIPSOID
-                                                       : NOVA_EARTH_DEFAULT;
+        // A system by EPSG code names our datum or spheroid where one matches.
+        const char cModel = sParsed.nEpsg == 0      ? sParsed.cModel
+                            : sModel.nDatum >= 0    ? 'D'
+                            : sModel.nSpheroid >= 0 ? 'E'
+                                                    : '\0';
+        sNew.nEarthModelKind = cModel == 'D'   ? NOVA_EARTH_DATUM
+                               : cModel == 'E' ? NOVA_EARTH_ELLIPSOID
+                                               : NOVA_EARTH_DEFAULT;
     }
+    if (sParsed.bHasParms) std::copy_n(sParsed.adfParms, NOVA_PROJ_PARMS, sNew.adfProjParms);
     *psInfo = sNew;
     return 0;
 }
@@ -272,6 +356,8 @@ int IsConformal(const char* pszGeosys) {
         case NOVA_PROJ_PS:
         case NOVA_PROJ_MER:
             return 1;
+        case NOVA_PROJ_OTHER:
+            return nova::detail::LookupEpsg(sParsed.nEpsg).bConformal ? 1 : 0;
         default:
             return 0;
     }

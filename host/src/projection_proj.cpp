@@ -185,6 +185,7 @@ std::string ProjInfoToProjDefinition(const ProjInfo_t& sInfo) {
         return std::string();
     }
     if (sParsed.nKind == NOVA_PROJ_PIXEL || sParsed.nKind == NOVA_PROJ_METRE) return std::string();
+    if (sParsed.nEpsg != 0) return "EPSG:" + std::to_string(sParsed.nEpsg);
     EarthModel sModel;
     if (!ResolveEarthModel(sInfo, sParsed, &sModel)) return std::string();
     if (sParsed.nKind == NOVA_PROJ_GEOGRAPHIC) {

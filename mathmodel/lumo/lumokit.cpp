@@ -228,9 +228,8 @@ void FillRigorousProjInfo(ProjInfo_t* psP, const SRITInfo_t& sModel) {
         const std::string osGeosys = FixedText(sModel.psEphemeris->szGeosys, EPH_GEOSYS_SIZE);
         if (!osGeosys.empty()) Geosys2ProjInfo(psP, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0);
     }
-    const bool bLcc = std::toupper(static_cast<unsigned char>(psP->szProj[0])) == 'L' &&
-                      std::toupper(static_cast<unsigned char>(psP->szProj[1])) == 'C' &&
-                      std::toupper(static_cast<unsigned char>(psP->szProj[2])) == 'C';
+    // By kind, so that an EPSG code of a Lambert conformal conic counts too.
+    const bool bLcc = DecodeGeosys(psP->szProj, nullptr) == NOVA_PROJ_LCC;
     if (IsConformal(psP->szProj) == 0 || bLcc) {
         Geosys2ProjInfo(psP, FixedText(sModel.szAuxA, SRIT_AUX_TEXT_SIZE).c_str(), 0.0, 0.0, 1.0,
                         1.0);

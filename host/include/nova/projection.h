@@ -16,6 +16,9 @@ enum NovaProjKind {
     NOVA_PROJ_LCC = 5,
     NOVA_PROJ_PS = 6,
     NOVA_PROJ_MER = 7,
+    // A projected system given by its EPSG code whose projection has no
+    // keyword of its own (Lambert azimuthal equal-area, oblique Mercator...).
+    NOVA_PROJ_OTHER = 8,
 };
 
 // Earth-model kinds (nEarthModelKind).
@@ -62,13 +65,18 @@ int ProjStringToProjInfo(const char* pszProj, ProjInfo_t* psInfo);
 // characters); ProjParms2Info applies such a text (returns 0 / -1).
 char* ProjInfo2Parms(const ProjInfo_t* psInfo);
 int ProjParms2Info(const char* pszParms, ProjInfo_t* psInfo);
+// Why a georeferencing text is refused, in a sentence a user can act on;
+// empty when Geosys2ProjInfo accepts it.
+std::string ExplainGeosys(const char* pszGeosys);
 // Normalises a georeferencing text into pszOut (at least 20 characters; may
 // be null or the same buffer as pszGeosys) and returns its NovaProjKind, or
 // NOVA_PROJ_UNKNOWN (pszOut then holds an empty text).
 int DecodeGeosys(const char* pszGeosys, char* pszOut);
-// Non-zero for kinds that need adfProjParms beyond their text (TM, LCC, PS, MER).
+// Non-zero for kinds that need adfProjParms beyond their text (TM, LCC, PS,
+// MER; for an EPSG code of these kinds Geosys2ProjInfo fills them).
 int RequiresProjInfo(int nKind);
-// 1 for projected, conformal ground units (UTM, TM, LCC, PS, MER, METRE).
+// 1 for projected, conformal ground units (UTM, TM, LCC, PS, MER, METRE, and
+// EPSG codes of conformal projections).
 int IsConformal(const char* pszGeosys);
 // Reprojects one point (ground coordinates: the affine georeferencing is not
 // applied; X is easting or longitude, Y northing or latitude, in degrees for
@@ -84,6 +92,13 @@ int GCTPSimpleTransform(char* pszFrom, double dfX, double dfY, char* pszTo, doub
 // latitude band letter (C..X, 'Z' outside the bands) in *pcRow when not null.
 // Returns 0, or -1 (zone 0) for invalid coordinates.
 int UTMZone(double dfLon, double dfLat, int* pnZone, char* pcRow);
+// Ground points (X, Y) of a UTM description whose text names a latitude band
+// ("UTM 21 S") checked against that band: advice for the user when their mean
+// position lies more than one band (8 degrees of latitude) outside it, saying
+// what the letter means and how to write the zone in the other hemisphere;
+// empty otherwise (and for other descriptions or no finite point).
+std::string CheckUTMBand(const ProjInfo_t* psInfo, const double* padfX, const double* padfY,
+                         int nCount);
 // Earth-model code of a description ("D000", "E012") into pszOut (>= 16 chars).
 int GetEarthModel(const ProjInfo_t* psInfo, char* pszOut);
 
