@@ -145,7 +145,7 @@ TEST_F(CliTest, ModelFileErrorsNameFileAndField) {
          "\"poly.pixelCoeffs\" must hold 10 numbers (nCoeffs), found 9"},
         {[](json& d) { d["poly"]["yCoeffs"][3] = "x"; }, "\"poly.yCoeffs\" item 3 must be"},
         {[](json& d) { d["geosys"] = "UTM 31 U D000 EXTRA"; }, "longer than 16"},
-        {[](json& d) { d["geosys"] = "NOWHERE 99"; }, "unknown georeferencing text"},
+        {[](json& d) { d["geosys"] = "NOWHERE 99"; }, "\"NOWHERE 99\" cannot be used"},
     };
     for (std::size_t i = 0; i < cases.size(); ++i) {
         json document = good;

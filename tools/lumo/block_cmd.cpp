@@ -19,6 +19,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "fit_refine.h"
+#include "geosys_option.h"
 #include "model_io.h"
 #include "nova/projection.h"
 #include "segment_io.h"
@@ -192,10 +193,10 @@ BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
                       ": neither the project (geosys) nor the first segment "
                       "names the projection of the ground coordinates");
     }
-    ProjInfo_t proj{};
-    if (Geosys2ProjInfo(&proj, geosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("projection " + Quoted(geosys) + " is not a known georeferencing text");
-    }
+    const std::string where = !project.osGeosys.empty()
+                                  ? project.osSource + ": field \"geosys\""
+                                  : project.asImages.front().osSegmentPath + ": szGeosys";
+    const ProjInfo_t proj = UserGeosys(geosys, where);
     BlockResult r;
     r.a = MakeArrays(project);
     BlockArrays& a = r.a;

@@ -17,6 +17,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "fit_refine.h"
+#include "geosys_option.h"
 #include "lrs_io.h"
 #include "nova/projection.h"
 #include "nova/regression.h"
@@ -54,18 +55,6 @@ std::string Number(double value) {
     char text[32];
     std::snprintf(text, sizeof text, "%.6g", value);
     return text;
-}
-
-// Projection description of the ground coordinates; the text must fit the
-// records' 16-character buffers and be one the projection service reads.
-void CheckGeosys(const std::string& geosys, ProjInfo_t* psProjInfo) {
-    if (geosys.size() >= static_cast<std::size_t>(POLY_GEOSYS_SIZE)) {
-        LUMO_CLI_FAIL("--geosys " + Quoted(geosys) + " is longer than " +
-                      std::to_string(POLY_GEOSYS_SIZE - 1) + " characters");
-    }
-    if (Geosys2ProjInfo(psProjInfo, geosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("--geosys " + Quoted(geosys) + " is not a known georeferencing text");
-    }
 }
 
 // Image size: given, or the smallest whole size whose image [0, size) holds
@@ -144,7 +133,7 @@ void CheckFittedOrder(const FitOptions& options, int requested, const GEOInfo_t&
     context.err << "lumo fit: " << asked << "; writing the lower order\n";
 }
 
-PolyPtr FitPoly(const FitOptions& options, const std::string& geosys, ControlArrays& c,
+PolyPtr FitPoly(const FitOptions& options, const ProjInfo_t& proj, ControlArrays& c,
                 CommandContext& context) {
     const int requested = options.nOrder == 0 ? 1 : options.nOrder;
     std::unique_ptr<GEOInfo_t> forward(new GEOInfo_t{});
@@ -152,7 +141,7 @@ PolyPtr FitPoly(const FitOptions& options, const std::string& geosys, ControlArr
     int orderForward = requested;
     int orderInverse = requested;
     double rmsPixel = 0, rmsLine = 0, rmsX = 0, rmsY = 0;
-    const char* unit = geosys.c_str();
+    const char* unit = proj.szProj;
     GCPRegression2(forward.get(), unit, c.x.data(), c.y.data(), "PIXEL", c.pixel.data(),
                    c.line.data(), c.Count(), &orderForward, 0, &rmsPixel, &rmsLine);
     GCPRegression2(inverse.get(), "PIXEL", c.pixel.data(), c.line.data(), unit, c.x.data(),
@@ -322,9 +311,10 @@ void RunFit(const FitOptions& options, CommandContext& context) {
             "--geosys is required for --model poly and tps (or a \"# geosys:\" line in the "
             "control point file)");
     }
-    ProjInfo_t projInfo{};
-    CheckGeosys(geosys, &projInfo);
+    const ProjInfo_t projInfo =
+        UserGeosys(geosys, options.osGeosys.empty() ? options.osGcps + ": \"# geosys:\"" : "--geosys");
     ControlArrays c = ToArrays(gcps);
+    WarnOutsideUTMBand(projInfo, c.x, c.y, "lumo fit", context.err);
     const bool bPoly = options.osModel == "poly";
     const int requested = options.nOrder == 0 ? 1 : options.nOrder;
     const FitResiduals residuals =
@@ -338,17 +328,17 @@ void RunFit(const FitOptions& options, CommandContext& context) {
 
     nlohmann::json document;
     if (options.osModel == "poly") {
-        PolyPtr poly = FitPoly(options, geosys, c, context);
+        PolyPtr poly = FitPoly(options, projInfo, c, context);
         poly->nPixels = nPixels;
         poly->nLines = nLines;
-        std::memcpy(poly->pszGeosys, geosys.c_str(), geosys.size() + 1);
+        StoreGeosys(projInfo, poly->pszGeosys, POLY_GEOSYS_SIZE, "--geosys");
         *poly->psProjInfo = projInfo;
         document = PolyToJson(*poly);
     } else {
         TpsPtr tps = FitTps(c, context);
         tps->nPixels = nPixels;
         tps->nLines = nLines;
-        std::memcpy(tps->pszGeosys, geosys.c_str(), geosys.size() + 1);
+        StoreGeosys(projInfo, tps->pszGeosys, TPS_GEOSYS_SIZE, "--geosys");
         *tps->psProjInfo = projInfo;
         document = TpsToJson(*tps);
     }
@@ -388,9 +378,9 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
         ->check(CLI::Range(1, GCP_MAX_ORDER));
     command->add_option("--geosys", options->osGeosys,
-                        "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\" "
-                        "(srit: default the segment's; rf: converted to the model's; lrs: "
-                        "default longitude and latitude)");
+                        "georeferencing text of the ground coordinates, e.g. \"UTM 31 U D000\", "
+                        "\"EPSG:32631\", a PROJ string or WKT (srit: default the segment's; rf: "
+                        "converted to the model's; lrs: default longitude and latitude)");
     command
         ->add_option("--pixels", options->nPixels,
                      "image width (default: just above the largest control point pixel)")

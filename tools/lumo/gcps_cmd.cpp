@@ -11,6 +11,7 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#include "geosys_option.h"
 #include "lumo_gcp.h"
 #include "nova/projection.h"
 #include "points_io.h"
@@ -25,14 +26,6 @@ struct GcpsConvertOptions {
     std::string osOutput;
     PointFileOptions sPoints;  // --height
 };
-
-ProjInfo_t ProjectionOf(const std::string& osGeosys) {
-    ProjInfo_t sProj{};
-    if (Geosys2ProjInfo(&sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("--geosys: " + Quoted(osGeosys) + " is not a known georeferencing text");
-    }
-    return sProj;
-}
 
 std::vector<ControlPoint_t> ToControlPoints(const PointSet& points) {
     std::vector<ControlPoint_t> asGcps;
@@ -58,11 +51,17 @@ std::vector<ControlPoint_t> ToControlPoints(const PointSet& points) {
 }
 
 void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) {
-    const ProjInfo_t sProj = ProjectionOf(options.osGeosys);
+    const ProjInfo_t sProj = UserGeosys(options.osGeosys, "--geosys");
     PointSet points = ReadPointsFile(options.osInput, PointKind::ControlPoint);
     // The converted heights depend on the heights given: none are assumed.
     ApplyHeights(points, options.sPoints, true, "the datum conversion");
     std::vector<ControlPoint_t> asGcps = ToControlPoints(points);
+    std::vector<double> x, y;
+    for (const ControlPoint_t& gcp : asGcps) {
+        x.push_back(gcp.dfGroundX);
+        y.push_back(gcp.dfGroundY);
+    }
+    WarnOutsideUTMBand(sProj, x, y, "lumo gcps convert", context.err);
     try {
         ConvertGcpsToWgs84Ell(sProj, options.osHeightRef, asGcps);
     } catch (const nova::ParameterException& e) {

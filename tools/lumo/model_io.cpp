@@ -7,6 +7,7 @@
 
 #include "ap_io.h"
 #include "cli_error.h"
+#include "geosys_option.h"
 #include "json_fields.h"
 #include "lrs_io.h"
 #include "nova/projection.h"
@@ -121,10 +122,7 @@ void RequireValidRecord(const ModelEnvelope& envelope, const char* pszFamily,
 }
 
 void EnvelopeToProjInfo(const ModelEnvelope& envelope, ProjInfo_t* psProjInfo) {
-    if (Geosys2ProjInfo(psProjInfo, envelope.osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL(envelope.osSource + ": field \"geosys\": unknown georeferencing text " +
-                      Quoted(envelope.osGeosys));
-    }
+    *psProjInfo = UserGeosys(envelope.osGeosys, envelope.osSource + ": field \"geosys\"");
     if (!envelope.osProjParms.empty() &&
         ProjParms2Info(envelope.osProjParms.c_str(), psProjInfo) != 0) {
         LUMO_CLI_FAIL(envelope.osSource + ": field \"projParms\": cannot apply " +

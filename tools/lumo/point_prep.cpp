@@ -9,6 +9,7 @@
 #include <CLI/CLI.hpp>
 
 #include "cli_error.h"
+#include "geosys_option.h"
 #include "commands.h"
 #include "nova/projection.h"
 
@@ -23,9 +24,7 @@ Georef MakeGeoref(const std::string& osGeosys, const std::string& osProjParms,
     Georef g;
     g.osGeosys = osGeosys;
     g.osProjParms = osProjParms;
-    if (Geosys2ProjInfo(&g.sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL(osWhere + ": " + Quoted(osGeosys) + " is not a known georeferencing text");
-    }
+    g.sProj = UserGeosys(osGeosys, osWhere);
     if (!osProjParms.empty() && ProjParms2Info(osProjParms.c_str(), &g.sProj) != 0) {
         LUMO_CLI_FAIL(osWhere + ": cannot apply the projection parameters " + Quoted(osProjParms));
     }

@@ -8,6 +8,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "fit_refine.h"
+#include "geosys_option.h"
 #include "nova/projection.h"
 #include "points_io.h"
 #include "segment_io.h"
@@ -66,16 +67,15 @@ void RunSritFit(const PointSet& allGcps, const std::string& segmentPath, const s
     if (osGeosys.empty()) {
         LUMO_CLI_FAIL(segmentPath + ": the segment names no projection (szGeosys); give --geosys");
     }
-    ProjInfo_t sProj{};
-    if (Geosys2ProjInfo(&sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("projection " + Quoted(osGeosys) + " is not a known georeferencing text");
-    }
+    const ProjInfo_t sProj =
+        UserGeosys(osGeosys, !geosys.empty() ? "--geosys" : segmentPath + ": szGeosys");
     if (allGcps.asPoints.size() < kSritLeastPoints) {
         LUMO_CLI_FAIL(allGcps.osSource +
                       ": the rigorous model needs at least 3 control points, found " +
                       std::to_string(allGcps.asPoints.size()));
     }
     const ControlArrays all = ToArrays(allGcps);
+    WarnOutsideUTMBand(sProj, all.x, all.y, "lumo fit", context.err);
     const FitResiduals residuals =
         RefineAndMeasure(SritImageFit(*psSegment, sProj, all), allGcps, kSritLeastPoints, refine);
     const PointSet gcps = KeptPoints(allGcps, residuals);

@@ -1,0 +1,41 @@
+#include "geosys_option.h"
+
+#include <algorithm>
+#include <cstring>
+
+#include "cli_error.h"
+
+namespace lumo::cli {
+
+ProjInfo_t UserGeosys(const std::string& text, const std::string& where) {
+    ProjInfo_t proj{};
+    InitProjInfo(&proj, 0);
+    // The projection services' own warning would only repeat the reason.
+    const nova::ErrorSink previous = nova::SetErrorSink([](const nova::ErrorReport&) {});
+    const int result = Geosys2ProjInfo(&proj, text.c_str(), 0.0, 0.0, 1.0, 1.0);
+    nova::SetErrorSink(previous);
+    if (result < 0) {
+        LUMO_CLI_FAIL(where + ": " + Quoted(text) + " cannot be used: " +
+                      ExplainGeosys(text.c_str()) + " (see docs/georeferencing.md)");
+    }
+    return proj;
+}
+
+void StoreGeosys(const ProjInfo_t& proj, char* buffer, int bufferSize, const std::string& where) {
+    const std::size_t length = strnlen(proj.szProj, sizeof proj.szProj);
+    if (length >= static_cast<std::size_t>(bufferSize)) {
+        LUMO_CLI_FAIL(where + ": " + Quoted(proj.szProj) + " is longer than the model's " +
+                      std::to_string(bufferSize - 1) + " characters");
+    }
+    std::memcpy(buffer, proj.szProj, length + 1);
+}
+
+void WarnOutsideUTMBand(const ProjInfo_t& proj, const std::vector<double>& x,
+                        const std::vector<double>& y, const std::string& prefix,
+                        std::ostream& err) {
+    const std::string advice =
+        CheckUTMBand(&proj, x.data(), y.data(), static_cast<int>(std::min(x.size(), y.size())));
+    if (!advice.empty()) err << prefix << ": warning: " << advice << '\n';
+}
+
+}  // namespace lumo::cli
