@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <string>
+#include <vector>
 
 #include "lumo_types.h"
 
@@ -96,33 +97,50 @@ LUMO_API int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU,
 LUMO_API unsigned char* LumoRFInfoToBinary(RFInfo_t* psRF, int* pnLength);
 LUMO_API RFInfo_t* LumoBinaryToRFInfo(int nLength, unsigned char* pabyBlock);
 
-// RPC00B text forms: the "KEY: value" form of *_RPC.TXT files and the
-// "name = value;" block form of .RPB files. Longitude is X, latitude Y,
-// sample the pixel; the record gets nHalfPixelShift = 1, so pixel (0, 0) is
-// the corner of the first pixel while RPC sample 0 is its centre.
+// RPC00B text forms: the "KEY: value" form of *_RPC.TXT files, the
+// "name = value;" block form of .RPB files (the ';' may be left out, as some
+// producers do) and the fixed-width single record of RPC-*.txt files. Longitude
+// is X, latitude Y, sample the pixel; the record gets nHalfPixelShift = 1, so
+// pixel (0, 0) is the corner of the first pixel while RPC sample 0 is its
+// centre.
 enum LumoRPCTextForm {
     LUMO_RPC_TEXT_AUTO = 0,  // reading only: recognised from the text
     LUMO_RPC_TEXT_TXT = 1,
     LUMO_RPC_TEXT_RPB = 2,
+    LUMO_RPC_TEXT_FIXED = 3,  // reading only
+};
+
+// A field of an RPC text that the model record has no room for: the error
+// estimates ERR_BIAS and ERR_RAND, the satellite, band and product names,
+// and any other statement a producer adds. Kept so that a conversion from one
+// text form to another loses nothing.
+struct LumoRPCField {
+    std::string osKey;    // as the file spells it ("ERR_BIAS", "errBias", "bandId")
+    std::string osValue;  // the value without quotes (and without the unit of ERR_BIAS)
+    bool bQuoted;         // the statement form writes the value in double quotes
 };
 
 // Reads a model from RPC text. pszSource names the text in messages (a file
-// name). Throws nova::DataException naming the source, the line and the key
-// for a missing, repeated or malformed key, a non-finite number or a zero
-// scale, and naming the field for a model RFValidate refuses. Returns a new
-// record (RFDeallocate).
+// name). Throws nova::DataException naming the source, the line (or the
+// byte offset in the fixed-width form) and the key for a missing, repeated or
+// malformed key, a non-finite number or a zero scale, and naming the field
+// for a model RFValidate refuses. Returns a new record (RFDeallocate); the
+// other fields of the text go to *paoFields when given.
 LUMO_API RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
-                                       const char* pszSource);
-// Writes a model as RPC text in the given form. An image-space adjustment in
-// force is folded into the offsets, scales and numerators when that is
-// exact: a shift, or an affine change whose cross terms join pixel and line
-// of one shared denominator. Throws nova::DataException when the model has
-// no RPC equivalent (second-order adjustment, cross terms over different
-// denominators, ground coordinates not geographic, more than 20 terms,
-// values not finite).
-LUMO_API std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm);
-// The form of a text: LUMO_RPC_TEXT_TXT, LUMO_RPC_TEXT_RPB, or
-// LUMO_RPC_TEXT_AUTO when it looks like neither.
+                                       const char* pszSource,
+                                       std::vector<LumoRPCField>* paoFields = nullptr);
+// Writes a model as RPC text in the given form (TXT or RPB), with the fields
+// read beside it (ERR_BIAS and errBias and their kin are spelt as the form
+// spells them). An image-space adjustment in force is folded into the
+// offsets, scales and numerators when that is exact: a shift, or an affine
+// change whose cross terms join pixel and line of one shared denominator.
+// Throws nova::DataException when the model has no RPC equivalent
+// (second-order adjustment, cross terms over different denominators, ground
+// coordinates not geographic, more than 20 terms, values not finite).
+LUMO_API std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm,
+                                         const std::vector<LumoRPCField>& aoFields = {});
+// The form of a text: LUMO_RPC_TEXT_TXT, LUMO_RPC_TEXT_RPB,
+// LUMO_RPC_TEXT_FIXED, or LUMO_RPC_TEXT_AUTO when it looks like none.
 LUMO_API int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength);
 
 // The image-space adjustment a fit computes, by its number of terms: a

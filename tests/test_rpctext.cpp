@@ -2,7 +2,9 @@
 // forms, and every error path of the reader and the writer.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
+#include <cstdio>
 #include <cstring>
 #include <memory>
 #include <sstream>
@@ -37,9 +39,10 @@ std::string ParseError(const std::string& text) {
     return "";
 }
 
-std::string WriteError(const RFInfo_t* psRF, int nForm) {
+std::string WriteError(const RFInfo_t* psRF, int nForm,
+                       const std::vector<LumoRPCField>& aoFields = {}) {
     try {
-        LumoRFInfoToRPCText(psRF, nForm);
+        LumoRFInfoToRPCText(psRF, nForm, aoFields);
     } catch (const nova::DataException& e) {
         return e.what();
     }
@@ -194,10 +197,10 @@ TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
     const std::size_t lastItem = rpb.rfind(",\n");
     const std::string shortList = rpb.substr(0, lastItem) + ");\nEND_GROUP = IMAGE\nEND;\n";
     EXPECT_NE(ParseError(shortList).find("must hold 20 coefficients, found 19"), std::string::npos);
-    EXPECT_NE(ParseError(Replace(rpb, "heightScale = +500;", "heightScale = +500"))
+    EXPECT_NE(ParseError(Replace(rpb, "heightScale = +500;", "heightScale = +500 +1"))
                   .find("key \"heightScale\""),
               std::string::npos);
-    EXPECT_NE(ParseError(rpb.substr(0, rpb.size() - 30)).find("statement not ended"),
+    EXPECT_NE(ParseError(rpb.substr(0, rpb.size() - 30)).find("list not closed"),
               std::string::npos);
     EXPECT_NE(ParseError(Replace(rpb, "\tlatScale = +0.11;\n", "")).find("\"latScale\" is missing"),
               std::string::npos);
@@ -234,6 +237,105 @@ TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
     EXPECT_EQ(WriteError(psRF.get(), LUMO_RPC_TEXT_TXT), "");
 }
 
+// Producers' variants: statements without ';', and the fixed-width record
+// with or without its validity flag and error estimates, line ends anywhere.
+// Each reads into the model its "KEY: value" equivalent gives.
+TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
+    RecordPtr psSample = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    std::string rpb = LumoRFInfoToRPCText(psSample.get(), LUMO_RPC_TEXT_RPB);
+    rpb = "bandId = \"P\"\n" +
+          Replace(rpb, "BEGIN_GROUP = IMAGE\n", "BEGIN_GROUP = IMAGE\nerrBias = 2.5;\n");
+    std::string bare = rpb;
+    bare.erase(std::remove(bare.begin(), bare.end(), ';'), bare.end());
+    std::vector<LumoRPCField> aoFields;
+    RecordPtr psBare(
+        LumoRPCTextToRFInfo(bare.data(), bare.size(), LUMO_RPC_TEXT_AUTO, "x.RPB", &aoFields),
+        &RFDeallocate);
+    ExpectSameModel(*psSample, *psBare);
+    ASSERT_EQ(aoFields.size(), 3u);  // bandId, SpecId, errBias
+    EXPECT_EQ(aoFields[2].osKey, "errBias");
+    EXPECT_EQ(aoFields[2].osValue, "2.5");
+
+    // The fixed-width fields: integer pixel offsets, degrees with four
+    // decimals, coefficients with seven digits and a one-digit exponent.
+    const double* pdf = &psSample->dfXOffset;
+    const double adfScalar[] = {4961,   5074,   pdf[2], pdf[0], pdf[4],
+                                pdf[9], pdf[7], pdf[3], pdf[1], pdf[5]};
+    const char* apszFormat[] = {"%06.0f", "%05.0f", "%+08.4f", "%+09.4f", "%+05.0f",
+                                "%06.0f", "%05.0f", "%+08.4f", "%+09.4f", "%+05.0f"};
+    const char* apszKeys[] = {"LINE_OFF",   "SAMP_OFF",    "LAT_OFF",    "LONG_OFF",
+                              "HEIGHT_OFF", "LINE_SCALE",  "SAMP_SCALE", "LAT_SCALE",
+                              "LONG_SCALE", "HEIGHT_SCALE"};
+    std::string fixed, txt;
+    char field[32];
+    for (int k = 0; k < 10; ++k) {
+        std::snprintf(field, sizeof field, apszFormat[k], adfScalar[k]);
+        fixed += field;
+        txt += std::string(apszKeys[k]) + ": " + field + "\n";
+    }
+    const double* apadfLists[] = {psSample->padfLineNum, psSample->padfLineDen,
+                                  psSample->padfPixelNum, psSample->padfPixelDen};
+    const char* apszLists[] = {"LINE_NUM_COEFF_", "LINE_DEN_COEFF_", "SAMP_NUM_COEFF_",
+                               "SAMP_DEN_COEFF_"};
+    for (int l = 0; l < 4; ++l) {
+        for (int i = 0; i < 20; ++i) {
+            std::snprintf(field, sizeof field, "%+.6E", apadfLists[l][i]);
+            std::string value = field;
+            value.erase(value.size() - 2, 1);  // E-05 -> E-5
+            ASSERT_EQ(value.size(), 12u) << value;
+            fixed += value;
+            txt += apszLists[l] + std::to_string(i + 1) + ": " + value + "\n";
+        }
+    }
+    RecordPtr psExpected = Parse(txt);
+    // Led by the validity flag, ERR_BIAS and ERR_RAND (seven characters each).
+    std::string wrapped =
+        "1"
+        "0000.50"
+        "0002.25" +
+        fixed;
+    for (std::size_t at = 80; at < wrapped.size(); at += 81) wrapped.insert(at, "\r\n");
+    for (const std::string& record : {fixed, wrapped + "\n"}) {
+        EXPECT_EQ(LumoDetectRPCTextForm(record.data(), record.size()), LUMO_RPC_TEXT_FIXED);
+        std::vector<LumoRPCField> aoFixedFields;
+        RecordPtr psFixed(LumoRPCTextToRFInfo(record.data(), record.size(), LUMO_RPC_TEXT_AUTO,
+                                              "RPC-x.txt", &aoFixedFields),
+                          &RFDeallocate);
+        ExpectSameModel(*psExpected, *psFixed);
+        EXPECT_EQ(aoFixedFields.size(), record == fixed ? 0u : 2u);
+    }
+    EXPECT_NE(ParseError("0" + wrapped.substr(1)).find("not usable"), std::string::npos);
+    EXPECT_NE(ParseError(fixed.substr(1)).find("found 1025"), std::string::npos);
+    EXPECT_NE(ParseError(Replace(fixed, "+", "+.")).find("characters"), std::string::npos);
+}
+
+// Fields beside the model survive TXT -> RPB -> TXT under each form's names;
+// fields a form cannot write are refused, not dropped.
+TEST(RPCText, FieldsSurviveConversionsBetweenForms) {
+    const std::string text = "ERR_BIAS: 1.5 meters\nERR_RAND: 0.25 meters\nPRODUCT: ortho ready\n" +
+                             ReadFile(kExamples + "/rf_scene_RPC.TXT");
+    std::vector<LumoRPCField> aoFields;
+    RecordPtr psRF(
+        LumoRPCTextToRFInfo(text.data(), text.size(), LUMO_RPC_TEXT_TXT, "a.TXT", &aoFields),
+        &RFDeallocate);
+    const std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB, aoFields);
+    EXPECT_NE(rpb.find("errBias = 1.5;"), std::string::npos);
+    EXPECT_NE(rpb.find("PRODUCT = \"ortho ready\";"), std::string::npos);
+    std::vector<LumoRPCField> aoBack;
+    RecordPtr psBack(
+        LumoRPCTextToRFInfo(rpb.data(), rpb.size(), LUMO_RPC_TEXT_RPB, "a.RPB", &aoBack),
+        &RFDeallocate);
+    ExpectSameModel(*psRF, *psBack);
+    const std::string txt = LumoRFInfoToRPCText(psBack.get(), LUMO_RPC_TEXT_TXT, aoBack);
+    for (const char* line : {"ERR_BIAS: 1.5 meters\n", "ERR_RAND: 0.25 meters\n",
+                             "PRODUCT: ortho ready\n", "SpecId: RPC00B\n"}) {
+        EXPECT_NE(txt.find(line), std::string::npos) << line;
+    }
+    aoFields.push_back({"bad key", "1", false});
+    EXPECT_NE(WriteError(psRF.get(), LUMO_RPC_TEXT_RPB, aoFields).find("cannot be written"),
+              std::string::npos);
+}
+
 TEST(RPCText, LongSatelliteNameIsCutToTheSensorBuffer) {
     RecordPtr psRF = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB);
@@ -267,6 +369,16 @@ TEST(RPCText, ToolConvertsBetweenAllForms) {
         EXPECT_NEAR(psFromBlock->padfPixelNum[i], psSample->padfPixelNum[i],
                     1e-14 * std::fabs(psSample->padfPixelNum[i]));
     }
+    // The error estimates of a text go through JSON into the other text form;
+    // the binary block says it cannot keep them.
+    const std::string withErrors = dir + "/e_RPC.TXT", errJson = dir + "/e.json";
+    std::ofstream(withErrors) << "ERR_BIAS: 3.5 meters\n" << ReadFile(sample);
+    EXPECT_EQ(run({"rpc", withErrors, errJson}).first, 0);
+    EXPECT_EQ(run({"rpc", errJson, rpb}).first, 0);
+    EXPECT_NE(ReadFile(rpb).find("errBias = 3.5;"), std::string::npos);
+    const std::string note = run({"rpc", rpb, bin}).second;
+    EXPECT_NE(note.find("no room for"), std::string::npos);
+    EXPECT_NE(note.find("errBias"), std::string::npos);
     const auto failed = run({"rpc", sample, dir + "/x.unknown"});
     EXPECT_NE(failed.first, 0);
     EXPECT_NE(failed.second.find("give --to"), std::string::npos);

@@ -1,9 +1,11 @@
 // RPC00B text forms of a rational function model: the "KEY: value" lines of
-// *_RPC.TXT files and the "name = value;" statements of .RPB files. Both
-// carry ten normalisation values and four lists of 20 coefficients, with
-// longitude, latitude and height on the ground side and line and sample on
-// the image side. RPC sample and line 0 are the centre of the first pixel,
-// which is what the model's half-pixel shift expresses.
+// *_RPC.TXT files, the "name = value;" statements of .RPB files and the
+// fixed-width record of RPC-*.txt files. All carry ten normalisation values
+// and four lists of 20 coefficients, with longitude, latitude and height on
+// the ground side and line and sample on the image side. RPC sample and line
+// 0 are the centre of the first pixel, which is what the model's half-pixel
+// shift expresses. Every other field of a text (error estimates, names) is
+// handed back beside the record, so conversions keep it.
 #include <algorithm>
 #include <array>
 #include <cctype>
@@ -61,16 +63,27 @@ struct RpcValues {
     std::array<std::array<double, RF_MAX_TERMS>, kListCount> aadfCoeff{};
     std::array<std::array<int, RF_MAX_TERMS>, kListCount> aanCoeffLine{};
     std::string osSensor;
+    std::vector<LumoRPCField> aoFields;  // everything else, in file order
 };
+
+// Fields both text forms carry under different names: the error estimates
+// (metres).
+struct FieldSpelling {
+    const char* pszTxt;
+    const char* pszRpb;
+};
+constexpr FieldSpelling kFieldSpellings[] = {{"ERR_BIAS", "errBias"}, {"ERR_RAND", "errRand"}};
 
 // Where a value came from, for messages.
 struct Origin {
     const std::string& osSource;
     int nLine;
     std::string osKey;
+    std::string osPlace = std::string();  // where, when not a line ("characters 16-21")
 
     std::string Prefix() const {
-        return osSource + ": line " + std::to_string(nLine) + ": key \"" + osKey + "\"";
+        return osSource + ": " + (osPlace.empty() ? "line " + std::to_string(nLine) : osPlace) +
+               ": key \"" + osKey + "\"";
     }
 };
 
@@ -237,8 +250,21 @@ void ReadTxtLine(const std::string& osLine, int nLine, const std::string& osSour
             return;
         }
     }
-    // Other keys (ERR_BIAS, ERR_RAND, vendor additions) carry nothing the
-    // model keeps.
+    // The error estimates are numbers with a unit; other keys are kept as
+    // written.
+    for (const FieldSpelling& sSpelling : kFieldSpellings) {
+        if (!EqualNoCase(origin.osKey, sSpelling.pszTxt)) continue;
+        const std::size_t nBlank = osValue.find_first_of(" \t");
+        ParseTxtValue(osValue, origin);
+        values.aoFields.push_back({origin.osKey, osValue.substr(0, nBlank), false});
+        return;
+    }
+    // Names are written in quotes by the statement form.
+    char* pszEnd = nullptr;
+    std::strtod(osValue.c_str(), &pszEnd);
+    const bool bNumber = !osValue.empty() && *pszEnd == '\0';
+    if (EqualNoCase(origin.osKey, "satId")) values.osSensor = osValue;
+    values.aoFields.push_back({origin.osKey, osValue, !bNumber});
 }
 
 RpcValues ReadTxt(const std::string& osText, const std::string& osSource) {
@@ -289,9 +315,10 @@ void ReadRpbStatement(const std::string& osStatement, int nLine, const std::stri
                  ": expected \"name = value;\", found " + Shown(osStatement));
     }
     const Origin origin{osSource, nLine, Trim(osStatement.substr(0, nEquals))};
-    // The statement ends with its ';', which is not part of the value.
-    const std::string osValue =
-        Trim(osStatement.substr(nEquals + 1, osStatement.size() - nEquals - 2));
+    // A ';' ending the statement is not part of the value.
+    std::string osValue = Trim(osStatement.substr(nEquals + 1));
+    if (!osValue.empty() && osValue.back() == ';')
+        osValue = Trim(osValue.substr(0, osValue.size() - 1));
     for (int k = 0; k < kScalarCount; ++k) {
         if (EqualNoCase(origin.osKey, kRpbScalarKeys[k])) {
             StoreScalar(values, k, ParseNumber(osValue, origin), origin);
@@ -311,12 +338,26 @@ void ReadRpbStatement(const std::string& osStatement, int nLine, const std::stri
         return;
     }
     if (EqualNoCase(origin.osKey, "satId")) values.osSensor = Unquote(osValue);
+    values.aoFields.push_back({origin.osKey, Unquote(osValue), Unquote(osValue) != osValue});
 }
 
 // Group brackets and the closing "END;" carry no values.
 bool IsStructureLine(const std::string& osLine) {
     return StartsWithNoCase(osLine, "BEGIN_GROUP") || StartsWithNoCase(osLine, "END_GROUP") ||
            EqualNoCase(osLine, "END;") || EqualNoCase(osLine, "END");
+}
+
+// A statement ends with ';', or, as some producers write them, with the end
+// of a line outside a "( ... )" list (brackets inside quotes do not count).
+bool StatementComplete(const std::string& osStatement) {
+    if (osStatement.back() == ';') return true;
+    int nDepth = 0;
+    bool bQuoted = false;
+    for (char ch : osStatement) {
+        if (ch == '"') bQuoted = !bQuoted;
+        if (!bQuoted) nDepth += ch == '(' ? 1 : ch == ')' ? -1 : 0;
+    }
+    return nDepth <= 0;
 }
 
 RpcValues ReadRpb(const std::string& osText, const std::string& osSource) {
@@ -334,17 +375,93 @@ RpcValues ReadRpb(const std::string& osText, const std::string& osSource) {
             osStatement += ' ';
         }
         osStatement += osLine;
-        // A statement (a list may span lines) ends with ';'.
-        if (osStatement.back() == ';') {
+        if (StatementComplete(osStatement)) {
             ReadRpbStatement(osStatement, nStatementLine, osSource, values);
             osStatement.clear();
         }
     }
     if (!osStatement.empty()) {
         RPC_FAIL(osSource + ": line " + std::to_string(nStatementLine) +
-                 ": statement not ended by \";\": " + Shown(osStatement));
+                 ": list not closed by \")\": " + Shown(osStatement));
     }
     RequireComplete(values, osSource, false);
+    return values;
+}
+
+// ---------------------------------------------------------------------------
+// Fixed-width record (RPC-*.txt): the RPC00B field layout without names,
+// optionally led by the validity flag and the two error estimates
+// ---------------------------------------------------------------------------
+
+constexpr std::array<std::size_t, kScalarCount> kFixedScalarWidths = {6, 5, 8, 9, 5, 6, 5, 8, 9, 5};
+constexpr std::size_t kFixedCoeffWidth = 12;
+constexpr std::size_t kFixedBody = 66 + kListCount * RF_MAX_TERMS * kFixedCoeffWidth;
+constexpr std::size_t kFixedLead = 15;  // SUCCESS (1), ERR_BIAS (7), ERR_RAND (7)
+
+// The record's characters: line ends removed, trailing blanks cut.
+std::string FixedRecord(const std::string& osText) {
+    std::string osRecord;
+    for (char ch : osText) {
+        if (ch != '\r' && ch != '\n') osRecord += ch;
+    }
+    while (!osRecord.empty() && IsBlank(osRecord.back())) osRecord.pop_back();
+    return osRecord;
+}
+
+// Only the characters of fixed-width numbers: no keys, no separators.
+bool LooksFixed(const std::string& osRecord) {
+    return !osRecord.empty() &&
+           osRecord.find_first_not_of("0123456789+-.Ee \t") == std::string::npos;
+}
+
+// The number in the field at nStart, named after its key in messages.
+double FixedField(const std::string& osRecord, std::size_t nStart, std::size_t nWidth,
+                  const std::string& osKey, const std::string& osSource) {
+    const Origin origin{
+        osSource, 1, osKey,
+        "characters " + std::to_string(nStart + 1) + "-" + std::to_string(nStart + nWidth)};
+    return ParseNumber(Trim(osRecord.substr(nStart, nWidth)), origin);
+}
+
+RpcValues ReadFixed(const std::string& osText, const std::string& osSource) {
+    const std::string osRecord = FixedRecord(osText);
+    if (osRecord.size() != kFixedBody && osRecord.size() != kFixedBody + kFixedLead) {
+        RPC_FAIL(osSource + ": a fixed-width RPC record has " + std::to_string(kFixedBody) +
+                 " or " + std::to_string(kFixedBody + kFixedLead) +
+                 " characters (line ends aside), found " + std::to_string(osRecord.size()));
+    }
+    RpcValues values;
+    std::size_t nPos = 0;
+    if (osRecord.size() == kFixedBody + kFixedLead) {
+        if (osRecord[0] != '1') {
+            RPC_FAIL(osSource + ": character 1: the validity flag is " +
+                     Shown(osRecord.substr(0, 1)) +
+                     "; the producer marks these coefficients as not usable");
+        }
+        for (int i = 0; i < 2; ++i) {
+            const char* pszKey = kFieldSpellings[i].pszTxt;
+            const std::size_t nStart = 1 + 7 * static_cast<std::size_t>(i);
+            FixedField(osRecord, nStart, 7, pszKey, osSource);
+            values.aoFields.push_back({pszKey, Trim(osRecord.substr(nStart, 7)), false});
+        }
+        nPos = kFixedLead;
+    }
+    for (int k = 0; k < kScalarCount; ++k) {
+        const Origin origin{osSource, 1, kTxtScalarKeys[k]};
+        StoreScalar(values, k,
+                    FixedField(osRecord, nPos, kFixedScalarWidths[k], kTxtScalarKeys[k], osSource),
+                    origin);
+        nPos += kFixedScalarWidths[k];
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            const std::string osKey = kTxtListPrefixes[nList] + std::to_string(i + 1);
+            const Origin origin{osSource, 1, osKey};
+            StoreCoefficient(values, nList, i,
+                             FixedField(osRecord, nPos, kFixedCoeffWidth, osKey, osSource), origin);
+            nPos += kFixedCoeffWidth;
+        }
+    }
     return values;
 }
 
@@ -516,8 +633,60 @@ std::string Coefficient(double dfValue) {
     return nova::FormatString("%+.16E", dfValue);
 }
 
-std::string WriteTxt(const RpcValues& values) {
+// The spelling of a field's key in one form: the error estimates have one
+// name per form, other keys are written as read.
+std::string KeyInForm(const LumoRPCField& sField, bool bTxt) {
+    for (const FieldSpelling& sSpelling : kFieldSpellings) {
+        if (EqualNoCase(sField.osKey, sSpelling.pszTxt) ||
+            EqualNoCase(sField.osKey, sSpelling.pszRpb)) {
+            return bTxt ? sSpelling.pszTxt : sSpelling.pszRpb;
+        }
+    }
+    return sField.osKey;
+}
+
+bool IsErrorEstimate(const LumoRPCField& sField) {
+    return KeyInForm(sField, true) != KeyInForm(sField, false);
+}
+
+// A key that names a model value of either form, which a field must not take.
+bool IsModelKey(const std::string& osKey) {
+    for (int k = 0; k < kScalarCount; ++k) {
+        if (EqualNoCase(osKey, kTxtScalarKeys[k]) || EqualNoCase(osKey, kRpbScalarKeys[k])) {
+            return true;
+        }
+    }
+    for (int nList = 0; nList < kListCount; ++nList) {
+        if (StartsWithNoCase(osKey, kTxtListPrefixes[nList]) ||
+            EqualNoCase(osKey, kRpbListKeys[nList])) {
+            return true;
+        }
+    }
+    return false;
+}
+
+// A field the form can write so that reading it back gives it again.
+void CheckField(const LumoRPCField& sField, bool bTxt) {
+    const char* pszKeyStops = bTxt ? ":\r\n" : "=;()\"\r\n\t ";
+    const char* pszValueStops = bTxt ? "\r\n" : sField.bQuoted ? "\"\r\n" : ";\"\r\n";
+    const bool bOpenList = !bTxt && !sField.bQuoted && !StatementComplete(sField.osValue + " ");
+    if (sField.osKey.empty() || Trim(sField.osKey) != sField.osKey || bOpenList ||
+        sField.osKey.find_first_of(pszKeyStops) != std::string::npos ||
+        sField.osValue.find_first_of(pszValueStops) != std::string::npos ||
+        IsModelKey(sField.osKey)) {
+        RPC_REFUSE("the field " + Shown(sField.osKey) + " = " + Shown(sField.osValue) +
+                   " cannot be written in the " + (bTxt ? "\"KEY: value\"" : "\"name = value;\"") +
+                   " form");
+    }
+}
+
+std::string WriteTxt(const RpcValues& values, const std::vector<LumoRPCField>& aoFields) {
     std::string osText;
+    for (const LumoRPCField& sField : aoFields) {
+        CheckField(sField, true);
+        osText += KeyInForm(sField, true) + ": " + sField.osValue +
+                  (IsErrorEstimate(sField) ? " meters" : "") + "\n";
+    }
     for (int k = 0; k < kScalarCount; ++k) {
         osText += std::string(kTxtScalarKeys[k]) + ": " + ExactNumber(values.adfScalar[k]) + " " +
                   kUnits[k] + "\n";
@@ -531,13 +700,33 @@ std::string WriteTxt(const RpcValues& values) {
     return osText;
 }
 
-std::string WriteRpb(const RpcValues& values) {
+std::string Statement(const LumoRPCField& sField, const char* pszIndent) {
+    CheckField(sField, false);
+    const std::string osValue = sField.bQuoted ? "\"" + sField.osValue + "\"" : sField.osValue;
+    return pszIndent + KeyInForm(sField, false) + " = " + osValue + ";\n";
+}
+
+bool HasField(const std::vector<LumoRPCField>& aoFields, const char* pszKey) {
+    return std::any_of(aoFields.begin(), aoFields.end(),
+                       [pszKey](const LumoRPCField& f) { return EqualNoCase(f.osKey, pszKey); });
+}
+
+// Names (quoted fields) head the text; numbers such as the error estimates
+// go inside the image group.
+std::string WriteRpb(const RpcValues& values, const std::vector<LumoRPCField>& aoFields) {
     std::string osText;
     // A sensor name with a quote or a line end cannot be written in the form.
-    bool bPlainSensor = !values.osSensor.empty();
+    bool bPlainSensor = !values.osSensor.empty() && !HasField(aoFields, "satId");
     for (char ch : values.osSensor) bPlainSensor = bPlainSensor && ch != '"' && ch >= ' ';
     if (bPlainSensor) osText += "satId = \"" + values.osSensor + "\";\n";
-    osText += "SpecId = \"RPC00B\";\nBEGIN_GROUP = IMAGE\n";
+    for (const LumoRPCField& sField : aoFields) {
+        if (sField.bQuoted) osText += Statement(sField, "");
+    }
+    if (!HasField(aoFields, "SpecId")) osText += "SpecId = \"RPC00B\";\n";
+    osText += "BEGIN_GROUP = IMAGE\n";
+    for (const LumoRPCField& sField : aoFields) {
+        if (!sField.bQuoted) osText += Statement(sField, "\t");
+    }
     for (int k = 0; k < kScalarCount; ++k) {
         osText += std::string("\t") + kRpbScalarKeys[k] + " = " + ExactNumber(values.adfScalar[k]) +
                   ";\n";
@@ -558,6 +747,7 @@ std::string WriteRpb(const RpcValues& values) {
 int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength) {
     if (pszText == nullptr) return LUMO_RPC_TEXT_AUTO;
     const std::string osText(pszText, nLength);
+    if (LooksFixed(FixedRecord(osText))) return LUMO_RPC_TEXT_FIXED;
     for (const std::string& osRaw : SplitLines(osText)) {
         const std::string osLine = Trim(osRaw);
         if (osLine.empty()) continue;
@@ -571,35 +761,42 @@ int LumoDetectRPCTextForm(const char* pszText, std::size_t nLength) {
 }
 
 RFInfo_t* LumoRPCTextToRFInfo(const char* pszText, std::size_t nLength, int nForm,
-                              const char* pszSource) {
+                              const char* pszSource, std::vector<LumoRPCField>* paoFields) {
     const std::string osSource = pszSource != nullptr ? pszSource : "RPC text";
     if (pszText == nullptr) RPC_FAIL(osSource + ": no text");
     if (nForm == LUMO_RPC_TEXT_AUTO) nForm = LumoDetectRPCTextForm(pszText, nLength);
     const std::string osText(pszText, nLength);
-    RFInfo_t* psRF = nullptr;
+    RpcValues values;
     switch (nForm) {
         case LUMO_RPC_TEXT_TXT:
-            psRF = ValuesToRecord(ReadTxt(osText, osSource));
+            values = ReadTxt(osText, osSource);
             break;
         case LUMO_RPC_TEXT_RPB:
-            psRF = ValuesToRecord(ReadRpb(osText, osSource));
+            values = ReadRpb(osText, osSource);
+            break;
+        case LUMO_RPC_TEXT_FIXED:
+            values = ReadFixed(osText, osSource);
             break;
         default:
             RPC_FAIL(osSource +
-                     ": not RPC text (neither \"KEY: value\" lines nor \"name = value;\" "
-                     "statements)");
+                     ": not RPC text (neither \"KEY: value\" lines, \"name = value;\" "
+                     "statements nor a fixed-width record)");
     }
-    return CheckedRecord(psRF, osSource);
+    RFInfo_t* psRF = CheckedRecord(ValuesToRecord(values), osSource);
+    if (paoFields != nullptr) *paoFields = std::move(values.aoFields);
+    return psRF;
 }
 
-std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm) {
+std::string LumoRFInfoToRPCText(const RFInfo_t* psRF, int nForm,
+                                const std::vector<LumoRPCField>& aoFields) {
     const RpcValues values = RecordToValues(psRF);
     switch (nForm) {
         case LUMO_RPC_TEXT_TXT:
-            return WriteTxt(values);
+            return WriteTxt(values, aoFields);
         case LUMO_RPC_TEXT_RPB:
-            return WriteRpb(values);
+            return WriteRpb(values, aoFields);
         default:
-            RPC_REFUSE("unknown text form " + std::to_string(nForm));
+            RPC_REFUSE("unknown text form " + std::to_string(nForm) +
+                       " (the fixed-width form is read only)");
     }
 }

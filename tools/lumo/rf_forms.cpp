@@ -64,6 +64,7 @@ RFModelInput ReadJson(const std::string& path, const std::string& contents) {
     model.poOwner = loaded.poRecord;
     model.nPixels = loaded.sEnvelope.nPixels;
     model.nLines = loaded.sEnvelope.nLines;
+    model.aoFields = RPCFieldsFromJson(loaded.sEnvelope, document.at("rf"));
     return model;
 }
 
@@ -99,20 +100,31 @@ RFModelInput ReadRFModelAnyForm(const std::string& path) {
     const std::string contents = ReadWholeFile(path);
     if (contents.compare(0, 8, "RFMODEL ") == 0) return ReadBinary(path, contents);
     if (LooksLikeJson(contents)) return ReadJson(path, contents);
-    RFPtr rf(
-        LumoRPCTextToRFInfo(contents.data(), contents.size(), LUMO_RPC_TEXT_AUTO, path.c_str()));
     RFModelInput model;
+    RFPtr rf(LumoRPCTextToRFInfo(contents.data(), contents.size(), LUMO_RPC_TEXT_AUTO, path.c_str(),
+                                 &model.aoFields));
     model.psRF = rf.get();
     model.poOwner = ShareRFRecord(std::move(rf));
     return model;
 }
 
-std::string RFModelContents(RFInfo_t* psRF, const std::string& form, int nPixels, int nLines) {
-    if (form == "txt") return LumoRFInfoToRPCText(psRF, LUMO_RPC_TEXT_TXT);
-    if (form == "rpb") return LumoRFInfoToRPCText(psRF, LUMO_RPC_TEXT_RPB);
+std::string RFModelContents(RFInfo_t* psRF, const std::string& form, int nPixels, int nLines,
+                            const std::vector<LumoRPCField>& fields) {
+    if (form == "txt") return LumoRFInfoToRPCText(psRF, LUMO_RPC_TEXT_TXT, fields);
+    if (form == "rpb") return LumoRFInfoToRPCText(psRF, LUMO_RPC_TEXT_RPB, fields);
     if (form == "bin") return BinaryBlock(psRF);
-    if (form == "json") return RFToJson(*psRF, nPixels, nLines).dump(2) + "\n";
+    if (form == "json") return RFToJson(*psRF, nPixels, nLines, fields).dump(2) + "\n";
     LUMO_CLI_FAIL("output form " + Quoted(form) + ": must be txt, rpb, bin or json");
+}
+
+void NoteDroppedRPCFields(const std::vector<LumoRPCField>& fields, const std::string& form,
+                          const std::string& outputPath, const std::string& prefix,
+                          std::ostream& err) {
+    if (fields.empty() || form != "bin") return;
+    std::string keys;
+    for (const LumoRPCField& field : fields) keys += (keys.empty() ? "" : ", ") + field.osKey;
+    err << prefix << ": note: the binary block has no room for " << keys << "; " << outputPath
+        << " does not keep them (a .json, .txt or .rpb output does)\n";
 }
 
 }  // namespace lumo::cli

@@ -3,7 +3,9 @@
 #pragma once
 
 #include <memory>
+#include <ostream>
 #include <string>
+#include <vector>
 
 #include "rf_io.h"
 
@@ -15,6 +17,7 @@ struct RFModelInput {
     RFInfo_t* psRF = nullptr;
     int nPixels = 0;
     int nLines = 0;
+    std::vector<LumoRPCField> aoFields;  // fields of the RPC text beside the model
 };
 
 // Reads a model, recognising the form from the contents.
@@ -26,7 +29,15 @@ std::string RFOutputForm(const std::string& to, const std::string& outputPath);
 
 // The file contents of a model in the given form. Fails naming the form when
 // the model cannot be written in it (an RPC text form and an adjustment
-// that has no RPC equivalent, for instance).
-std::string RFModelContents(RFInfo_t* psRF, const std::string& form, int nPixels, int nLines);
+// that has no RPC equivalent, for instance). The RPC text `fields` go into
+// every form that has room for them (not the binary block).
+std::string RFModelContents(RFInfo_t* psRF, const std::string& form, int nPixels, int nLines,
+                            const std::vector<LumoRPCField>& fields = {});
+
+// Says on `err`, behind `prefix`, which RPC text fields an output of `form`
+// named `outputPath` drops (the binary block has no room for them).
+void NoteDroppedRPCFields(const std::vector<LumoRPCField>& fields, const std::string& form,
+                          const std::string& outputPath, const std::string& prefix,
+                          std::ostream& err);
 
 }  // namespace lumo::cli

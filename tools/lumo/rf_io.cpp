@@ -67,7 +67,25 @@ RFPtr RFFromJson(const ModelEnvelope& envelope, const json& section) {
     return rf;
 }
 
-json RFToJson(const RFInfo_t& rf, int nPixels, int nLines) {
+std::vector<LumoRPCField> RPCFieldsFromJson(const ModelEnvelope& envelope, const json& section) {
+    const FieldContext ctx{envelope.osSource, kFamily};
+    std::vector<LumoRPCField> fields;
+    const json* list = FindField(section, "rpcFields");
+    if (list == nullptr) return fields;
+    if (!list->is_array()) ctx.Fail("rpcFields", "must be an array of {key, value, quoted}");
+    for (std::size_t i = 0; i < list->size(); ++i) {
+        const FieldContext item{envelope.osSource,
+                                ctx.Field("rpcFields[" + std::to_string(i) + "]")};
+        const json& field = (*list)[i];
+        if (!field.is_object()) item.Fail("", "must be an object {key, value, quoted}");
+        fields.push_back({GetText(field, "key", item), GetText(field, "value", item),
+                          GetBool(field, "quoted", item)});
+    }
+    return fields;
+}
+
+json RFToJson(const RFInfo_t& rf, int nPixels, int nLines,
+              const std::vector<LumoRPCField>& fields) {
     if (rf.nTerms < 0 || rf.nTerms > RF_MAX_TERMS) {
         LUMO_CLI_FAIL("cannot write model: nTerms " + std::to_string(rf.nTerms) +
                       " lies outside 0..20");
@@ -100,6 +118,14 @@ json RFToJson(const RFInfo_t& rf, int nPixels, int nLines) {
     section["pixelDen"] = FiniteNumberArray(rf.padfPixelDen, rf.nTerms, ItemOf("item", "pixelDen"));
     section["lineNum"] = FiniteNumberArray(rf.padfLineNum, rf.nTerms, ItemOf("item", "lineNum"));
     section["lineDen"] = FiniteNumberArray(rf.padfLineDen, rf.nTerms, ItemOf("item", "lineDen"));
+    if (!fields.empty()) {
+        json list = json::array();
+        for (const LumoRPCField& field : fields) {
+            list.push_back(
+                {{"key", field.osKey}, {"value", field.osValue}, {"quoted", field.bQuoted}});
+        }
+        section["rpcFields"] = std::move(list);
+    }
     document[kFamily] = std::move(section);
     return document;
 }

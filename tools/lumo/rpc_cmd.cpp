@@ -27,7 +27,9 @@ void RunRpc(const RpcOptions& options, CommandContext& context) {
     const RFModelInput model = ReadRFModelAnyForm(options.osInput);
     const int nPixels = options.nPixels >= 0 ? options.nPixels : model.nPixels;
     const int nLines = options.nLines >= 0 ? options.nLines : model.nLines;
-    WriteFileReplacing(options.osOutput, RFModelContents(model.psRF, form, nPixels, nLines));
+    WriteFileReplacing(options.osOutput,
+                       RFModelContents(model.psRF, form, nPixels, nLines, model.aoFields));
+    NoteDroppedRPCFields(model.aoFields, form, options.osOutput, "lumo rpc", context.err);
     context.out << options.osInput << " -> " << options.osOutput << " (" << form << ")\n";
 }
 
