@@ -42,8 +42,7 @@ ImagePoint ToImage(const LoadedModel& model, const GroundPoint& g) {
 
 GroundPoint ToGround(const LoadedModel& model, const ImagePoint& i, double z) {
     GroundPoint g{0.0, 0.0, z};
-    if (!GenImg2Geo(model.nModelCode, model.poRecord.get(), i.pixel, i.line, z, &g.x, &g.y) ||
-        !IsPosition(g.x, g.y)) {
+    if (!model.ImageToGround(i.pixel, i.line, z, &g.x, &g.y) || !IsPosition(g.x, g.y)) {
         LUMO_CLI_FAIL(model.sEnvelope.osSource + ": the model cannot map image point (" +
                       FormatDouble(i.pixel) + ", " + FormatDouble(i.line) + ") to the ground");
     }

@@ -62,6 +62,16 @@ POLYInfo_t* LoadedModel::AsPoly() const {
     return nModelCode == LUMO_CODE_POLY ? static_cast<POLYInfo_t*>(poRecord.get()) : nullptr;
 }
 
+int LoadedModel::GroundToImage(double x, double y, double z, double* pixel, double* line) const {
+    if (poPolyFit) return GCPTransform(&poPolyFit->sGeoToImage, x, y, pixel, line) == 0 ? 1 : 0;
+    return GenGeo2Img(nModelCode, poRecord.get(), x, y, z, pixel, line);
+}
+
+int LoadedModel::ImageToGround(double pixel, double line, double z, double* x, double* y) const {
+    if (poPolyFit) return GCPTransform(&poPolyFit->sImageToGeo, pixel, line, x, y) == 0 ? 1 : 0;
+    return GenImg2Geo(nModelCode, poRecord.get(), pixel, line, z, x, y);
+}
+
 const std::vector<ModelFamilyCodec>& ModelFamilies() {
     static const std::vector<ModelFamilyCodec> families = {
         {"poly", LUMO_CODE_POLY, "polynomial model", &ReadPolyRecord},
@@ -94,6 +104,9 @@ LoadedModel ReadModel(const json& document, const std::string& source) {
         const json& section = RequireObjectField(document, codec.pszFamily, ctx);
         model.nModelCode = codec.nModelCode;
         model.poRecord = codec.pfnRead(model.sEnvelope, section);
+        if (codec.nModelCode == LUMO_CODE_POLY) {
+            model.poPolyFit = PolyFitFromJson(model.sEnvelope, section);
+        }
         return model;
     }
     std::string known;
@@ -166,7 +179,7 @@ json MakeEnvelope(const char* pszFamily, const char* pszGeosys, const ProjInfo_t
     return document;
 }
 
-json PolyToJson(const POLYInfo_t& poly) {
+json PolyToJson(const POLYInfo_t& poly, const PolyFit* psFit) {
     if (poly.nCoeffs < 1 || poly.nCoeffs > POLY_MAX_COEFFS) {
         LUMO_CLI_FAIL("cannot write model: nCoeffs " + std::to_string(poly.nCoeffs) +
                       " lies outside 1.." + std::to_string(POLY_MAX_COEFFS));
@@ -184,6 +197,7 @@ json PolyToJson(const POLYInfo_t& poly) {
         FiniteNumberArray(poly.padfXCoeffs, poly.nCoeffs, ItemOf("coefficient", "xCoeffs"));
     section["yCoeffs"] =
         FiniteNumberArray(poly.padfYCoeffs, poly.nCoeffs, ItemOf("coefficient", "yCoeffs"));
+    if (psFit != nullptr) section["fit"] = PolyFitToJson(*psFit);
     document["poly"] = std::move(section);
     return document;
 }

@@ -11,6 +11,7 @@
 #include <nlohmann/json.hpp>
 
 #include "lumo.h"
+#include "poly_fit.h"
 
 namespace lumo::cli {
 
@@ -39,8 +40,16 @@ struct LoadedModel {
     int nModelCode = LUMO_CODE_NONE;
     std::shared_ptr<void> poRecord;
 
+    // A polynomial model's fit as the regression made it, when the file keeps
+    // it; evaluated instead of the record's raw coefficients.
+    std::shared_ptr<const PolyFit> poPolyFit;
+
     // The record as a polynomial model; null for other families.
     POLYInfo_t* AsPoly() const;
+    // The model both ways (the generic dispatch, or the kept fit); 1 on
+    // success, 0 when the model cannot map the point.
+    int GroundToImage(double x, double y, double z, double* pixel, double* line) const;
+    int ImageToGround(double pixel, double line, double z, double* x, double* y) const;
 };
 
 // Reader of one family's section.
@@ -63,9 +72,10 @@ LoadedModel ReadModelFile(const std::string& path);
 LoadedModel ReadModelFileOf(const std::string& path, const char* pszFamily);
 nlohmann::json ParseJsonFile(const std::string& path);
 
-// The polynomial family.
+// The polynomial family; the writer keeps the fit beside the record when
+// given.
 PolyPtr PolyFromJson(const ModelEnvelope& envelope, const nlohmann::json& section);
-nlohmann::json PolyToJson(const POLYInfo_t& poly);
+nlohmann::json PolyToJson(const POLYInfo_t& poly, const PolyFit* psFit = nullptr);
 PolyPtr ReadPolyModelFile(const std::string& path);
 // Hands a polynomial record to the type-erased owner of LoadedModel.
 std::shared_ptr<void> SharePolyRecord(PolyPtr poly);

@@ -26,8 +26,7 @@ void MapToImage(const LoadedModel& model, RigorousForm form, double x, double y,
 void MapToGround(const LoadedModel& model, PointRecord& p) {
     double x = 0.0;
     double y = 0.0;
-    if (!GenImg2Geo(model.nModelCode, model.poRecord.get(), p.dfPixel, p.dfLine, p.dfZ, &x, &y) ||
-        !IsPosition(x, y)) {
+    if (!model.ImageToGround(p.dfPixel, p.dfLine, p.dfZ, &x, &y) || !IsPosition(x, y)) {
         p.Fail(kFailedToGround, "the model gives no ground position for this image point");
         return;
     }
@@ -107,7 +106,7 @@ bool GroundToImage(const LoadedModel& model, double x, double y, double z, doubl
         return SritToImage(*static_cast<const SRITInfo_t*>(model.poRecord.get()), x, y, z, pixel,
                            line, form);
     }
-    return GenGeo2Img(model.nModelCode, model.poRecord.get(), x, y, z, pixel, line) != 0;
+    return model.GroundToImage(x, y, z, pixel, line) != 0;
 }
 
 void TransformPoint(const LoadedModel& model, Direction direction, PointRecord& p,
