@@ -1,4 +1,8 @@
-// All exported declarations of the lumo library.
+// All exported declarations of the lumo library, and the host's runtime
+// services a caller needs with them: the exception types that fatal errors
+// throw (nova::NumberedError, nova::DataException, ...) and the warning
+// counter and sink (nova::GetWarningCount, nova::SetErrorSink). Headers are
+// found in one include folder; host headers as "nova/<name>.h".
 #pragma once
 
 #include "lumo_ap.h"
@@ -15,3 +19,4 @@
 #include "lumo_tps.h"
 #include "lumo_trn.h"
 #include "lumo_types.h"
+#include "nova/runtime.h"

@@ -19,8 +19,10 @@ LUMO_API int GenImg2GeoDem(int nModelCode, void* pModel, double dfPixel, double 
 namespace nova {
 namespace mathmodel {
 
-// Family enumeration of the math model object.
-enum LumoModelType {
+// Family enumeration of the math model object. The underlying type is fixed
+// so that LUMO_MODEL_NONE (-1, a code without a family) is a value of it.
+enum LumoModelType : int {
+    LUMO_MODEL_NONE = -1,
     LUMO_MODEL_AP = 0,
     LUMO_MODEL_SRIT = 1,
     LUMO_MODEL_POLY = 2,
@@ -33,7 +35,7 @@ enum LumoModelType {
     LUMO_MODEL_CODE12 = 9,
 };
 
-// The enumeration value of a model code; -1 for codes without one.
+// The enumeration value of a model code; LUMO_MODEL_NONE for codes without one.
 LUMO_API LumoModelType ModelCodeToLumoType(int nModelCode);
 
 }  // namespace mathmodel

@@ -3,7 +3,7 @@
 #pragma once
 
 #include "lumo_types.h"
-#include "projection.h"
+#include "nova/projection.h"
 
 // Kinds of model a container holds.
 enum TRNType {

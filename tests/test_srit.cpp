@@ -143,7 +143,9 @@ TEST(SRITCalculate, FailuresLeaveTheRecordAndSegmentToTheCaller) {
     ASSERT_EQ(Geosys2ProjInfo(&sGeo, "LONG/LAT D000", 0, 0, 1, 1), 0);
     testing::internal::CaptureStdout();
     EXPECT_EQ(FatalOf([&] { fnFit(sGeo); }).first, 32);
-    EXPECT_NE(testing::internal::GetCapturedStdout().find("Invalid GCP unit!"), std::string::npos);
+    const std::string osPrinted = testing::internal::GetCapturedStdout();
+    EXPECT_NE(osPrinted.find("Invalid GCP unit!"), std::string::npos);
+    EXPECT_EQ(osPrinted.find("KROV"), std::string::npos) << "lists a unit nothing accepts";
     // An unknown sensor, and a group prefix none of whose rows matches: 19.
     for (const char* pszName : {"UNKNOWN", "SPOT5", "CBERS_X", "KOMPSAT3_PAN"}) {
         std::memset(psSeg->szSensorName, 0, sizeof(psSeg->szSensorName));

@@ -193,7 +193,7 @@ LumoModelType ModelCodeToLumoType(int nModelCode) {
         case 12:
             return LUMO_MODEL_CODE12;
         default:
-            return static_cast<LumoModelType>(-1);
+            return LUMO_MODEL_NONE;
     }
 }
 

@@ -9,6 +9,7 @@
 #include "projection.h"
 #include "runtime.h"
 #include "segment_access.h"
+#include "srit/srit_internal.h"
 
 namespace {
 

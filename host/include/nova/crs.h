@@ -20,7 +20,7 @@
 #include <memory>
 #include <string>
 
-#include "projection.h"
+#include "nova/projection.h"
 
 namespace nova {
 namespace ogc {

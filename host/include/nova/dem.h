@@ -20,7 +20,7 @@
 #include <string>
 #include <vector>
 
-#include "crs.h"
+#include "nova/crs.h"
 
 namespace nova {
 namespace dem {

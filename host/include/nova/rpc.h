@@ -17,7 +17,7 @@
 #include <string>
 #include <vector>
 
-#include "mathmodel_core.h"
+#include "nova/mathmodel_core.h"
 
 namespace nova {
 namespace ogc {

@@ -100,8 +100,8 @@ void RequireConformal(const ProjInfo_t& sProj, char* pszDecoded) {
     if (IsConformal(pszDecoded)) return;
     lumo::PrintUserMessage(stdout,
                            "Invalid GCP unit! Unit must be one of the following :\n"
-                           "UTM, KROV, LCC, MER, MSC, OM, PS, RSO, FOOT,\n"
-                           "SG, SOM, SPCS, SPIF, SPAF, TM, UPS, METRE \n");
+                           "UTM, TM, LCC, PS, MER, METRE,\n"
+                           "or the EPSG code of a conformal projection (EPSG:32631) \n");
     lumo::FatalChar(lumo::Err::kUnit, "GCP Unit", pszDecoded);
 }
 

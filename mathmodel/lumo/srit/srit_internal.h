@@ -247,3 +247,21 @@ int CalculateOne(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psEpheme
 
 }  // namespace srit
 }  // namespace lumo
+
+// The multi-image computation behind SRITCalculateN; internal to the
+// library (not exported, and not in the installed headers).
+int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsModels,
+                       bool bImageFirst, EphemerisSeg_t** papsEphemeris,
+                       const ProjInfo_t* psProjInfo, int nGCP, const char* pszGcpImageIds,
+                       const char* pszGcpPointIds, const char* pszGcpUsage, const double* padfA,
+                       const double* padfB, const double* padfZ, const double* padfSdA,
+                       const double* padfSdB, const double* padfSdZ, const double* padfC,
+                       const double* padfD, const double* padfSdC, const double* padfSdD, int nTie,
+                       const char* pszTieImageIds, const char* pszTiePointIds,
+                       const double* padfTiePixel, const double* padfTieLine, double* padfTieZ,
+                       const double* padfTieSdPixel, const double* padfTieSdLine,
+                       const double* padfTieSdZ, double* padfTieX, double* padfTieY,
+                       int* pnReported, char* pszReportedIds, int* panReportedImages,
+                       double* padfGivenX, double* padfGivenY, double* padfGivenZ,
+                       double* padfEstimatedX, double* padfEstimatedY, double* padfEstimatedZ,
+                       double* padfResidualX, double* padfResidualY, double* padfResidualZ);
