@@ -22,6 +22,7 @@
 #include "nova/runtime.h"
 #include "points_io.h"
 #include "support/cli_runner.h"
+#include "tool_warnings.h"
 #include "tps_io.h"
 
 namespace fs = std::filesystem;
@@ -356,6 +357,29 @@ TEST_F(FitTest, FitAndResidualsFailuresAreReportedAndKeepFiles) {
     fails({"residuals", kExamples + "/tps_utm31.json"}, "--gcps");
     const std::string bad = Write("bad.csv", "pixel,line,x\n1,2,3\n");
     fails({"residuals", kExamples + "/tps_utm31.json", "--gcps", bad}, "missing column \"y\"");
+}
+
+TEST_F(FitTest, WarningsSpeakTheCommandsWords) {
+    // Collinear points: the spline says so in its own terms, not in those of
+    // the regression behind its affine part.
+    const RunResult r =
+        RunTool({"fit", "--model", "tps", "--geosys", kGeosys, "-o", Path("l.json"), "--gcps",
+                 Write("line.csv",
+                       "pixel,line,x,y\n0,0,1000,2000\n10,10,1100,1900\n20,20,1200,1800\n"
+                       "30,30,1300,1700\n40,40,1400,1600\n")});
+    EXPECT_NE(r.osErr.find("the control points lie on one line"), std::string::npos) << r.osErr;
+    EXPECT_EQ(r.osErr.find("Polynomial order"), std::string::npos) << r.osErr;
+    EXPECT_EQ(r.osErr.find("E100"), std::string::npos) << r.osErr;
+    // Any other warning of a run is shown as its detail, without the
+    // catalogue heading of a failure.
+    std::ostringstream shown;
+    {
+        const lumo::cli::ToolWarnings warnings(shown);
+        IMPError(100, 0, "the segment is short");
+        IMPErrMsg(11, 0);
+    }
+    EXPECT_EQ(shown.str(), std::string("lumo: warning: the segment is short\nlumo: warning: ") +
+                               nova::ErrorCatalogueText(11) + "\n");
 }
 
 }  // namespace

@@ -8,6 +8,7 @@
 
 #include "lumo_ephemeris.h"
 #include "lumo_sim.h"
+#include "support/cli_runner.h"
 
 namespace {
 
@@ -111,21 +112,28 @@ TEST(SimScene, BadParametersAreRejectedByName) {
     };
     SceneParams s;
     s.dfOrbitRadius = 6000000.0;
-    Expect(s, "dfOrbitRadius");
+    Expect(s, "orbit radius");
     s = SceneParams();
     s.dfNadirLatitudeDeg = 84.0;
-    Expect(s, "dfNadirLatitudeDeg");
+    Expect(s, "nadir latitude");
     s = SceneParams();
     s.dfIFOV = std::nan("");
-    Expect(s, "dfIFOV");
+    Expect(s, "IFOV");
     s = SceneParams();
     s.nPixels = 1;
-    Expect(s, "nPixels");
+    Expect(s, "pixel count");
     s = SceneParams();
     s.osSensorName = "A_SENSOR_NAME_TOO_LONG";
-    Expect(s, "osSensorName");
+    Expect(s, "sensor name length");
     const Scene sScene{SceneParams()};
     EXPECT_THROW(sScene.SamplePoints(5, 1, 100.0, 0.0), std::invalid_argument);
+    // The tool names the height the user got wrong, not the other one.
+    const std::string dir = ::testing::TempDir();
+    const auto r = lumo::support::RunTool({"simulate", "--segment", dir + "/s.json", "--gcps",
+                                           dir + "/g.csv", "--min-height", "-1e7"});
+    EXPECT_EQ(r.nCode, 1);
+    EXPECT_NE(r.osErr.find("minimum height -10000000: must lie within"), std::string::npos)
+        << r.osErr;
     std::vector<lumo::sim::SimPoint> asPoints(2);
     EXPECT_THROW(lumo::sim::AddImageNoise(&asPoints, -1.0, 1), std::invalid_argument);
 }

@@ -8,6 +8,7 @@
 #include "commands.h"
 #include "lumo.h"
 #include "nova/runtime.h"
+#include "tool_warnings.h"
 
 namespace lumo::cli {
 namespace {
@@ -38,6 +39,7 @@ std::string VersionText() {
 
 int RunLumo(int argc, char** argv, std::ostream& out, std::ostream& err) {
     CommandContext context{out, err};
+    const ToolWarnings warnings(err);
     CLI::App app("Geometric math models for remote-sensing imagery", "lumo");
     app.require_subcommand(0, 1);
     bool showVersion = false;

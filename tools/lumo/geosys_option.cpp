@@ -4,16 +4,19 @@
 #include <cstring>
 
 #include "cli_error.h"
+#include "tool_warnings.h"
 
 namespace lumo::cli {
 
 ProjInfo_t UserGeosys(const std::string& text, const std::string& where) {
     ProjInfo_t proj{};
     InitProjInfo(&proj, 0);
-    // The projection services' own warning would only repeat the reason.
-    const nova::ErrorSink previous = nova::SetErrorSink([](const nova::ErrorReport&) {});
-    const int result = Geosys2ProjInfo(&proj, text.c_str(), 0.0, 0.0, 1.0, 1.0);
-    nova::SetErrorSink(previous);
+    int result = 0;
+    {
+        // The projection services' own warning would only repeat the reason.
+        const WarningCapture quiet;
+        result = Geosys2ProjInfo(&proj, text.c_str(), 0.0, 0.0, 1.0, 1.0);
+    }
     if (result < 0) {
         LUMO_CLI_FAIL(where + ": " + Quoted(text) + " cannot be used: " +
                       ExplainGeosys(text.c_str()) + " (see docs/georeferencing.md)");

@@ -9,8 +9,8 @@
 #include <CLI/CLI.hpp>
 
 #include "cli_error.h"
-#include "geosys_option.h"
 #include "commands.h"
+#include "geosys_option.h"
 #include "nova/projection.h"
 
 namespace lumo::cli {

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdio>
 #include <cstring>
 #include <random>
 #include <stdexcept>
@@ -46,37 +47,38 @@ void EcefToGeodetic(const Ecef& sPoint, double* pdfLat, double* pdfLon, double* 
 Scene::Scene(const SceneParams& sParams) : m_sParams(sParams) {
     const SceneParams& p = m_sParams;
     Require(std::isfinite(p.dfOrbitRadius) && p.dfOrbitRadius > kSemiMajor + 100000.0,
-            "dfOrbitRadius", p.dfOrbitRadius, "must lie above the atmosphere");
+            "orbit radius", p.dfOrbitRadius, "must lie above the atmosphere");
     Require(std::isfinite(p.dfInclinationDeg) && p.dfInclinationDeg > 0.0 &&
                 p.dfInclinationDeg < 180.0 && std::abs(p.dfInclinationDeg - 90.0) > 1e-6,
-            "dfInclinationDeg", p.dfInclinationDeg, "must lie in (0, 180), not 90");
+            "inclination", p.dfInclinationDeg, "must lie in (0, 180) degrees, not 90");
     const double dfSinI = std::sin(p.dfInclinationDeg * kDeg);
     Require(std::isfinite(p.dfNadirLatitudeDeg) && std::abs(p.dfNadirLatitudeDeg) < 85.0,
-            "dfNadirLatitudeDeg", p.dfNadirLatitudeDeg, "must lie within +-85 degrees");
+            "nadir latitude", p.dfNadirLatitudeDeg, "must lie within +-85 degrees");
     const double dfGeocLat = std::atan((1.0 - kEcc2) * std::tan(p.dfNadirLatitudeDeg * kDeg));
-    Require(std::abs(std::sin(dfGeocLat)) < dfSinI * (1.0 - 1e-6), "dfNadirLatitudeDeg",
+    Require(std::abs(std::sin(dfGeocLat)) < dfSinI * (1.0 - 1e-6), "nadir latitude",
             p.dfNadirLatitudeDeg, "is not reached by an orbit of this inclination");
     Require(std::isfinite(p.dfNadirLongitudeDeg) && std::abs(p.dfNadirLongitudeDeg) <= 180.0,
-            "dfNadirLongitudeDeg", p.dfNadirLongitudeDeg, "must lie within +-180 degrees");
-    Require(std::isfinite(p.dfRollDeg) && std::abs(p.dfRollDeg) <= 45.0, "dfRollDeg", p.dfRollDeg,
+            "nadir longitude", p.dfNadirLongitudeDeg, "must lie within +-180 degrees");
+    Require(std::isfinite(p.dfRollDeg) && std::abs(p.dfRollDeg) <= 45.0, "roll", p.dfRollDeg,
             "must lie within +-45 degrees");
-    Require(std::isfinite(p.dfPitchDeg) && std::abs(p.dfPitchDeg) <= 45.0, "dfPitchDeg",
-            p.dfPitchDeg, "must lie within +-45 degrees");
-    Require(std::isfinite(p.dfIFOV) && p.dfIFOV > 0.0 && p.dfIFOV < 1e-2, "dfIFOV", p.dfIFOV,
+    Require(std::isfinite(p.dfPitchDeg) && std::abs(p.dfPitchDeg) <= 45.0, "pitch", p.dfPitchDeg,
+            "must lie within +-45 degrees");
+    Require(std::isfinite(p.dfIFOV) && p.dfIFOV > 0.0 && p.dfIFOV < 1e-2, "IFOV", p.dfIFOV,
             "must lie in (0, 0.01) radians");
     Require(std::isfinite(p.dfLineInterval) && p.dfLineInterval >= 0.0 && p.dfLineInterval < 1.0,
-            "dfLineInterval", p.dfLineInterval, "must lie in [0, 1) seconds");
-    Require(p.nPixels >= 2 && p.nPixels <= 1000000, "nPixels", p.nPixels,
+            "line interval", p.dfLineInterval, "must lie in [0, 1) seconds");
+    Require(p.nPixels >= 2 && p.nPixels <= 1000000, "pixel count", p.nPixels,
             "must lie in [2, 1000000]");
-    Require(p.nLines >= 2 && p.nLines <= 10000000, "nLines", p.nLines, "must lie in [2, 10000000]");
+    Require(p.nLines >= 2 && p.nLines <= 10000000, "line count", p.nLines,
+            "must lie in [2, 10000000]");
     Require(std::atan(0.5 * p.nPixels * p.dfIFOV) + std::abs(p.dfRollDeg) * kDeg < 50.0 * kDeg,
-            "nPixels", p.nPixels, "with this IFOV and roll the swath looks beyond 50 degrees");
-    Require(p.nUtmZone >= 0 && p.nUtmZone <= 60, "nUtmZone", p.nUtmZone,
+            "pixel count", p.nPixels, "with this IFOV and roll the swath looks beyond 50 degrees");
+    Require(p.nUtmZone >= 0 && p.nUtmZone <= 60, "UTM zone", p.nUtmZone,
             "must be 0 (automatic) or 1 to 60");
     Require(!p.osSensorName.empty() && p.osSensorName.size() < EPH_SENSOR_NAME_SIZE,
-            "osSensorName length", static_cast<double>(p.osSensorName.size()),
+            "sensor name length", static_cast<double>(p.osSensorName.size()),
             "must be 1 to 16 characters");
-    Require(p.osAcquisitionDate.size() < EPH_DATE_SIZE, "osAcquisitionDate length",
+    Require(p.osAcquisitionDate.size() < EPH_DATE_SIZE, "acquisition date length",
             static_cast<double>(p.osAcquisitionDate.size()), "must be at most 27 characters");
 
     m_dfMeanMotion = std::sqrt(kGM / (p.dfOrbitRadius * p.dfOrbitRadius * p.dfOrbitRadius));
@@ -248,7 +250,7 @@ std::vector<SimPoint> Scene::SamplePoints(int nPoints, std::uint32_t nSeed, doub
 }
 
 void AddImageNoise(std::vector<SimPoint>* pasPoints, double dfSigma, std::uint32_t nSeed) {
-    Require(std::isfinite(dfSigma) && dfSigma >= 0.0, "dfSigma", dfSigma,
+    Require(std::isfinite(dfSigma) && dfSigma >= 0.0, "noise", dfSigma,
             "must be finite and not negative");
     std::mt19937 sGen(nSeed);
     for (SimPoint& s : *pasPoints) {
@@ -259,9 +261,9 @@ void AddImageNoise(std::vector<SimPoint>* pasPoints, double dfSigma, std::uint32
 
 SceneParams AimAt(const SceneParams& sBase, double dfLatDeg, double dfLonDeg, double dfRollDeg,
                   double dfPitchDeg) {
-    Require(std::isfinite(dfLatDeg) && std::abs(dfLatDeg) < 85.0, "dfLatDeg", dfLatDeg,
+    Require(std::isfinite(dfLatDeg) && std::abs(dfLatDeg) < 85.0, "latitude", dfLatDeg,
             "must lie within +-85 degrees");
-    Require(std::isfinite(dfLonDeg) && std::abs(dfLonDeg) <= 180.0, "dfLonDeg", dfLonDeg,
+    Require(std::isfinite(dfLonDeg) && std::abs(dfLonDeg) <= 180.0, "longitude", dfLonDeg,
             "must lie within +-180 degrees");
     SceneParams sParams = sBase;
     sParams.dfRollDeg = dfRollDeg;

@@ -59,22 +59,24 @@ bool SecantRoot(F f, double dfStart, double dfStep, double dfTolerance, double* 
 
 RadarScene::RadarScene(const RadarSceneParams& sParams) : m_sParams(sParams) {
     const RadarSceneParams& p = m_sParams;
-    Require(p.dfAltitude > 200000.0 && p.dfAltitude < 2000000.0, "dfAltitude", p.dfAltitude,
+    Require(p.dfAltitude > 200000.0 && p.dfAltitude < 2000000.0, "altitude", p.dfAltitude,
             "must lie in (200 km, 2000 km)");
-    Require(p.dfEccentricity >= 0.0 && p.dfEccentricity < 0.01, "dfEccentricity", p.dfEccentricity,
+    Require(p.dfEccentricity >= 0.0 && p.dfEccentricity < 0.01, "eccentricity", p.dfEccentricity,
             "must lie in [0, 0.01)");
-    Require(p.dfInclinationDeg > 0.0 && p.dfInclinationDeg < 180.0, "dfInclinationDeg",
-            p.dfInclinationDeg, "must lie in (0, 180)");
-    Require(std::fabs(p.dfCentreLatDeg) < 89.0, "dfCentreLatDeg", p.dfCentreLatDeg,
-            "must lie within +-89");
-    Require(std::isfinite(p.dfCentreLonDeg), "dfCentreLonDeg", p.dfCentreLonDeg, "must be finite");
-    Require(p.dfNearIncidenceDeg >= 10.0 && p.dfNearIncidenceDeg <= 60.0, "dfNearIncidenceDeg",
+    Require(p.dfInclinationDeg > 0.0 && p.dfInclinationDeg < 180.0, "inclination",
+            p.dfInclinationDeg, "must lie in (0, 180) degrees");
+    Require(std::fabs(p.dfCentreLatDeg) < 89.0, "centre latitude", p.dfCentreLatDeg,
+            "must lie within +-89 degrees");
+    Require(std::isfinite(p.dfCentreLonDeg), "centre longitude", p.dfCentreLonDeg,
+            "must be finite");
+    Require(p.dfNearIncidenceDeg >= 10.0 && p.dfNearIncidenceDeg <= 60.0, "near incidence",
             p.dfNearIncidenceDeg, "must lie in [10, 60]");
-    Require(p.dfPixelSpacing > 0.1 && p.dfLineSpacing > 0.1, "dfPixelSpacing", p.dfPixelSpacing,
+    Require(p.dfPixelSpacing > 0.1 && p.dfLineSpacing > 0.1, "pixel spacing", p.dfPixelSpacing,
             "spacings must exceed 0.1 m");
-    Require(p.nPixels >= 3 && p.nPixels <= 100000, "nPixels", p.nPixels, "must lie in [3, 1e5]");
-    Require(p.nLines >= 2 && p.nLines <= 1000000, "nLines", p.nLines, "must lie in [2, 1e6]");
-    Require(std::fabs(p.dfReferenceHeight) < 9000.0, "dfReferenceHeight", p.dfReferenceHeight,
+    Require(p.nPixels >= 3 && p.nPixels <= 100000, "pixel count", p.nPixels,
+            "must lie in [3, 1e5]");
+    Require(p.nLines >= 2 && p.nLines <= 1000000, "line count", p.nLines, "must lie in [2, 1e6]");
+    Require(std::fabs(p.dfReferenceHeight) < 9000.0, "reference height", p.dfReferenceHeight,
             "must lie within +-9000");
     m_dfSemiMajor = kSemiMajor + p.dfAltitude;
     m_dfMeanMotion = std::sqrt(kGM / (m_dfSemiMajor * m_dfSemiMajor * m_dfSemiMajor));

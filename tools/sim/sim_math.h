@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <cstdio>
 #include <random>
 #include <stdexcept>
 #include <string>
@@ -53,10 +54,12 @@ inline Ecef ToEarthFixed(const Ecef& a, double dfTime) {
     return {std::cos(th) * a.x + std::sin(th) * a.y, -std::sin(th) * a.x + std::cos(th) * a.y, a.z};
 }
 
+// Refuses a parameter, named in the words of the simulator's user.
 inline void Require(bool bOk, const char* pszName, double dfValue, const char* pszRule) {
     if (bOk) return;
-    throw std::invalid_argument(std::string("scene parameter ") + pszName + " = " +
-                                std::to_string(dfValue) + ": " + pszRule);
+    char szValue[32];
+    std::snprintf(szValue, sizeof(szValue), "%.10g", dfValue);
+    throw std::invalid_argument(std::string(pszName) + " " + szValue + ": " + pszRule);
 }
 
 // Uniform in [0, 1) from a 32-bit generator, the same on every platform.
@@ -77,11 +80,14 @@ inline double Gaussian(std::mt19937& sGen) {
 inline std::vector<SimPoint> JitteredImagePoints(int nPoints, std::uint32_t nSeed, int nPixels,
                                                  int nLines, double dfMinHeight, double dfMaxHeight,
                                                  double dfMargin) {
-    Require(nPoints >= 0 && nPoints <= 10000000, "nPoints", nPoints, "must lie in [0, 1e7]");
-    Require(std::isfinite(dfMinHeight) && std::isfinite(dfMaxHeight) &&
-                dfMinHeight <= dfMaxHeight && dfMinHeight > -1000.0 && dfMaxHeight < 10000.0,
-            "dfMaxHeight", dfMaxHeight, "heights must be ordered and within [-1000, 10000]");
-    Require(dfMargin >= 0.0 && dfMargin < 0.5, "dfMargin", dfMargin, "must lie in [0, 0.5)");
+    Require(nPoints >= 0 && nPoints <= 10000000, "point count", nPoints, "must lie in [0, 1e7]");
+    Require(std::isfinite(dfMinHeight) && dfMinHeight > -1000.0 && dfMinHeight < 10000.0,
+            "minimum height", dfMinHeight, "must lie within (-1000, 10000) metres");
+    Require(std::isfinite(dfMaxHeight) && dfMaxHeight > -1000.0 && dfMaxHeight < 10000.0,
+            "maximum height", dfMaxHeight, "must lie within (-1000, 10000) metres");
+    Require(dfMinHeight <= dfMaxHeight, "minimum height", dfMinHeight,
+            "must not exceed the maximum height");
+    Require(dfMargin >= 0.0 && dfMargin < 0.5, "margin", dfMargin, "must lie in [0, 0.5)");
     std::mt19937 sGen(nSeed);
     const int nCols = std::max(1, static_cast<int>(std::ceil(std::sqrt(nPoints))));
     const int nRows = std::max(1, (nPoints + nCols - 1) / nCols);

@@ -52,8 +52,8 @@ void RequireCoordinate(double dfValue, bool bNullAllowed, const char* pszWhat, i
                        const char* pszName) {
     if (std::isfinite(dfValue) && (bNullAllowed || dfValue != kNull)) return;
     lumo::Fatal(lumo::Err::kComputation,
-                MkName(_("SRITCalculateN: %s observation %d has an invalid %s (%.17g).\n"), pszWhat,
-                       nObservation, pszName, dfValue));
+                MkName(_("Block adjustment: %s observation %d has an invalid %s (%.17g).\n"),
+                       pszWhat, nObservation, pszName, dfValue));
 }
 
 // The caller's arrays of one block adjustment.
@@ -79,10 +79,11 @@ std::size_t FindImage(const std::unordered_map<std::string, std::size_t>& mapIma
                       const char* pszIds, int nIndex, const char* pszWhat) {
     const auto it = mapImages.find(IdKey(pszIds, nIndex));
     if (it != mapImages.end()) return it->second;
-    lumo::Fatal(lumo::Err::kComputation,
-                MkName(_("SRITCalculateN: %s observation %d names image \"%s\", which is not among "
-                         "the images of the block.\n"),
-                       pszWhat, nIndex + 1, IdText(pszIds, nIndex).c_str()));
+    lumo::Fatal(
+        lumo::Err::kComputation,
+        MkName(_("Block adjustment: %s observation %d names image \"%s\", which is not among "
+                 "the images of the block.\n"),
+               pszWhat, nIndex + 1, IdText(pszIds, nIndex).c_str()));
 }
 
 // Point record of an identifier, made on its first appearance.
@@ -249,7 +250,7 @@ void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
         lumo::FatalReal(lumo::Err::kComputation, "Number of tie observations", in.nTie, 0);
     if (in.nTie == 1) {
         lumo::Fatal(lumo::Err::kComputation,
-                    _("SRITCalculateN: a single tie observation ties nothing; a tie point needs "
+                    _("Block adjustment: a single tie observation ties nothing; a tie point needs "
                       "observations in at least two images.\n"));
     }
     if (in.nTie > 0) {
@@ -271,7 +272,7 @@ void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
             if (papsModels[j] == papsModels[k] || in.papsEphemeris[j] == in.papsEphemeris[k] ||
                 bCrossed) {
                 lumo::Fatal(lumo::Err::kComputation,
-                            MkName(_("SRITCalculateN: images %d and %d share a model record or a "
+                            MkName(_("Block adjustment: images %d and %d share a model record or a "
                                      "segment; each image needs its own.\n"),
                                    j, k));
             }
