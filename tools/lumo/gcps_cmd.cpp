@@ -14,6 +14,7 @@
 #include "geosys_option.h"
 #include "lumo_gcp.h"
 #include "nova/projection.h"
+#include "point_prep.h"
 #include "points_io.h"
 
 namespace lumo::cli {
@@ -51,8 +52,18 @@ std::vector<ControlPoint_t> ToControlPoints(const PointSet& points) {
 }
 
 void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) {
-    const ProjInfo_t sProj = UserGeosys(options.osGeosys, "--geosys");
     PointSet points = ReadPointsFile(options.osInput, PointKind::ControlPoint);
+    NoteDisabledPoints(points, "lumo gcps convert", context.err);
+    // --geosys, else what the file declares ("# geosys:" or a georeferencer's
+    // "#CRS:" line); the two must agree when both are given.
+    PointFileOptions given = options.sPoints;
+    given.osGeosys = options.osGeosys;
+    const Georef declared = DeclaredGeoref(points, given);
+    if (!declared.Known()) {
+        LUMO_CLI_FAIL("--geosys is required: " + options.osInput +
+                      " does not declare the georeferencing of its ground coordinates");
+    }
+    const ProjInfo_t sProj = declared.sProj;
     // The converted heights depend on the heights given: none are assumed.
     ApplyHeights(points, options.sPoints, true, "the datum conversion");
     std::vector<ControlPoint_t> asGcps = ToControlPoints(points);
@@ -65,7 +76,7 @@ void RunGcpsConvert(const GcpsConvertOptions& options, CommandContext& context) 
     try {
         ConvertGcpsToWgs84Ell(sProj, options.osHeightRef, asGcps);
     } catch (const nova::ParameterException& e) {
-        LUMO_CLI_FAIL("--geosys " + Quoted(options.osGeosys) + ": " + e.GetMessage());
+        LUMO_CLI_FAIL("--geosys " + Quoted(declared.osGeosys) + ": " + e.GetMessage());
     } catch (const nova::DataException& e) {
         FailConversion(points, e);
     }
@@ -98,8 +109,8 @@ void AddGcpsCommand(CLI::App& app, CommandContext& context) {
     auto options = std::make_shared<GcpsConvertOptions>();
     CLI::App* convert = gcps->add_subcommand(
         "convert", "Convert control points to WGS 84 longitude, latitude and ellipsoidal height");
-    convert->add_option("--geosys", options->osGeosys, "georeferencing text of the ground x, y")
-        ->required();
+    convert->add_option("--geosys", options->osGeosys,
+                        "georeferencing text of the ground x, y (default: the file's declaration)");
     convert
         ->add_option("--height-ref", options->osHeightRef,
                      "heights above mean sea level (M, EGM96 geoid) or the ellipsoid (E)")

@@ -57,6 +57,8 @@ struct PointSet {
     std::string osGeosys;
     std::string osProjParms;
     std::vector<PointRecord> asPoints;
+    // Points a georeferencer's .points file marks as not enabled, left out.
+    std::size_t nDisabled = 0;
 };
 
 // Name of a column as it appears in a header.
@@ -64,12 +66,21 @@ const char* PointColumnName(PointColumn column);
 
 // Reads a point file. Column names are matched without regard to case and
 // surrounding blanks; unknown columns are ignored; lines whose first non-blank
-// character is '#' and blank lines are skipped. Throws nova::DataException
+// character is '#' and blank lines are skipped. Two layouts of other tools
+// are recognised from the header: a desktop GIS georeferencer's .points file
+// (mapX, mapY, pixelX or sourceX, pixelY or sourceY, enable; its "#CRS:" line
+// declares the georeferencing, its image Y is the negated line, and points
+// not enabled are counted in nDisabled and left out), and a plain list
+// separated by blanks, with a header or, for control points, without one
+// (pixel line X Y [Z] on every line). Throws nova::DataException
 // naming the source (and line and column) for a missing header, a missing or
 // repeated column, a line with the wrong number of fields and a value that is
 // not a finite number, and for a repeated georeferencing comment.
 PointSet ReadPoints(std::istream& in, const std::string& source, PointKind kind);
 PointSet ReadPointsFile(const std::string& path, PointKind kind);
+// Says on `err`, behind `command`, how many points the file left out as not
+// enabled (nothing when none).
+void NoteDisabledPoints(const PointSet& points, const std::string& command, std::ostream& err);
 
 // Writes the georeferencing comments, the header and one line per point with
 // the given columns. Numbers are written in the shortest form that reads

@@ -144,6 +144,7 @@ void RunResiduals(const ResidualsOptions& options, CommandContext& context) {
     const LoadedModel model = ReadModelFile(options.osModel);
     RequireRigorousForClosedForm(options.eForm, model);
     PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    NoteDisabledPoints(gcps, "lumo residuals", context.err);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
     ApplyHeights(gcps, options.sPoints, ModelUsesHeight(model.nModelCode), "the model");
     const Georef modelGeoref = ModelGeoref(model);
