@@ -22,6 +22,7 @@
 #include "geosys_option.h"
 #include "model_io.h"
 #include "nova/projection.h"
+#include "progress.h"
 #include "segment_io.h"
 #include "srit_io.h"
 #include "transform.h"
@@ -212,6 +213,7 @@ BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
     r.reportedIds.assign((nGcp + 1) * SRIT_ID_SIZE, '\0');
     r.reportedImages.assign(nGcp + 1, 0);
     for (auto& values : r.out) values.assign(nGcp + 1, 0.0);
+    const Activity activity("lumo block: adjusting " + std::to_string(nImages) + " images");
     const int result = SRITCalculateN(
         static_cast<int>(nImages), a.osImageIds.data(), modelPointers.data(), true,
         segmentPointers.data(), &proj, static_cast<int>(nGcp), a.osGcpImage.data(),

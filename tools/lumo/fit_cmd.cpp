@@ -22,6 +22,8 @@
 #include "nova/projection.h"
 #include "nova/regression.h"
 #include "points_io.h"
+#include "progress.h"
+#include "tool_warnings.h"
 #include "tps_io.h"
 
 namespace lumo::cli {
@@ -143,10 +145,16 @@ PolyPtr FitPoly(const FitOptions& options, const ProjInfo_t& proj, ControlArrays
     int orderInverse = requested;
     double rmsPixel = 0, rmsLine = 0, rmsX = 0, rmsY = 0;
     const char* unit = proj.szProj;
-    GCPRegression2(forward.get(), unit, c.x.data(), c.y.data(), "PIXEL", c.pixel.data(),
-                   c.line.data(), c.Count(), &orderForward, 0, &rmsPixel, &rmsLine);
-    GCPRegression2(inverse.get(), "PIXEL", c.pixel.data(), c.line.data(), unit, c.x.data(),
-                   c.y.data(), c.Count(), &orderInverse, 0, &rmsX, &rmsY);
+    {
+        const Activity activity("lumo fit: fitting the polynomial to " + std::to_string(c.Count()) +
+                                " control points");
+        // A lowered order is explained below in the command's own words.
+        const WarningCapture lowered;
+        GCPRegression2(forward.get(), unit, c.x.data(), c.y.data(), "PIXEL", c.pixel.data(),
+                       c.line.data(), c.Count(), &orderForward, 0, &rmsPixel, &rmsLine);
+        GCPRegression2(inverse.get(), "PIXEL", c.pixel.data(), c.line.data(), unit, c.x.data(),
+                       c.y.data(), c.Count(), &orderInverse, 0, &rmsX, &rmsY);
+    }
 
     PolyPtr poly(POLYAllocate());
     // Both directions share one term count; the lower one's extra terms stay 0.
@@ -176,17 +184,33 @@ PolyPtr FitPoly(const FitOptions& options, const ProjInfo_t& proj, ControlArrays
 
 TpsPtr FitTps(ControlArrays& c, CommandContext& context) {
     TpsPtr tps(TPSAllocate(nullptr));
-    TRNCalculate(tps->psGeoToImage, c.Count(), c.x.data(), c.y.data(), c.pixel.data(),
-                 c.line.data(), nullptr);
-    TRNCalculate(tps->psImageToGeo, c.Count(), c.pixel.data(), c.line.data(), c.x.data(),
-                 c.y.data(), nullptr);
+    bool bCollinear = false;
+    {
+        const Activity activity("lumo fit: fitting the thin plate spline to " +
+                                std::to_string(c.Count()) + " control points");
+        // The spline's affine part comes from the polynomial regression, whose
+        // warnings speak of polynomial orders; they are said here in the
+        // spline's terms.
+        const WarningCapture affine;
+        TRNCalculate(tps->psGeoToImage, c.Count(), c.x.data(), c.y.data(), c.pixel.data(),
+                     c.line.data(), nullptr);
+        TRNCalculate(tps->psImageToGeo, c.Count(), c.pixel.data(), c.line.data(), c.x.data(),
+                     c.y.data(), nullptr);
+        for (const nova::ErrorReport& report : affine.Reports()) {
+            bCollinear = bCollinear || report.osText.find("collinear") != std::string::npos;
+        }
+    }
     const auto* forward = static_cast<const TPSInfo_t*>(tps->psGeoToImage->pModel);
     const auto* inverse = static_cast<const TPSInfo_t*>(tps->psImageToGeo->pModel);
     context.out << "fitted tps: " << c.Count() << " control points, "
                 << (forward->nCPs > 0 ? "interpolating" : "affine (fewer than 4 points)")
                 << "; rank ground->image " << forward->nRank << ", image->ground " << inverse->nRank
                 << "\n";
-    if (forward->nCPs > 0 && forward->nRank < forward->nCPs + 3) {
+    if (bCollinear) {
+        context.err << "lumo fit: the control points lie on one line: the spline is determined "
+                       "along it only, and maps the image across it as a rotation, scale and "
+                       "shift; add points off the line\n";
+    } else if (forward->nCPs > 0 && forward->nRank < forward->nCPs + 3) {
         context.err << "lumo fit: the spline system is rank deficient (rank " << forward->nRank
                     << " of " << forward->nCPs + 3
                     << "): coincident or duplicate control points?\n";
@@ -275,6 +299,7 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     const RefineOptions refine =
         options.osRefine.empty() ? RefineOptions{} : ParseRefine(options.osRefine);
     PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    NoteDisabledPoints(gcps, "lumo fit", context.err);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
     if (options.osModel == "rf") {
         ApplyHeights(gcps, options.sPoints, true, "the rational function model");
@@ -313,8 +338,8 @@ void RunFit(const FitOptions& options, CommandContext& context) {
             "--geosys is required for --model poly and tps (or a \"# geosys:\" line in the "
             "control point file)");
     }
-    const ProjInfo_t projInfo =
-        UserGeosys(geosys, options.osGeosys.empty() ? options.osGcps + ": \"# geosys:\"" : "--geosys");
+    const ProjInfo_t projInfo = UserGeosys(
+        geosys, options.osGeosys.empty() ? options.osGcps + ": \"# geosys:\"" : "--geosys");
     ControlArrays c = ToArrays(gcps);
     WarnOutsideUTMBand(projInfo, c.x, c.y, "lumo fit", context.err);
     const bool bPoly = options.osModel == "poly";

@@ -20,6 +20,7 @@
 #include "lumo_sim.h"
 #include "model_io.h"
 #include "points_io.h"
+#include "progress.h"
 #include "radar_sim.h"
 #include "segment_io.h"
 
@@ -88,6 +89,7 @@ void RunSimulateRadar(SimulateOptions options, CommandContext& context) {
     std::vector<lumo::sim::SimPoint> asGcps, asChecks;
     SegmentPtr psSegment;
     try {
+        const Activity activity("lumo simulate: simulating the radar scene and its points");
         poScene = std::make_unique<lumo::sim::RadarScene>(r);
         SamplePointSets(*poScene, options, &asGcps, &asChecks);
         psSegment.reset(poScene->MakeSegment());
@@ -120,6 +122,7 @@ void RunSimulate(const SimulateOptions& options, CommandContext& context) {
     std::unique_ptr<lumo::sim::Scene> poScene;
     std::vector<lumo::sim::SimPoint> asGcps, asChecks;
     try {
+        const Activity activity("lumo simulate: simulating the scene and its points");
         poScene = std::make_unique<lumo::sim::Scene>(options.sScene);
         SamplePointSets(*poScene, options, &asGcps, &asChecks);
     } catch (const std::exception& e) {

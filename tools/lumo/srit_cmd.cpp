@@ -11,6 +11,7 @@
 #include "geosys_option.h"
 #include "nova/projection.h"
 #include "points_io.h"
+#include "progress.h"
 #include "segment_io.h"
 #include "srit_io.h"
 
@@ -76,10 +77,18 @@ void RunSritFit(const PointSet& allGcps, const std::string& segmentPath, const s
     }
     const ControlArrays all = ToArrays(allGcps);
     WarnOutsideUTMBand(sProj, all.x, all.y, "lumo fit", context.err);
-    const FitResiduals residuals =
-        RefineAndMeasure(SritImageFit(*psSegment, sProj, all), allGcps, kSritLeastPoints, refine);
+    FitResiduals residuals;
+    SritPtr psModel;
+    {
+        // Leave-one-out residuals and refinement refit the model once per
+        // point: the longest step of the command.
+        const Activity activity("lumo fit: computing the rigorous model from " +
+                                std::to_string(all.Count()) + " control points");
+        residuals = RefineAndMeasure(SritImageFit(*psSegment, sProj, all), allGcps,
+                                     kSritLeastPoints, refine);
+        psModel = ComputeSrit(*psSegment, sProj, all, residuals.use);
+    }
     const PointSet gcps = KeptPoints(allGcps, residuals);
-    SritPtr psModel = ComputeSrit(*psSegment, sProj, all, residuals.use);
     if (!psModel) LUMO_CLI_FAIL(gcps.osSource + ": no rigorous model could be computed");
     ControlArrays k = Subset(all, residuals.use);
     double dfRmsPixel = 0.0, dfRmsLine = 0.0;
