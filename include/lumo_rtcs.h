@@ -13,8 +13,8 @@
 #include <vector>
 
 #include "lumo_types.h"
-#include "projection.h"
-#include "regression.h"
+#include "nova/projection.h"
+#include "nova/regression.h"
 
 namespace nova {
 namespace mathmodel {

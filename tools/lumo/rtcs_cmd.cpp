@@ -8,6 +8,7 @@
 #include "commands.h"
 #include "nova/projection.h"
 #include "points_io.h"
+#include "progress.h"
 #include "rtcs_io.h"
 #include "segment_io.h"
 
@@ -35,7 +36,12 @@ void RunRtcsFit(const PointSet& gcps, const std::string& segmentPath, const std:
     for (const PointRecord& r : gcps.asPoints) {
         aoGcps.push_back({r.dfPixel, r.dfLine, r.dfX, r.dfY, r.dfZ});
     }
-    RtcsPtr psModel = GenerateRtcs(*psSegment, sProj, heightRef, aoGcps, gcps.osSource);
+    RtcsPtr psModel;
+    {
+        const Activity activity("lumo fit: generating the radar model from " +
+                                std::to_string(aoGcps.size()) + " control points");
+        psModel = GenerateRtcs(*psSegment, sProj, heightRef, aoGcps, gcps.osSource);
+    }
     // Residuals of the control points through the finished model.
     ProjInfo_t sGeo{};
     Geosys2ProjInfo(&sGeo, "LONG/LAT D000", 0.0, 0.0, 1.0, 1.0);

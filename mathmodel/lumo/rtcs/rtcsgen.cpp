@@ -322,7 +322,7 @@ void BuildLineParameters(RTCSInfo_t* psModel) {
     }
     if (nLastGood < 0) {
         lumo::Fatal(lumo::Err::kComputation,
-                    _("RTCSGenModel: the range and incidence of no image line can be derived "
+                    _("Radar model: the range and incidence of no image line can be derived "
                       "from the line positions and the control points."));
     }
     // A line whose geometry failed takes that of the nearest good line, so

@@ -56,7 +56,7 @@ void BuildGeoidGrid(RTCSInfo_t* psModel) {
     nova::dem::DEMPtr poGeoid(nova::dem::DEMFactory::CreateGlobalDEM(true, kGeoidCacheMegabytes));
     if (!poGeoid) {
         Fatal(Err::kBadArgument,
-              _("RTCSGenModel: heights above mean sea level need the EGM96 geoid grid, which is "
+              _("Radar model: heights above mean sea level need the EGM96 geoid grid, which is "
                 "not installed (proj-data)."));
     }
     RTCSGeoidGrid g;
