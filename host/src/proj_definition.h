@@ -6,6 +6,7 @@
 #pragma once
 
 #include <cstddef>
+#include <memory>
 #include <string>
 
 #include <proj.h>
@@ -24,6 +25,12 @@ namespace detail {
 // that want longitude first use proj_normalize_for_visualization.
 // Safe to call from any thread; never throws.
 std::string ProjInfoToProjDefinition(const ProjInfo_t& sInfo);
+
+// Owner of a PROJ object.
+struct PJDeleter {
+    void operator()(PJ* pj) const noexcept { proj_destroy(pj); }
+};
+using PJPtr = std::unique_ptr<PJ, PJDeleter>;
 
 // The calling thread's PROJ context (created on first use, released when the
 // thread ends). PROJ objects must only be used with the context that made them.

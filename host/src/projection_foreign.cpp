@@ -24,11 +24,6 @@ namespace nova {
 namespace detail {
 namespace {
 
-struct PJDeleter {
-    void operator()(PJ* pj) const noexcept { proj_destroy(pj); }
-};
-using PJPtr = std::unique_ptr<PJ, PJDeleter>;
-
 constexpr double kDegree = 0.017453292519943295;  // radians
 
 std::string TextOf(const char* pszText) {

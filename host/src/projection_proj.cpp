@@ -19,11 +19,6 @@ namespace nova {
 namespace detail {
 namespace {
 
-struct PJDeleter {
-    void operator()(PJ* pj) const noexcept { proj_destroy(pj); }
-};
-using PJPtr = std::unique_ptr<PJ, PJDeleter>;
-
 // How a cached pair of descriptions transforms its points.
 enum class TransformMode { kFail, kIdentity, kProj };
 
