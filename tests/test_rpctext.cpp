@@ -241,7 +241,7 @@ TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
 // with or without its validity flag and error estimates, line ends anywhere.
 // Each reads into the model its "KEY: value" equivalent gives.
 TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
-    RecordPtr psSample = Parse(ReadFile(kExamples + "/rf_scene_RPC.TXT"));
+    RecordPtr psSample = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     std::string rpb = LumoRFInfoToRPCText(psSample.get(), LUMO_RPC_TEXT_RPB);
     rpb = "bandId = \"P\"\n" +
           Replace(rpb, "BEGIN_GROUP = IMAGE\n", "BEGIN_GROUP = IMAGE\nerrBias = 2.5;\n");
@@ -313,7 +313,7 @@ TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
 // fields a form cannot write are refused, not dropped.
 TEST(RPCText, FieldsSurviveConversionsBetweenForms) {
     const std::string text = "ERR_BIAS: 1.5 meters\nERR_RAND: 0.25 meters\nPRODUCT: ortho ready\n" +
-                             ReadFile(kExamples + "/rf_scene_RPC.TXT");
+                             ReadText(kExamples + "/rf_scene_RPC.TXT");
     std::vector<LumoRPCField> aoFields;
     RecordPtr psRF(
         LumoRPCTextToRFInfo(text.data(), text.size(), LUMO_RPC_TEXT_TXT, "a.TXT", &aoFields),
@@ -372,10 +372,10 @@ TEST(RPCText, ToolConvertsBetweenAllForms) {
     // The error estimates of a text go through JSON into the other text form;
     // the binary block says it cannot keep them.
     const std::string withErrors = dir + "/e_RPC.TXT", errJson = dir + "/e.json";
-    std::ofstream(withErrors) << "ERR_BIAS: 3.5 meters\n" << ReadFile(sample);
+    std::ofstream(withErrors) << "ERR_BIAS: 3.5 meters\n" << ReadText(sample);
     EXPECT_EQ(run({"rpc", withErrors, errJson}).first, 0);
     EXPECT_EQ(run({"rpc", errJson, rpb}).first, 0);
-    EXPECT_NE(ReadFile(rpb).find("errBias = 3.5;"), std::string::npos);
+    EXPECT_NE(ReadText(rpb).find("errBias = 3.5;"), std::string::npos);
     const std::string note = run({"rpc", rpb, bin}).second;
     EXPECT_NE(note.find("no room for"), std::string::npos);
     EXPECT_NE(note.find("errBias"), std::string::npos);
