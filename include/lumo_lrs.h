@@ -22,7 +22,7 @@
 #include <vector>
 
 #include "lumo_types.h"
-#include "projection.h"
+#include "nova/projection.h"
 
 // ---------------------------------------------------------------------------
 // Orbit propagation
