@@ -213,7 +213,6 @@ BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
     r.reportedIds.assign((nGcp + 1) * SRIT_ID_SIZE, '\0');
     r.reportedImages.assign(nGcp + 1, 0);
     for (auto& values : r.out) values.assign(nGcp + 1, 0.0);
-    const Activity activity("lumo block: adjusting " + std::to_string(nImages) + " images");
     const int result = SRITCalculateN(
         static_cast<int>(nImages), a.osImageIds.data(), modelPointers.data(), true,
         segmentPointers.data(), &proj, static_cast<int>(nGcp), a.osGcpImage.data(),
@@ -340,11 +339,15 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
     FitResiduals residuals;
     if (!options.bNoLeaveOneOut) {
         residuals = RefineAndMeasure(BlockImageFit(allControl, control, options.bConstrain),
-                                     control.points, kBlockLeastControl, refine);
+                                     control.points, kBlockLeastControl, refine, "lumo block");
     }
     const BlockProject project =
         residuals.anDropped.empty() ? allControl : Without(allControl, control, residuals.use);
-    BlockResult r = ComputeBlock(project, options.bConstrain);
+    BlockResult r = [&] {
+        const Activity activity("lumo block: adjusting " + std::to_string(project.asImages.size()) +
+                                " images");
+        return ComputeBlock(project, options.bConstrain);
+    }();
     const BlockArrays& a = r.a;
     const auto& models = r.models;
     const auto& out = r.out;

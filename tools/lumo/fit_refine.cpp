@@ -8,6 +8,8 @@
 #include <CLI/CLI.hpp>
 
 #include "cli_error.h"
+#include "progress.h"
+#include "tool_warnings.h"
 
 namespace lumo::cli {
 namespace {
@@ -104,7 +106,7 @@ RefineOptions ParseRefine(const std::string& text) {
 }
 
 FitResiduals RefineAndMeasure(const ImageFit& fit, const PointSet& gcps, int nLeast,
-                              const RefineOptions& options) {
+                              const RefineOptions& options, const std::string& command) {
     const std::size_t n = gcps.asPoints.size();
     if (options.bEnabled && options.nMinPoints > 0 && options.nMinPoints < nLeast) {
         LUMO_CLI_FAIL("--refine: MIN_POINTS " + std::to_string(options.nMinPoints) +
@@ -114,6 +116,12 @@ FitResiduals RefineAndMeasure(const ImageFit& fit, const PointSet& gcps, int nLe
     // minimum keeps one.
     const std::size_t nMin =
         static_cast<std::size_t>(options.nMinPoints > 0 ? options.nMinPoints : nLeast + 1);
+    // One refit per point and per refinement round: the longest step of a
+    // fit. The refits' warnings speak of subsets of the points; the caller's
+    // final fit reports on the model itself.
+    const Activity activity(command + ": leave-one-out residuals of " + std::to_string(n) +
+                            " control points");
+    const WarningCapture subsetWarnings;
     FitResiduals result;
     result.use.assign(n, 1);
     for (;;) {

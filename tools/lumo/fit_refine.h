@@ -48,9 +48,10 @@ struct FitResiduals {
 // leave-one-out distance beyond the tolerance and refits, until none is
 // beyond it or the minimum number of points is left. nLeast is the fit's
 // least number of points. When the final fit fails the caller's own fit
-// reports why.
+// reports why. Progress on a terminal is labelled with `command`.
 FitResiduals RefineAndMeasure(const ImageFit& fit, const PointSet& gcps, int nLeast,
-                              const RefineOptions& options);
+                              const RefineOptions& options,
+                              const std::string& command = "lumo fit");
 
 // The table of each point's residuals, with the dropped points marked and
 // listed, on `out`; nothing without a final fit.

@@ -77,20 +77,17 @@ void RunSritFit(const PointSet& allGcps, const std::string& segmentPath, const s
     }
     const ControlArrays all = ToArrays(allGcps);
     WarnOutsideUTMBand(sProj, all.x, all.y, "lumo fit", context.err);
-    FitResiduals residuals;
+    const FitResiduals residuals =
+        RefineAndMeasure(SritImageFit(*psSegment, sProj, all), allGcps, kSritLeastPoints, refine);
+    ControlArrays k = Subset(all, residuals.use);
     SritPtr psModel;
     {
-        // Leave-one-out residuals and refinement refit the model once per
-        // point: the longest step of the command.
         const Activity activity("lumo fit: computing the rigorous model from " +
-                                std::to_string(all.Count()) + " control points");
-        residuals = RefineAndMeasure(SritImageFit(*psSegment, sProj, all), allGcps,
-                                     kSritLeastPoints, refine);
+                                std::to_string(k.Count()) + " control points");
         psModel = ComputeSrit(*psSegment, sProj, all, residuals.use);
     }
     const PointSet gcps = KeptPoints(allGcps, residuals);
     if (!psModel) LUMO_CLI_FAIL(gcps.osSource + ": no rigorous model could be computed");
-    ControlArrays k = Subset(all, residuals.use);
     double dfRmsPixel = 0.0, dfRmsLine = 0.0;
     SRITRMSError(psModel.get(), k.Count(), k.x.data(), k.y.data(), k.z.data(), k.pixel.data(),
                  k.line.data(), dfRmsPixel, dfRmsLine);
