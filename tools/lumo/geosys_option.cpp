@@ -41,4 +41,20 @@ void WarnOutsideUTMBand(const ProjInfo_t& proj, const std::vector<double>& x,
     if (!advice.empty()) err << prefix << ": warning: " << advice << '\n';
 }
 
+void WarnOutsideUTMBand(const ProjInfo_t& proj, const PointSet& points, const std::string& prefix,
+                        std::ostream& err) {
+    std::vector<double> x, y;
+    for (const PointRecord& r : points.asPoints) {
+        x.push_back(r.dfX);
+        y.push_back(r.dfY);
+    }
+    WarnOutsideUTMBand(proj, x, y, prefix, err);
+}
+
+std::string GeosysWhere(const PointSet& points, const std::string& geosys) {
+    return !points.osGeosys.empty() && points.osGeosys == geosys
+               ? points.osSource + ": \"# geosys:\""
+               : "--geosys";
+}
+
 }  // namespace lumo::cli

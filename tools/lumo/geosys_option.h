@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "nova/projection.h"
+#include "points_io.h"
 
 namespace lumo::cli {
 
@@ -23,5 +24,12 @@ void StoreGeosys(const ProjInfo_t& proj, char* buffer, int bufferSize, const std
 // with a latitude band lie far outside that band.
 void WarnOutsideUTMBand(const ProjInfo_t& proj, const std::vector<double>& x,
                         const std::vector<double>& y, const std::string& prefix, std::ostream& err);
+// The same for the ground coordinates of a point file.
+void WarnOutsideUTMBand(const ProjInfo_t& proj, const PointSet& points, const std::string& prefix,
+                        std::ostream& err);
+
+// Where the georeferencing text `geosys` of `points` came from, for
+// messages: the file's "# geosys:" line when it is the file's, else --geosys.
+std::string GeosysWhere(const PointSet& points, const std::string& geosys);
 
 }  // namespace lumo::cli

@@ -8,8 +8,10 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#include "geosys_option.h"
 #include "json_fields.h"
 #include "point_prep.h"
+#include "progress.h"
 #include "segment_io.h"
 
 namespace lumo::cli {
@@ -97,12 +99,10 @@ double RmsResidual(const LRSOrbitModel_t& m, const std::vector<ControlPoint_t>& 
     return n > 0 ? std::sqrt(dfSum / n) : 0.0;
 }
 
-Georef GeographicGeoref(const std::string& osGeosys) {
+Georef GeographicGeoref(const std::string& osGeosys, const std::string& where) {
     Georef g;
     g.osGeosys = osGeosys;
-    if (Geosys2ProjInfo(&g.sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("--geosys " + Quoted(osGeosys) + " is not a known georeferencing text");
-    }
+    g.sProj = UserGeosys(osGeosys, where);
     return g;
 }
 
@@ -208,7 +208,9 @@ void RunLrsFit(PointSet& gcps, const std::string& segmentPath, const std::string
     });
     // Control points in longitude and latitude: declared others are converted.
     if (!geosys.empty()) {
-        GroundInModelSystem(gcps, GeographicGeoref(geosys), GeographicGeoref(kLrsGeosys),
+        const Georef given = GeographicGeoref(geosys, GeosysWhere(gcps, geosys));
+        WarnOutsideUTMBand(given.sProj, gcps, "lumo fit", context.err);
+        GroundInModelSystem(gcps, given, GeographicGeoref(kLrsGeosys, "the orbit model"),
                             kFailedToImage, context.err);
     }
     std::vector<ControlPoint_t> asPoints;
@@ -220,6 +222,8 @@ void RunLrsFit(PointSet& gcps, const std::string& segmentPath, const std::string
     int nMissedBefore = 0, nMissedAfter = 0;
     const double dfBefore = RmsResidual(model, asPoints, nMissedBefore);
     CheckedLrsCall(gcps.osSource, [&] {
+        const Activity activity("lumo fit: refining the orbit model with " +
+                                std::to_string(asPoints.size()) + " control points");
         LRSRefineOrbitModel(&model, asPoints.data(), static_cast<int>(asPoints.size()));
         LRSSetupCoordinateMapping(&model);
     });

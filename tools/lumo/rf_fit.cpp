@@ -11,6 +11,7 @@
 #include "cli_error.h"
 #include "commands.h"
 #include "fit_refine.h"
+#include "geosys_option.h"
 #include "json_fields.h"
 #include "rf_forms.h"
 
@@ -30,8 +31,10 @@ ControlArrays ControlInModelSystem(PointSet& gcps, const PointFileOptions& point
     Georef model;
     model.osGeosys = BufferText(rf.pszGeosys, RF_TEXT_SIZE - 1);
     model.sProj = *rf.psProjInfo;
+    const Georef declared = DeclaredGeoref(gcps, points);
+    if (declared.Known()) WarnOutsideUTMBand(declared.sProj, gcps, "lumo fit", context.err);
     const std::vector<GroundXY> ground =
-        GroundInModelSystem(gcps, DeclaredGeoref(gcps, points), model, kFailedToImage, context.err);
+        GroundInModelSystem(gcps, declared, model, kFailedToImage, context.err);
     ControlArrays c = ToArrays(gcps);
     for (std::size_t i = 0; i < ground.size(); ++i) {
         const PointRecord& p = gcps.asPoints[i];

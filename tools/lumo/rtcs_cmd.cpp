@@ -6,6 +6,7 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#include "geosys_option.h"
 #include "nova/projection.h"
 #include "points_io.h"
 #include "progress.h"
@@ -27,11 +28,9 @@ void RunRtcsFit(const PointSet& gcps, const std::string& segmentPath, const std:
             "--model rtcs needs the control points' georeferencing: --geosys or a "
             "\"# geosys:\" line");
     }
-    ProjInfo_t sProj{};
-    if (Geosys2ProjInfo(&sProj, geosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        LUMO_CLI_FAIL("projection " + Quoted(geosys) + " is not a known georeferencing text");
-    }
+    const ProjInfo_t sProj = UserGeosys(geosys, GeosysWhere(gcps, geosys));
     SegmentPtr psSegment = ReadSegmentFile(segmentPath);
+    WarnOutsideUTMBand(sProj, gcps, "lumo fit", context.err);
     std::vector<ControlPoint_t> aoGcps;
     for (const PointRecord& r : gcps.asPoints) {
         aoGcps.push_back({r.dfPixel, r.dfLine, r.dfX, r.dfY, r.dfZ});

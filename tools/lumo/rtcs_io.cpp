@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "cli_error.h"
+#include "geosys_option.h"
 #include "json_fields.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
@@ -48,11 +49,9 @@ RtcsPtr RtcsFromJson(const ModelEnvelope& envelope, const json& section) {
     if (osHeightRef != "E" && osHeightRef != "M") {
         ctx.Fail("heightRef", "must be \"E\" or \"M\", found " + Quoted(osHeightRef));
     }
-    ProjInfo_t sProj{};
     const std::string osGeosys = GetText(section, "gcpGeosys", ctx);
-    if (Geosys2ProjInfo(&sProj, osGeosys.c_str(), 0.0, 0.0, 1.0, 1.0) < 0) {
-        ctx.Fail("gcpGeosys", "unknown georeferencing text " + Quoted(osGeosys));
-    }
+    ProjInfo_t sProj =
+        UserGeosys(osGeosys, envelope.osSource + ": field " + Quoted(ctx.Field("gcpGeosys")));
     if (const json* parms = FindField(section, "gcpProjParms"); parms != nullptr) {
         const std::string osParms = TextValue(*parms, "gcpProjParms", ctx);
         if (ProjParms2Info(osParms.c_str(), &sProj) != 0) {
