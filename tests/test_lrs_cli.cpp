@@ -3,6 +3,7 @@
 // sample and the refusals.
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -33,6 +34,18 @@ TEST_F(LrsCliTest, SimulateFitCheckAndWriteAngles) {
     r = RunTool({"fit", "--model", "lrs", "--segment", seg, "--gcps", gcps, "-o", model});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
     EXPECT_NE(r.osOut.find("refined with 20 control points"), std::string::npos) << r.osOut;
+    // The same points undeclared, their georeferencing given by EPSG code,
+    // fit the same model; a code PROJ does not know is refused by name.
+    std::string plain = lumo::support::ReadText(gcps);
+    plain = Write("plain.csv", plain.erase(0, plain.find('\n') + 1));
+    r = RunTool({"fit", "--model", "lrs", "--segment", seg, "--gcps", plain, "--geosys",
+                 "EPSG:4326", "-o", Path("epsg.json")});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_EQ(lumo::support::ReadText(Path("epsg.json")), lumo::support::ReadText(model));
+    r = RunTool({"fit", "--model", "lrs", "--segment", seg, "--gcps", plain, "--geosys",
+                 "EPSG:99999", "-o", Path("none.json")});
+    EXPECT_EQ(r.nCode, 1);
+    EXPECT_NE(r.osErr.find("--geosys: \"EPSG:99999\" cannot be used"), std::string::npos);
     r = RunTool({"residuals", model, "--gcps", checks});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
     double dfPixel = 0.0, dfLine = 0.0;
@@ -89,6 +102,16 @@ TEST_F(LrsCliTest, RefusesWhatItCannotUse) {
     EXPECT_EQ(r.nCode, 1);
     EXPECT_NE(r.osErr.find("nOrbitType"), std::string::npos) << r.osErr;
     EXPECT_FALSE(std::filesystem::exists(Path("m2.json")));
+    // Simulation parameters out of range are named with their value; nothing is written.
+    const std::array<std::array<const char*, 3>, 2> cases{
+        {{"--roll-bias", "nan", "roll bias nan"}, {"--day", "366", "epoch day 366"}}};
+    for (const auto& [option, value, says] : cases) {
+        r = RunTool({"simulate-avhrr", "--segment", Path("s.json"), "--gcps", Path("g.csv"),
+                     "--year", "2003", option, value});
+        EXPECT_EQ(r.nCode, 1);
+        EXPECT_NE(r.osErr.find(says), std::string::npos) << r.osErr;
+        EXPECT_FALSE(std::filesystem::exists(Path("s.json")));
+    }
 }
 
 TEST(LrsDemo, SampleModelMeetsItsCheckPoints) {

@@ -48,16 +48,23 @@ void RunSimulateAvhrr(const SimulateAvhrrOptions& options, CommandContext& conte
     try {
         psSegment.reset(lumo::sim::MakeAvhrrSegment(options.sPass));
     } catch (const std::invalid_argument& e) {
-        LUMO_CLI_FAIL(std::string("lumo simulate-avhrr: ") + e.what());
+        LUMO_CLI_FAIL(std::string("simulated pass: ") + e.what());
     }
     LRSOrbitModel_t truth;
-    CheckedLrsCall("lumo simulate-avhrr", [&] {
-        LRSInitOrbitModel(psSegment.get(), &truth);
+    CheckedLrsCall("simulated pass", [&] { LRSInitOrbitModel(psSegment.get(), &truth); });
+    try {
         lumo::sim::ApplyBias(options.sBias, &truth);
-        LRSSetupCoordinateMapping(&truth);
-    });
+    } catch (const std::invalid_argument& e) {
+        LUMO_CLI_FAIL(std::string("simulated pass: ") + e.what());
+    }
+    CheckedLrsCall("simulated pass", [&] { LRSSetupCoordinateMapping(&truth); });
     const std::vector<ControlPoint_t> asGcps = lumo::sim::SampleAvhrrPoints(
         truth, options.nGcpColumns, options.nGcpRows, 40.0, options.dfMaxHeight, options.nSeed);
+    if (asGcps.empty()) {
+        LUMO_CLI_FAIL(
+            "simulated pass: none of its control points lies on the "
+            "Earth; nothing written");
+    }
     WriteSegmentFile(options.osSegment, *psSegment);
     WriteFileReplacing(options.osGcps, PointText(asGcps, "GCP"));
     std::size_t nChecks = 0;

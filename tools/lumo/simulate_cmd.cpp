@@ -94,7 +94,7 @@ void RunSimulateRadar(SimulateOptions options, CommandContext& context) {
         SamplePointSets(*poScene, options, &asGcps, &asChecks);
         psSegment.reset(poScene->MakeSegment());
     } catch (const std::exception& e) {
-        LUMO_CLI_FAIL(std::string("lumo simulate --radar: ") + e.what());
+        LUMO_CLI_FAIL(std::string("simulated radar scene: ") + e.what());
     }
     WriteSegmentFile(options.osSegment, *psSegment);
     WriteFileReplacing(options.osGcps, SimulatedPointText(asGcps, "GCP", "LONG/LAT D000"));
@@ -126,7 +126,7 @@ void RunSimulate(const SimulateOptions& options, CommandContext& context) {
         poScene = std::make_unique<lumo::sim::Scene>(options.sScene);
         SamplePointSets(*poScene, options, &asGcps, &asChecks);
     } catch (const std::exception& e) {
-        LUMO_CLI_FAIL(std::string("lumo simulate: ") + e.what());
+        LUMO_CLI_FAIL(std::string("simulated scene: ") + e.what());
     }
     SegmentPtr psSegment(poScene->MakeSegment());
     WriteSegmentFile(options.osSegment, *psSegment);

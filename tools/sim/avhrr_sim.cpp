@@ -12,21 +12,17 @@
 
 #include "lumo_ephemeris.h"
 #include "runtime.h"
+#include "sim_math.h"
 #include "timesys.h"
 
 namespace lumo::sim {
 namespace {
 
 constexpr double kSecondsPerDay = 86400.0;
-constexpr double kPi = 3.141592653589793;
 constexpr double kLinesPerSecond = 6.0;
 
 int DaysInYear(int nYear) {
     return ((nYear % 4 == 0 && nYear % 100 != 0) || nYear % 400 == 0) ? 366 : 365;
-}
-
-void Require(bool bOk, const std::string& osWhat) {
-    if (!bOk) throw std::invalid_argument("AVHRR pass: " + osWhat);
 }
 
 // Writes a value into a 16-character header field, right-aligned in the
@@ -34,7 +30,8 @@ void Require(bool bOk, const std::string& osWhat) {
 void PutField(char* pszField, const char* pszFormat, long long nValue) {
     char szText[AVHRR_FIELD_SIZE + 8];
     std::snprintf(szText, sizeof szText, pszFormat, nValue);
-    Require(std::strlen(szText) < AVHRR_FIELD_SIZE, std::string("field text ") + szText);
+    Require(std::strlen(szText) < AVHRR_FIELD_SIZE, "orbit header value",
+            static_cast<double>(nValue), "does not fit the header's 16-character field");
     std::strcpy(pszField, szText);
 }
 
@@ -42,8 +39,8 @@ void PutField(char* pszField, const char* pszFormat, long long nValue) {
 // field's eight characters.
 long long ScaledElement(double dfValue, double dfScale, const char* pszName) {
     const double dfScaled = std::round(dfValue * dfScale);
-    Require(dfScaled >= 0.0 && dfScaled <= 99999999.0,
-            std::string(pszName) + " does not fit the header's eight characters");
+    Require(dfScaled >= 0.0 && dfScaled <= 99999999.0, pszName, dfValue,
+            "does not fit the orbit header's eight digits");
     return static_cast<long long>(dfScaled);
 }
 
@@ -117,14 +114,18 @@ void FillAcquisitionDate(const AvhrrPassSpec& s, EphemerisSeg_t& sSeg) {
 }  // namespace
 
 EphemerisSeg_t* MakeAvhrrSegment(const AvhrrPassSpec& s) {
-    Require(s.nEpochYear >= 1900 && s.nEpochYear <= 2199, "epoch year outside 1900..2199");
-    Require(s.nEpochDay >= 1 && s.nEpochDay <= DaysInYear(s.nEpochYear), "epoch day of the year");
+    Require(s.nEpochYear >= 1900 && s.nEpochYear <= 2199, "epoch year", s.nEpochYear,
+            "must lie in 1900..2199");
+    Require(s.nEpochDay >= 1 && s.nEpochDay <= DaysInYear(s.nEpochYear), "epoch day", s.nEpochDay,
+            DaysInYear(s.nEpochYear) == 366 ? "must lie in 1..366 (a leap year)"
+                                            : "must lie in 1..365 (not a leap year)");
     Require(s.dfEpochSecondOfDay >= 0.0 && s.dfEpochSecondOfDay < kSecondsPerDay,
-            "epoch second of the day");
-    Require(s.nLines >= 2 && s.nLines <= 200000, "line count outside 2..200000");
+            "epoch second of the day", s.dfEpochSecondOfDay, "must lie in [0, 86400)");
+    Require(s.nLines >= 2 && s.nLines <= 200000, "line count", s.nLines, "must lie in 2..200000");
     Require(std::isfinite(s.dfStartSeconds) && std::fabs(s.dfStartSeconds) < 30 * kSecondsPerDay,
-            "start time");
-    Require(std::isfinite(s.dfClockOffsetMs) && std::fabs(s.dfClockOffsetMs) < 1e6, "clock offset");
+            "start", s.dfStartSeconds, "must lie within 30 days (2592000 s) of the epoch");
+    Require(std::isfinite(s.dfClockOffsetMs) && std::fabs(s.dfClockOffsetMs) < 1e6, "clock offset",
+            s.dfClockOffsetMs, "must lie within (-1e6, 1e6) milliseconds");
 
     auto* psSeg = static_cast<EphemerisSeg_t*>(HCalloc(1, sizeof(EphemerisSeg_t)));
     std::strcpy(psSeg->szSensorName, "AVHRR");
@@ -156,6 +157,15 @@ EphemerisSeg_t* MakeAvhrrSegment(const AvhrrPassSpec& s) {
 }
 
 void ApplyBias(const AvhrrBias& b, LRSOrbitModel_t* psModel) {
+    // Beyond these the "true" pass no longer sees the nominal one's ground.
+    Require(std::isfinite(b.dfRollDeg) && std::fabs(b.dfRollDeg) <= 10.0, "roll bias", b.dfRollDeg,
+            "must lie within [-10, 10] degrees");
+    Require(std::isfinite(b.dfPitchDeg) && std::fabs(b.dfPitchDeg) <= 10.0, "pitch bias",
+            b.dfPitchDeg, "must lie within [-10, 10] degrees");
+    Require(std::isfinite(b.dfYawDeg) && std::fabs(b.dfYawDeg) <= 10.0, "yaw bias", b.dfYawDeg,
+            "must lie within [-10, 10] degrees");
+    Require(std::isfinite(b.dfAlongTrackKm) && std::fabs(b.dfAlongTrackKm) <= 500.0,
+            "along-track bias", b.dfAlongTrackKm, "must lie within [-500, 500] km");
     const double dfDeg = kPi / 180.0;
     psModel->adfRollPoly[1] += b.dfRollDeg * dfDeg;
     psModel->adfPitchPoly[1] += b.dfPitchDeg * dfDeg;
