@@ -10,7 +10,7 @@ PACKAGES=(
   libopenblas-dev liblapack-dev liblapacke-dev
   liberfa-dev
   libgtest-dev libgmock-dev googletest libbenchmark-dev
-  libgdal-dev
+  libgdal-dev gdal-bin
 )
 
 missing=()
