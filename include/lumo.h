@@ -12,6 +12,7 @@
 #include "lumo_lrs.h"
 #include "lumo_mathmodel.h"
 #include "lumo_poly.h"
+#include "lumo_record_model.h"
 #include "lumo_rf.h"
 #include "lumo_rtcs.h"
 #include "lumo_sensor.h"

@@ -23,6 +23,7 @@ constexpr AddCommandFn kCommands[] = {
     &AddDemoCommand,     &AddTransformCommand, &AddPolyCommand,          &AddRpcCommand,
     &AddFitCommand,      &AddResidualsCommand, &AddGcpsCommand,          &AddSegmentCommand,
     &AddSimulateCommand, &AddBlockCommand,     &AddSimulateAvhrrCommand, &AddAnglesCommand,
+    &AddInfoCommand,     &AddOrthoCommand,
 };
 
 std::string VersionText() {

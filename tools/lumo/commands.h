@@ -46,6 +46,10 @@ void AddSimulateCommand(CLI::App& app, CommandContext& context);
 void AddBlockCommand(CLI::App& app, CommandContext& context);
 void AddSimulateAvhrrCommand(CLI::App& app, CommandContext& context);
 void AddAnglesCommand(CLI::App& app, CommandContext& context);
+// Commands that read rasters: present when the tool is built with GDAL, and
+// otherwise reporting that it is not.
+void AddInfoCommand(CLI::App& app, CommandContext& context);
+void AddOrthoCommand(CLI::App& app, CommandContext& context);
 // `lumo demo`'s last part: the block adjustment of the bundled stereo pair
 // with tie points (examples/block_stereo.json).
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out);
