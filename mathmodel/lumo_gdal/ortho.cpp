@@ -2,6 +2,7 @@
 // and writes on its threads; the geometry comes from our transformer.
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <filesystem>
 #include <string>
@@ -64,16 +65,21 @@ class BlockCacheLimit {
 };
 
 // The user's progress callback over a part [dfStart, dfStart + dfShare].
+// GDAL may report from its worker threads, so the cancellation is kept here
+// rather than read back from GDAL's per-thread error state.
 struct ProgressPart {
     const std::function<bool(double)>* pfnProgress;
     double dfStart;
     double dfShare;
+    std::atomic<bool> bCancelled{false};
 };
 
 int CPL_STDCALL ReportProgress(double dfComplete, const char*, void* pArg) {
-    const auto* psPart = static_cast<const ProgressPart*>(pArg);
+    auto* psPart = static_cast<ProgressPart*>(pArg);
     if (psPart->pfnProgress == nullptr || !*psPart->pfnProgress) return TRUE;
-    return (*psPart->pfnProgress)(psPart->dfStart + psPart->dfShare * dfComplete) ? TRUE : FALSE;
+    if ((*psPart->pfnProgress)(psPart->dfStart + psPart->dfShare * dfComplete)) return TRUE;
+    psPart->bCancelled = true;
+    return FALSE;
 }
 
 GDALResampleAlg ToGdal(Resampling eResampling) {
@@ -207,9 +213,11 @@ void Warp(GDALDatasetH hSource, GDALDatasetH hOutput, const SourceBands& sBands,
     }
     const CPLErr eErr = oOperation.ChunkAndWarpMulti(0, 0, GDALGetRasterXSize(hOutput),
                                                      GDALGetRasterYSize(hOutput));
+    if (sPart.bCancelled) LUMO_GDAL_FAIL("cancelled");
     if (eErr != CE_None) {
-        if (CPLGetLastErrorNo() == CPLE_UserInterrupt) LUMO_GDAL_FAIL("cancelled");
-        LUMO_GDAL_FAIL("the warp failed" + detail::GdalReason());
+        LUMO_GDAL_FAIL(std::string(GDALGetDescription(hSource)) +
+                       ": orthorectification failed (unreadable or truncated image?)" +
+                       detail::GdalReason());
     }
 }
 
@@ -235,8 +243,8 @@ void WriteCloudOptimized(const std::string& osFrom, const std::string& osTo, int
     int bUsageError = FALSE;
     DatasetPtr poCog(GDALTranslate(osTo.c_str(), poSource.get(), psOptions, &bUsageError));
     GDALTranslateOptionsFree(psOptions);
+    if (sPart.bCancelled) LUMO_GDAL_FAIL("cancelled");
     if (!poCog) {
-        if (CPLGetLastErrorNo() == CPLE_UserInterrupt) LUMO_GDAL_FAIL("cancelled");
         LUMO_GDAL_FAIL(osTo + ": cannot write the cloud-optimised GeoTIFF" + detail::GdalReason());
     }
     CloseWritten(poCog, osTo);

@@ -1,0 +1,257 @@
+// Orthorectification: marks of a simulated image land on their map
+// positions; the geometry agrees with gdalwarp on the same inputs; every
+// band and data type is carried; bad input fails naming the culprit and
+// leaves no file behind.
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+#include <string>
+#include <vector>
+
+#include "lumo.h"
+#include "lumo_gdal.h"
+#include "marked_scene.h"
+#include "model_object.h"
+#include "rf_io.h"
+#include "runtime.h"
+#include "support/cli_runner.h"
+#include "support/gdal_rasters.h"
+
+namespace {
+
+using lumo::support::RasterSpec;
+using nova::dem::DEMPtr;
+namespace fs = std::filesystem;
+
+// Smooth hills around a centre, heights 200 to 1000 m.
+double Hills(double dfX, double dfY, double dfX0, double dfY0) {
+    return 600.0 + 400.0 * std::sin((dfX - dfX0) / 700.0) * std::cos((dfY - dfY0) / 900.0);
+}
+
+class OrthoTest : public lumo::support::ScratchDirTest {
+  protected:
+    OrthoTest() : ScratchDirTest("lumo_gdal_ortho_") {}
+
+    // A UTM 31N elevation file of hills, 20 m cells, 6 km around (dfX0, dfY0).
+    std::string WriteHills(double dfX0, double dfY0) {
+        RasterSpec sSpec;
+        sSpec.nCols = sSpec.nRows = 300;
+        const double adfGT[6] = {dfX0 - 3000.0, 20.0, 0.0, dfY0 + 3000.0, 0.0, -20.0};
+        std::copy(adfGT, adfGT + 6, sSpec.adfGeoTransform);
+        const std::string osPath = Path("hills.tif");
+        lumo::support::WriteRaster(osPath, sSpec, [&](int, int c, int r) {
+            return Hills(adfGT[0] + (c + 0.5) * 20.0, adfGT[3] - (r + 0.5) * 20.0, dfX0, dfY0);
+        });
+        return osPath;
+    }
+
+    // A 600 x 500 image whose two bands hold each pixel centre's own column and
+    // line, with rational polynomials in an _RPC.TXT sidecar, and an elevation
+    // file in longitude and latitude under it.
+    void WriteRpcScene() {
+        // Newline first, so that every key follows one.
+        std::string osRpc =
+            "\n" + lumo::support::ReadText(LUMO_SOURCE_DIR "/examples/rf_scene_RPC.TXT");
+        const std::pair<const char*, const char*> aScaled[] = {
+            {"LINE_OFF", "250"},   {"SAMP_OFF", "300"},     {"LINE_SCALE", "250"},
+            {"SAMP_SCALE", "300"}, {"LAT_SCALE", "0.0055"}, {"LONG_SCALE", "0.008"}};
+        for (const auto& [pszKey, pszValue] : aScaled) {
+            osRpc = std::regex_replace(osRpc, std::regex(std::string("\n") + pszKey + ": [^\n]*"),
+                                       std::string("\n") + pszKey + ": " + pszValue);
+        }
+        Write("image_RPC.TXT", osRpc.substr(1));
+        RasterSpec sImage;
+        sImage.nCols = 600;
+        sImage.nRows = 500;
+        sImage.nBands = 2;
+        sImage.bGeoreferenced = false;
+        sImage.osSRS.clear();
+        lumo::support::WriteRaster(Path("image.tif"), sImage,
+                                   [](int b, int c, int r) { return b == 1 ? c + 0.5 : r + 0.5; });
+        RasterSpec sDem;
+        sDem.nCols = sDem.nRows = 200;
+        sDem.osSRS = "EPSG:4326";
+        const double adfGT[6] = {7.43, 0.0002, 0.0, 46.97, 0.0, -0.0002};
+        std::copy(adfGT, adfGT + 6, sDem.adfGeoTransform);
+        lumo::support::WriteRaster(Path("dem.tif"), sDem, [](int, int c, int r) {
+            return 800.0 + 300.0 * std::sin(c / 20.0) * std::cos(r / 25.0);
+        });
+    }
+
+    static std::unique_ptr<nova::mathmodel::IMathModel> ImageRpcModel(const std::string& osPath) {
+        lumo::cli::RFPtr psRF(lumo::gdal::ReadImageRPC(osPath));
+        return lumo::cli::MakeRpcModelObject(lumo::cli::ShareRFRecord(std::move(psRF)), 600, 500);
+    }
+
+    // Largest difference, in image pixels, between the coordinate bands of
+    // two orthoimages of the coordinate image, away from the footprint's edge.
+    double GeometryDifference(const std::string& osA, const std::string& osB) {
+        int nCols = 0, nRows = 0, nColsB = 0, nRowsB = 0;
+        std::vector<double> adfA[2], adfB[2];
+        for (int b = 0; b < 2; ++b) {
+            adfA[b] = lumo::support::ReadBand(osA, b + 1, &nCols, &nRows);
+            adfB[b] = lumo::support::ReadBand(osB, b + 1, &nColsB, &nRowsB);
+        }
+        EXPECT_EQ(nCols, nColsB);
+        EXPECT_EQ(nRows, nRowsB);
+        double dfWorst = 0.0;
+        int nCompared = 0;
+        for (std::size_t i = 0; i < adfA[0].size(); ++i) {
+            // Two pixels inside the image on both, so no edge pixel counts.
+            const bool bInside = adfA[0][i] > 2 && adfA[0][i] < 598 && adfA[1][i] > 2 &&
+                                 adfA[1][i] < 498 && adfB[0][i] > 2 && adfB[1][i] > 2;
+            if (!bInside) continue;
+            ++nCompared;
+            dfWorst = std::max(
+                {dfWorst, std::fabs(adfA[0][i] - adfB[0][i]), std::fabs(adfA[1][i] - adfB[1][i])});
+        }
+        EXPECT_GT(nCompared, 200000);
+        return dfWorst;
+    }
+};
+
+TEST_F(OrthoTest, MarksOfASimulatedImageLandOnTheirMapPositions) {
+    lumo::sim::SceneParams sParams;
+    sParams.nPixels = sParams.nLines = 320;
+    sParams.dfRollDeg = 15.0;
+    sParams.nUtmZone = 31;
+    const lumo::sim::Scene oScene(sParams);
+    double dfX0 = 0.0, dfY0 = 0.0;
+    ASSERT_TRUE(oScene.ImageToGround(160.0, 160.0, 600.0, &dfX0, &dfY0));
+    DEMPtr poDem(lumo::gdal::OpenFileDEM(WriteHills(dfX0, dfY0), lumo::gdal::FileDEMOptions{}));
+    const lumo::cli::MarkedScene sScene =
+        lumo::cli::MakeMarkedScene(sParams, *poDem, 4, 20, Path("scene.tif"));
+    const nova::mathmodel::LumoMathModel oModel(LUMO_CODE_SRIT, sScene.psModel.get());
+
+    lumo::gdal::OrthoOptions sOptions;
+    const lumo::gdal::OrthoGrid sGrid =
+        lumo::gdal::Orthorectify(Path("scene.tif"), oModel, *poDem, Path("ortho.tif"), sOptions);
+    EXPECT_NEAR(sGrid.adfGeoTransform[1], 5.0, 0.5);  // the model's ground sample distance
+    const lumo::cli::MarkStats sStats = lumo::cli::MeasureMarks(Path("ortho.tif"), sScene);
+    EXPECT_EQ(sStats.nFound, 16);
+    EXPECT_LT(sStats.dfMax, 0.5) << "rms " << sStats.dfRms;
+    RecordProperty("MarkErrorMaxPx", std::to_string(sStats.dfMax));
+}
+
+TEST_F(OrthoTest, GeometryAgreesWithGdalwarpOnTheSameInputs) {
+    WriteRpcScene();
+    const auto poModel = ImageRpcModel(Path("image.tif"));
+    lumo::gdal::FileDEMOptions sDemOptions;
+    // gdalwarp takes heights of a file without vertical CRS as ellipsoidal.
+    sDemOptions.eHeights = lumo::gdal::HeightReference::kEllipsoid;
+    DEMPtr poDem(lumo::gdal::OpenFileDEM(Path("dem.tif"), sDemOptions));
+    lumo::gdal::OrthoOptions sOptions;
+    sOptions.osOutputCRS = "EPSG:32632";
+    const lumo::gdal::OrthoGrid sGrid =
+        lumo::gdal::Orthorectify(Path("image.tif"), *poModel, *poDem, Path("lumo.tif"), sOptions);
+    const double* gt = sGrid.adfGeoTransform;
+    for (const char* pszThreshold : {"0.125", "0"}) {
+        const std::string osCommand = nova::FormatString(
+            "gdalwarp -q -overwrite -rpc -to RPC_DEM=%s -t_srs EPSG:32632 -te %.17g %.17g %.17g "
+            "%.17g -ts %d %d -r bilinear -et %s -dstnodata 0 %s %s",
+            Path("dem.tif").c_str(), gt[0], gt[3] + sGrid.nLines * gt[5],
+            gt[0] + sGrid.nPixels * gt[1], gt[3], sGrid.nPixels, sGrid.nLines, pszThreshold,
+            Path("image.tif").c_str(), Path("gdalwarp.tif").c_str());
+        ASSERT_EQ(std::system(osCommand.c_str()), 0) << osCommand;
+        const double dfDifference = GeometryDifference(Path("lumo.tif"), Path("gdalwarp.tif"));
+        // gdalwarp's own approximation errs up to its threshold; with exact
+        // transformations the two agree to float precision.
+        EXPECT_LT(dfDifference, std::string(pszThreshold) == "0" ? 0.01 : 0.15) << pszThreshold;
+        RecordProperty(std::string("DifferencePxEt") + pszThreshold, std::to_string(dfDifference));
+    }
+}
+
+TEST_F(OrthoTest, CarriesEveryBandAndTypeIntoCloudOptimizedFiles) {
+    WriteRpcScene();
+    RasterSpec sImage;
+    sImage.nCols = 600;
+    sImage.nRows = 500;
+    sImage.nBands = 3;
+    sImage.eType = GDT_UInt16;
+    sImage.bGeoreferenced = false;
+    sImage.osSRS.clear();
+    // A new name: writing over image.tif would remove its sidecar with it.
+    lumo::support::WriteRaster(Path("multi.tif"), sImage, [](int b, int, int) { return 1000 * b; });
+    Write("multi_RPC.TXT", lumo::support::ReadText(Path("image_RPC.TXT")));
+    const auto poModel = ImageRpcModel(Path("multi.tif"));
+    DEMPtr poGeoid(nova::dem::DEMFactory::CreateDEM("geoid", 8));
+    lumo::gdal::OrthoOptions sOptions;
+    sOptions.eResampling = lumo::gdal::Resampling::kNearest;
+    sOptions.bCloudOptimized = true;
+    sOptions.nThreads = 2;
+    double dfLastProgress = -1.0;
+    sOptions.fnProgress = [&](double dfDone) {
+        EXPECT_GE(dfDone, dfLastProgress);
+        dfLastProgress = dfDone;
+        return true;
+    };
+    lumo::gdal::Orthorectify(Path("multi.tif"), *poModel, *poGeoid, Path("cog.tif"), sOptions);
+    EXPECT_DOUBLE_EQ(dfLastProgress, 1.0);
+    const std::string osInfo = lumo::support::RunTool({"info", Path("cog.tif")}).osOut;
+    EXPECT_NE(osInfo.find("3 band(s)"), std::string::npos) << osInfo;
+    EXPECT_NE(osInfo.find("UInt16"), std::string::npos) << osInfo;
+    for (int b = 1; b <= 3; ++b) {
+        int nCols = 0, nRows = 0;
+        const std::vector<double> adf = lumo::support::ReadBand(Path("cog.tif"), b, &nCols, &nRows);
+        const std::size_t nCentre = static_cast<std::size_t>(nRows / 2) * nCols + nCols / 2;
+        EXPECT_EQ(adf[nCentre], 1000.0 * b);
+    }
+    GDALDatasetH hCog = GDALOpen(Path("cog.tif").c_str(), GA_ReadOnly);
+    const char* pszLayout = GDALGetMetadataItem(hCog, "LAYOUT", "IMAGE_STRUCTURE");
+    EXPECT_STREQ(pszLayout, "COG");
+    GDALClose(hCog);
+}
+
+TEST_F(OrthoTest, BadInputFailsNamingItAndLeavesNoFile) {
+    WriteRpcScene();
+    const auto poModel = ImageRpcModel(Path("image.tif"));
+    DEMPtr poDem(lumo::gdal::OpenFileDEM(Path("dem.tif"), lumo::gdal::FileDEMOptions{}));
+    // A truncated copy of the image, and an image without rational polynomials.
+    const std::string osImage = lumo::support::ReadText(Path("image.tif"));
+    Write("truncated.tif", osImage.substr(0, osImage.size() / 3));
+    Write("truncated_RPC.TXT", lumo::support::ReadText(Path("image_RPC.TXT")));
+    const std::string osOutput = Path("out.tif");
+    auto Fails = [&](const std::string& osImagePath, const std::string& osOut,
+                     const lumo::gdal::OrthoOptions& sOptions, const std::string& osNamed) {
+        try {
+            lumo::gdal::Orthorectify(osImagePath, *poModel, *poDem, osOut, sOptions);
+            ADD_FAILURE() << "no failure for " << osNamed;
+        } catch (const nova::Exception& e) {
+            EXPECT_NE(std::string(e.what()).find(osNamed), std::string::npos) << e.what();
+        }
+        for (const auto& oEntry : fs::directory_iterator(mDir)) {
+            EXPECT_EQ(oEntry.path().string().find(".part"), std::string::npos) << oEntry.path();
+        }
+        EXPECT_FALSE(fs::exists(osOutput));
+    };
+    lumo::gdal::OrthoOptions sDefaults;
+    Fails(Path("truncated.tif"), osOutput, sDefaults, "truncated.tif");
+    Fails(Path("missing.tif"), osOutput, sDefaults, "missing.tif");
+    Fails(Path("image.tif"), Path("no/such/dir/out.tif"), sDefaults, "no/such/dir/out.tif");
+    lumo::gdal::OrthoOptions sCancel;
+    sCancel.fnProgress = [](double dfDone) { return dfDone < 0.3; };
+    Fails(Path("image.tif"), osOutput, sCancel, "cancelled");
+    lumo::gdal::OrthoOptions sBadCRS;
+    sBadCRS.osOutputCRS = "EPSG:999999";
+    Fails(Path("image.tif"), osOutput, sBadCRS, "EPSG:999999");
+    lumo::gdal::OrthoOptions sHuge;
+    sHuge.dfResolution = 1e-4;
+    Fails(Path("image.tif"), osOutput, sHuge, "coarser resolution");
+
+    RasterSpec sPlain;
+    sPlain.nCols = sPlain.nRows = 10;
+    lumo::support::WriteRaster(Path("plain.tif"), sPlain, [](int, int, int) { return 1.0; });
+    try {
+        lumo::cli::RFPtr psNone(lumo::gdal::ReadImageRPC(Path("plain.tif")));
+        ADD_FAILURE() << "rational polynomials read from a plain image";
+    } catch (const nova::DataException& e) {
+        EXPECT_NE(std::string(e.what()).find("plain.tif"), std::string::npos) << e.what();
+    }
+}
+
+}  // namespace
