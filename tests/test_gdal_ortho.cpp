@@ -254,4 +254,38 @@ TEST_F(OrthoTest, BadInputFailsNamingItAndLeavesNoFile) {
     }
 }
 
+TEST_F(OrthoTest, ToolWritesOrthoimagesAndNamesWhatIsWrong) {
+    WriteRpcScene();
+    RasterSpec sFar;
+    sFar.nCols = sFar.nRows = 10;
+    sFar.osSRS = "EPSG:4326";
+    const double adfFar[6] = {20.0, 0.01, 0.0, 10.0, 0.0, -0.01};
+    std::copy(adfFar, adfFar + 6, sFar.adfGeoTransform);
+    lumo::support::WriteRaster(Path("far.tif"), sFar, [](int, int, int) { return 5.0; });
+    auto Run = [&](std::vector<std::string> asArgs) {
+        asArgs.insert(asArgs.begin(), {"ortho", Path("image.tif"), Path("out.tif")});
+        return lumo::support::RunTool(asArgs);
+    };
+    const lumo::support::RunResult sOk =
+        Run({"--dem", Path("dem.tif"), "--dem-heights", "ellipsoid", "--crs", "32632"});
+    EXPECT_EQ(sOk.nCode, 0) << sOk.osErr;
+    EXPECT_NE(sOk.osOut.find("wrote"), std::string::npos) << sOk.osOut;
+    EXPECT_TRUE(fs::exists(Path("out.tif")));
+    fs::remove(Path("out.tif"));
+
+    const std::pair<std::vector<std::string>, std::string> aBad[] = {
+        {{"--dem", Path("far.tif")}, "does not cover"},
+        {{"--dem", Path("nodem.tif")}, "nodem.tif: no such file"},
+        {{"--model", Path("nomodel.json")}, "nomodel.json"},
+        {{"--crs", "EPSG:4326+bogus"}, "EPSG:4326+bogus"},
+    };
+    for (const auto& [asArgs, osNamed] : aBad) {
+        const lumo::support::RunResult sRun = Run(asArgs);
+        EXPECT_EQ(sRun.nCode, 1) << osNamed;
+        EXPECT_NE(sRun.osErr.find(osNamed), std::string::npos) << sRun.osErr;
+        EXPECT_FALSE(fs::exists(Path("out.tif"))) << osNamed;
+    }
+    EXPECT_NE(Run({"--resampling", "sharp"}).nCode, 0);
+}
+
 }  // namespace

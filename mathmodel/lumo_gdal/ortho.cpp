@@ -250,6 +250,24 @@ void WriteCloudOptimized(const std::string& osFrom, const std::string& osTo, int
     CloseWritten(poCog, osTo);
 }
 
+// An elevation model that misses the output area entirely would leave every
+// height to the fallback: that is a wrong input, not a detail.
+void CheckCoverage(const detail::OrthoFrame& oFrame, const OrthoGrid& sGrid,
+                   const nova::dem::IRasterDEM& oDem) {
+    constexpr int kSamples = 9;
+    const double* gt = sGrid.adfGeoTransform;
+    for (int j = 0; j < kSamples; ++j) {
+        for (int i = 0; i < kSamples; ++i) {
+            const double dfX = gt[0] + gt[1] * sGrid.nPixels * (i + 0.5) / kSamples;
+            const double dfY = gt[3] + gt[5] * sGrid.nLines * (j + 0.5) / kSamples;
+            if (oFrame.InDemCoverage(dfX, dfY)) return;
+        }
+    }
+    LUMO_GDAL_FAIL(oDem.GetDescription() +
+                   ": the elevation model does not cover the image "
+                   "footprint");
+}
+
 std::string TemporaryName(const std::string& osOutput, const char* pszSuffix) {
     return osOutput + "." + std::to_string(::getpid()) + pszSuffix;
 }
@@ -274,6 +292,7 @@ OrthoGrid Orthorectify(const std::string& osImage, const nova::mathmodel::IMathM
                                                     : 0.0;
 
     auto poFrame = std::make_shared<const detail::OrthoFrame>(oModel, oDem, std::move(poOutputCRS));
+    CheckCoverage(*poFrame, sGrid, oDem);
     auto poRun = std::make_shared<const detail::OrthoRun>(
         poFrame, sGrid.adfGeoTransform, sGrid.nPixels, sGrid.nLines, sOptions.dfErrorThreshold);
     std::unique_ptr<void, void (*)(void*)> poTransformer(detail::CreateOrthoTransformer(poRun),

@@ -212,6 +212,12 @@ bool OrthoFrame::DemPosition(double dfX, double dfY, double& dfDemX, double& dfD
     return true;
 }
 
+bool OrthoFrame::InDemCoverage(double dfX, double dfY) const {
+    double dfDemX = 0.0;
+    double dfDemY = 0.0;
+    return moToDem.Apply(dfX, dfY, dfDemX, dfDemY) && moDem.GetCoverage().Contains(dfDemX, dfDemY);
+}
+
 bool OrthoFrame::HeightAt(double dfX, double dfY, double& dfZ) const {
     double dfDemX = 0.0;
     double dfDemY = 0.0;

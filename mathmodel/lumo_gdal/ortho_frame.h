@@ -50,6 +50,9 @@ class OrthoFrame {
     void HeightsOfGrid(double dfX0, double dfY0, double dfStepX, double dfStepY, int nCols,
                        int nRows, float* pafZ) const;
 
+    // True when an output CRS position lies in the elevation model's coverage.
+    bool InDemCoverage(double dfX, double dfY) const;
+
     // Exact ground (output CRS) to image, at the elevation model's height.
     bool GroundToImage(double dfX, double dfY, double& dfPixel, double& dfLine) const;
     // Exact image to ground (output CRS): the model's ray met with the

@@ -1,0 +1,173 @@
+// Models from image files: rational polynomials read from every carrier GDAL
+// knows agree with the text they came from; polynomials attached to a
+// GeoTIFF are what GDAL's own RPC transformer evaluates; control points and
+// georeferencing come back as stored; `lumo info` shows them.
+
+#include <gtest/gtest.h>
+
+#include <array>
+#include <cmath>
+#include <string>
+#include <vector>
+
+#include <gdal_alg.h>
+
+#include "lumo.h"
+#include "lumo_gdal.h"
+#include "rf_io.h"
+#include "runtime.h"
+#include "support/cli_runner.h"
+#include "support/gdal_rasters.h"
+
+namespace {
+
+using lumo::cli::RFPtr;
+using lumo::support::RasterSpec;
+
+class ImageFileTest : public lumo::support::ScratchDirTest {
+  protected:
+    ImageFileTest() : ScratchDirTest("lumo_gdal_image_") {}
+
+    RFPtr SceneModel() const {
+        const std::string osText =
+            lumo::support::ReadText(LUMO_SOURCE_DIR "/examples/rf_scene_RPC.TXT");
+        return RFPtr(LumoRPCTextToRFInfo(osText.data(), osText.size(), LUMO_RPC_TEXT_AUTO,
+                                         "rf_scene_RPC.TXT"));
+    }
+
+    std::string WriteImage(const std::string& osName) {
+        RasterSpec sSpec;
+        sSpec.nCols = 64;
+        sSpec.nRows = 48;
+        sSpec.bGeoreferenced = false;
+        sSpec.osSRS.clear();
+        lumo::support::WriteRaster(Path(osName), sSpec, [](int, int c, int) { return c; });
+        return Path(osName);
+    }
+};
+
+// Image positions of a ground grid over the model's cube, at three heights.
+std::vector<std::array<double, 3>> GroundGrid(const RFInfo_t& sRF) {
+    std::vector<std::array<double, 3>> aGrid;
+    for (int i = -4; i <= 4; ++i)
+        for (int j = -4; j <= 4; ++j)
+            for (double dfW : {-1.0, 0.0, 1.0})
+                aGrid.push_back({sRF.dfXOffset + 0.2 * i * sRF.dfXScale,
+                                 sRF.dfYOffset + 0.2 * j * sRF.dfYScale,
+                                 sRF.dfZOffset + dfW * sRF.dfZScale});
+    return aGrid;
+}
+
+double LargestImageDifference(RFInfo_t& sA, RFInfo_t& sB) {
+    double dfWorst = 0.0;
+    for (const auto& g : GroundGrid(sA)) {
+        double dfPA = 0, dfLA = 0, dfPB = 0, dfLB = 0;
+        RFGeo2Img(&sA, g[0], g[1], g[2], &dfPA, &dfLA);
+        RFGeo2Img(&sB, g[0], g[1], g[2], &dfPB, &dfLB);
+        dfWorst = std::max({dfWorst, std::fabs(dfPA - dfPB), std::fabs(dfLA - dfLB)});
+    }
+    return dfWorst;
+}
+
+TEST_F(ImageFileTest, ReadsRationalPolynomialsFromEveryCarrier) {
+    RFPtr psTruth = SceneModel();
+    // Sidecars in both text forms, and tags inside a GeoTIFF.
+    WriteImage("txt.tif");
+    Write("txt_RPC.TXT", LumoRFInfoToRPCText(psTruth.get(), LUMO_RPC_TEXT_TXT));
+    WriteImage("rpb.tif");
+    Write("rpb.RPB", LumoRFInfoToRPCText(psTruth.get(), LUMO_RPC_TEXT_RPB));
+    lumo::gdal::AttachRPC(WriteImage("tags.tif"), *psTruth);
+    for (const char* pszName : {"txt.tif", "rpb.tif", "tags.tif"}) {
+        RFPtr psRead(lumo::gdal::ReadImageRPC(Path(pszName)));
+        EXPECT_LT(LargestImageDifference(*psTruth, *psRead), 1e-9) << pszName;
+        EXPECT_TRUE(lumo::gdal::ReadImageInfo(Path(pszName)).bHasRPC) << pszName;
+    }
+    EXPECT_FALSE(lumo::gdal::ReadImageInfo(WriteImage("plain.tif")).bHasRPC);
+}
+
+TEST_F(ImageFileTest, AttachedPolynomialsAreWhatGdalEvaluates) {
+    RFPtr psTruth = SceneModel();
+    const std::string osPath = WriteImage("tags.tif");
+    lumo::gdal::AttachRPC(osPath, *psTruth);
+    GDALDatasetH hDs = GDALOpen(osPath.c_str(), GA_ReadOnly);
+    GDALRPCInfoV2 sInfo{};
+    ASSERT_TRUE(GDALExtractRPCInfoV2(GDALGetMetadata(hDs, "RPC"), &sInfo));
+    GDALClose(hDs);
+    void* pTransformer = GDALCreateRPCTransformerV2(&sInfo, FALSE, 0.0, nullptr);
+    ASSERT_NE(pTransformer, nullptr);
+    double dfWorst = 0.0;
+    for (const auto& g : GroundGrid(*psTruth)) {
+        double dfX = g[0], dfY = g[1], dfZ = g[2];
+        int bOk = FALSE;
+        // Ground to image is the transformer's inverse direction.
+        GDALRPCTransform(pTransformer, TRUE, 1, &dfX, &dfY, &dfZ, &bOk);
+        ASSERT_TRUE(bOk);
+        double dfPixel = 0, dfLine = 0;
+        RFGeo2Img(psTruth.get(), g[0], g[1], g[2], &dfPixel, &dfLine);
+        dfWorst = std::max({dfWorst, std::fabs(dfX - dfPixel), std::fabs(dfY - dfLine)});
+    }
+    GDALDestroyRPCTransformer(pTransformer);
+    EXPECT_LT(dfWorst, 1e-6);
+
+    // Models without an RPC equivalent, and files that are not GeoTIFFs.
+    psTruth->nAdjust = 1;
+    EXPECT_THROW(lumo::gdal::AttachRPC(osPath, *psTruth), nova::DataException);
+    psTruth->nAdjust = 0;
+    RasterSpec sPng;
+    sPng.nCols = sPng.nRows = 8;
+    sPng.eType = GDT_Byte;
+    sPng.osDriver = "BMP";
+    sPng.osSRS.clear();
+    sPng.bGeoreferenced = false;
+    lumo::support::WriteRaster(Path("image.bmp"), sPng, [](int, int, int) { return 1; });
+    try {
+        lumo::gdal::AttachRPC(Path("image.bmp"), *psTruth);
+        ADD_FAILURE() << "attached to a BMP";
+    } catch (const nova::DataException& e) {
+        EXPECT_NE(std::string(e.what()).find("image.bmp"), std::string::npos) << e.what();
+    }
+}
+
+TEST_F(ImageFileTest, ControlPointsAndGeoreferencingComeBackAndInfoShowsThem) {
+    const std::string osPath = WriteImage("gcps.tif");
+    GDALDatasetH hDs = GDALOpen(osPath.c_str(), GA_Update);
+    GDAL_GCP asGCPs[3];
+    GDALInitGCPs(3, asGCPs);
+    const double adfValues[3][5] = {{1.5, 2.5, 500100.0, 5000200.0, 120.0},
+                                    {60.0, 3.0, 500700.0, 5000180.0, 130.0},
+                                    {30.0, 45.0, 500400.0, 4999700.0, 125.0}};
+    for (int i = 0; i < 3; ++i) {
+        asGCPs[i].dfGCPPixel = adfValues[i][0];
+        asGCPs[i].dfGCPLine = adfValues[i][1];
+        asGCPs[i].dfGCPX = adfValues[i][2];
+        asGCPs[i].dfGCPY = adfValues[i][3];
+        asGCPs[i].dfGCPZ = adfValues[i][4];
+    }
+    OGRSpatialReferenceH hSRS = OSRNewSpatialReference(nullptr);
+    OSRImportFromEPSG(hSRS, 32631);
+    GDALSetGCPs2(hDs, 3, asGCPs, hSRS);
+    OSRDestroySpatialReference(hSRS);
+    GDALDeinitGCPs(3, asGCPs);
+    GDALClose(hDs);
+
+    const lumo::gdal::ImageInfo sInfo = lumo::gdal::ReadImageInfo(osPath);
+    EXPECT_EQ(sInfo.nPixels, 64);
+    EXPECT_EQ(sInfo.nLines, 48);
+    ASSERT_EQ(sInfo.asGCPs.size(), 3u);
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(sInfo.asGCPs[i].dfPixel, adfValues[i][0]);
+        EXPECT_EQ(sInfo.asGCPs[i].dfY, adfValues[i][3]);
+        EXPECT_EQ(sInfo.asGCPs[i].dfZ, adfValues[i][4]);
+    }
+    const lumo::support::RunResult sRun = lumo::support::RunTool({"info", osPath});
+    EXPECT_EQ(sRun.nCode, 0) << sRun.osErr;
+    EXPECT_NE(sRun.osOut.find("64 x 48 pixels"), std::string::npos) << sRun.osOut;
+    EXPECT_NE(sRun.osOut.find("gcps: 3 in WGS 84 / UTM zone 31N"), std::string::npos) << sRun.osOut;
+    EXPECT_NE(sRun.osOut.find("rpc: none"), std::string::npos) << sRun.osOut;
+
+    const lumo::support::RunResult sBad = lumo::support::RunTool({"info", Path("none.tif")});
+    EXPECT_EQ(sBad.nCode, 1);
+    EXPECT_NE(sBad.osErr.find("none.tif: no such file"), std::string::npos) << sBad.osErr;
+}
+
+}  // namespace
