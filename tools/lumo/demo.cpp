@@ -13,6 +13,9 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#ifdef LUMO_HAVE_GDAL
+#include "gdal_commands.h"
+#endif
 #include "model_io.h"
 #include "points_io.h"
 #include "transform.h"
@@ -156,7 +159,7 @@ std::string FindExamplesDir() {
     LUMO_CLI_FAIL("examples directory not found (looked in: " + tried + "); set LUMO_EXAMPLES_DIR");
 }
 
-void PrintDemo(const std::string& examplesDir, std::ostream& out) {
+void PrintDemo(const std::string& examplesDir, std::ostream& out, const std::string& outputDir) {
     out << "lumo demo: sample models in " << examplesDir << "\n"
         << "residuals against the control points; round trips on the control points and a "
         << (kGridSteps + 1) << "x" << (kGridSteps + 1) << " image grid\n"
@@ -176,12 +179,21 @@ void PrintDemo(const std::string& examplesDir, std::ostream& out) {
     }
     PrintOrbitDemo(examplesDir, out);
     PrintBlockDemo(examplesDir, out);
+#ifdef LUMO_HAVE_GDAL
+    PrintOrthoDemo(examplesDir, outputDir, out);
+#else
+    static_cast<void>(outputDir);
+#endif
 }
 
 void AddDemoCommand(CLI::App& app, CommandContext& context) {
     CLI::App* command =
         app.add_subcommand("demo", "Evaluate the sample models both ways and print their errors");
-    command->callback([&context] { PrintDemo(FindExamplesDir(), context.out); });
+    auto outputDir = std::make_shared<std::string>(".");
+    command->add_option("--output-dir", *outputDir,
+                        "where the demo's orthoimage and quick-look go (default: here)");
+    command->callback(
+        [&context, outputDir] { PrintDemo(FindExamplesDir(), context.out, *outputDir); });
 }
 
 }  // namespace lumo::cli

@@ -48,7 +48,9 @@ DemoResult RunFamilyDemo(const FamilyDemo& demo, const std::string& examplesDir)
 // Throws naming every place looked at when none exists.
 std::string FindExamplesDir();
 
-// Runs every family demo and prints the table to `out`.
-void PrintDemo(const std::string& examplesDir, std::ostream& out);
+// Runs every family demo and prints the table to `out`; files the demo
+// writes (the orthoimage and its quick-look) go to outputDir.
+void PrintDemo(const std::string& examplesDir, std::ostream& out,
+               const std::string& outputDir = ".");
 
 }  // namespace lumo::cli

@@ -2,6 +2,7 @@
 // component.
 #pragma once
 
+#include <iosfwd>
 #include <string>
 
 #include "nova/dem.h"
@@ -19,5 +20,10 @@ void AddElevationOptions(CLI::App& command, std::string& dem, std::string& heigh
 // level, else an elevation file whose heights are measured as --dem-heights
 // says ("file": as the file declares, mean sea level when it does not).
 nova::dem::DEMPtr OpenElevation(const std::string& dem, const std::string& heights);
+
+// `lumo demo`'s orthoimage row; writes the orthoimage and its PNG quick-look
+// into outputDir.
+void PrintOrthoDemo(const std::string& examplesDir, const std::string& outputDir,
+                    std::ostream& out);
 
 }  // namespace lumo::cli

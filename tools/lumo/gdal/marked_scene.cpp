@@ -1,5 +1,6 @@
 #include "marked_scene.h"
 
+#include <algorithm>
 #include <cmath>
 #include <stdexcept>
 #include <vector>
@@ -14,8 +15,13 @@ namespace {
 
 // Marks are Gaussian spots of this standard deviation, in image pixels.
 constexpr double kMarkSigmaPixels = 1.5;
-constexpr double kBackground = 100.0;
 constexpr double kMarkPeak = 1000.0;
+// Hill shading: brightness of flat ground, its range, and the light from the
+// north-west, 45 degrees up.
+constexpr double kShadeBase = 60.0;
+constexpr double kShadeRange = 120.0;
+constexpr double kShadeStep = 10.0;         // metres, for the slope
+constexpr double kShadeExaggeration = 3.0;  // of the slopes, so gentle hills show
 // Half size of the window in which a mark's centroid is measured, in
 // output pixels: beyond four standard deviations of a mark.
 constexpr int kWindowHalf = 6;
@@ -61,6 +67,25 @@ SritPtr FitRigorousModel(const lumo::sim::Scene& oScene, int nGcps) {
     return psModel;
 }
 
+// Ground brightness from the terrain's slope towards the light.
+lumo::sim::RadianceFn HillShade(const nova::dem::IRasterDEM& oDem) {
+    return [&oDem](double dfX, double dfY) {
+        double dfE = 0.0, dfW = 0.0, dfN = 0.0, dfS = 0.0;
+        if (!oDem.GetHeight(dfX + kShadeStep, dfY, dfE) ||
+            !oDem.GetHeight(dfX - kShadeStep, dfY, dfW) ||
+            !oDem.GetHeight(dfX, dfY + kShadeStep, dfN) ||
+            !oDem.GetHeight(dfX, dfY - kShadeStep, dfS)) {
+            return kShadeBase;
+        }
+        const double dfGx = kShadeExaggeration * (dfE - dfW) / (2 * kShadeStep);
+        const double dfGy = kShadeExaggeration * (dfN - dfS) / (2 * kShadeStep);
+        // Unit normal (-gx, -gy, 1) against the light (-1, 1, sqrt 2) / 2.
+        const double dfLight =
+            (dfGx - dfGy + std::sqrt(2.0)) / (2.0 * std::sqrt(1.0 + dfGx * dfGx + dfGy * dfGy));
+        return kShadeBase + kShadeRange * std::max(0.0, dfLight);
+    };
+}
+
 }  // namespace
 
 MarkedScene MakeMarkedScene(const lumo::sim::SceneParams& sParams,
@@ -71,7 +96,7 @@ MarkedScene MakeMarkedScene(const lumo::sim::SceneParams& sParams,
         return oDem.GetHeight(dfX, dfY, *pdfZ);
     };
     MarkedScene sScene;
-    sScene.dfBackground = kBackground;
+    sScene.fnGround = HillShade(oDem);
     // Marks where the image sees the terrain at a grid of image positions.
     for (int j = 0; j < nMarksPerSide; ++j) {
         for (int i = 0; i < nMarksPerSide; ++i) {
@@ -85,9 +110,12 @@ MarkedScene MakeMarkedScene(const lumo::sim::SceneParams& sParams,
         }
     }
     const double dfSigma = kMarkSigmaPixels * sParams.dfIFOV * (sParams.dfOrbitRadius - 6378137.0);
+    const lumo::sim::RadianceFn fnMarks =
+        lumo::sim::MarkedGround(sScene.asMarks, dfSigma, 0.0, kMarkPeak);
+    const lumo::sim::RadianceFn& fnGround = sScene.fnGround;
     std::vector<float> afImage = lumo::sim::RenderImage(
         oScene, fnTerrain,
-        lumo::sim::MarkedGround(sScene.asMarks, dfSigma, kBackground, kMarkPeak));
+        [&](double dfX, double dfY) { return fnGround(dfX, dfY) + fnMarks(dfX, dfY); });
     WriteFloatImage(osImagePath, sParams.nPixels, sParams.nLines, afImage);
     sScene.psModel = FitRigorousModel(oScene, nGcps);
     return sScene;
@@ -123,10 +151,13 @@ MarkStats MeasureMarks(const std::string& osOrtho, const MarkedScene& sScene) {
             for (int c = 0; c < nSide; ++c) {
                 const double dfValue = adfWindow[r * nSide + c];
                 if (dfValue == dfNoData || std::isnan(dfValue)) continue;
-                const double dfWeight = std::max(0.0, dfValue - sScene.dfBackground);
+                const double dfC = nCol0 + c + 0.5;
+                const double dfR = nRow0 + r + 0.5;
+                const double dfGround = sScene.fnGround(gt[0] + dfC * gt[1], gt[3] + dfR * gt[5]);
+                const double dfWeight = std::max(0.0, dfValue - dfGround);
                 dfSum += dfWeight;
-                dfSumC += dfWeight * (nCol0 + c + 0.5);
-                dfSumR += dfWeight * (nRow0 + r + 0.5);
+                dfSumC += dfWeight * dfC;
+                dfSumR += dfWeight * dfR;
             }
         }
         if (!(dfSum > 0.0)) continue;

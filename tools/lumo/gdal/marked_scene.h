@@ -17,13 +17,14 @@ namespace lumo::cli {
 struct MarkedScene {
     std::vector<lumo::sim::GroundMark> asMarks;  // map positions in the scene's UTM zone
     SritPtr psModel;                             // fitted to exact control points
-    double dfBackground = 0.0;                   // brightness of unmarked ground
+    lumo::sim::RadianceFn fnGround;              // brightness of the ground without marks
 };
 
 // Renders the scene's image over oDem (whose CRS must be the scene's UTM
 // zone; its heights are taken as the scene's) into osImagePath, a Float32
-// GeoTIFF, with nMarksPerSide x nMarksPerSide marks spread over the image,
-// and fits the rigorous model to nGcps exact control points.
+// GeoTIFF: hill-shaded ground with nMarksPerSide x nMarksPerSide bright marks
+// spread over the image. Fits the rigorous model to nGcps exact control
+// points. oDem must outlive the result.
 MarkedScene MakeMarkedScene(const lumo::sim::SceneParams& sParams,
                             const nova::dem::IRasterDEM& oDem, int nMarksPerSide, int nGcps,
                             const std::string& osImagePath);
@@ -36,7 +37,8 @@ struct MarkStats {
 };
 
 // Distances, in output pixels, between each mark's brightness centroid in an
-// orthoimage (first band, same CRS as the marks) and its map position.
+// orthoimage (first band, same CRS as the marks) and its map position. The
+// known ground brightness is taken out first, so only the marks weigh.
 MarkStats MeasureMarks(const std::string& osOrtho, const MarkedScene& sScene);
 
 }  // namespace lumo::cli
