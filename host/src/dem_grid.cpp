@@ -105,7 +105,7 @@ class NodeReader {
   public:
     explicit NodeReader(const TileCache& oCache) : moCache(oCache) {}
 
-    float Value(int nCol, int nRow) {
+    const float& Value(int nCol, int nRow) {
         const int nTileCol = nCol / kTileSize;
         const int nTileRow = nRow / kTileSize;
         if (!mpoTile || nTileCol != mnTileCol || nTileRow != mnTileRow) {
@@ -115,6 +115,27 @@ class NodeReader {
         }
         return (*mpoTile)[static_cast<std::size_t>(nRow % kTileSize) * kTileSize +
                           static_cast<std::size_t>(nCol % kTileSize)];
+    }
+
+    // The four nodes around a position: top-left, top-right, bottom-left,
+    // bottom-right. Mostly within one tile, read with a single lookup.
+    void Quad(int nCol0, int nRow0, int nCol1, int nRow1, float* pafOut) {
+        const int nTileCol = nCol0 / kTileSize;
+        const int nTileRow = nRow0 / kTileSize;
+        if (nCol1 / kTileSize != nTileCol || nRow1 / kTileSize != nTileRow) {
+            pafOut[0] = Value(nCol0, nRow0);
+            pafOut[1] = Value(nCol1, nRow0);
+            pafOut[2] = Value(nCol0, nRow1);
+            pafOut[3] = Value(nCol1, nRow1);
+            return;
+        }
+        const float* pafTop = &Value(nCol0, nRow0);
+        const std::ptrdiff_t nRight = nCol1 - nCol0;
+        const std::ptrdiff_t nDown = static_cast<std::ptrdiff_t>(nRow1 - nRow0) * kTileSize;
+        pafOut[0] = pafTop[0];
+        pafOut[1] = pafTop[nRight];
+        pafOut[2] = pafTop[nDown];
+        pafOut[3] = pafTop[nDown + nRight];
     }
 
   private:
@@ -191,8 +212,14 @@ class GridDEM final : public IRasterDEM {
         const int nRow1 = std::min(nRow0 + 1, msLayout.nRows - 1);
         const double dfS = dfCol - nCol0;
         const double dfT = dfRow - nRow0;
-        const float afValue[4] = {oNodes.Value(nCol0, nRow0), oNodes.Value(nCol1, nRow0),
-                                  oNodes.Value(nCol0, nRow1), oNodes.Value(nCol1, nRow1)};
+        float afValue[4];
+        oNodes.Quad(nCol0, nRow0, nCol1, nRow1, afValue);
+        if (!std::isnan(afValue[0] + afValue[1] + afValue[2] + afValue[3])) {
+            const double dfTop = afValue[0] + dfS * (afValue[1] - afValue[0]);
+            const double dfBottom = afValue[2] + dfS * (afValue[3] - afValue[2]);
+            dfHeight = dfTop + dfT * (dfBottom - dfTop);
+            return true;
+        }
         const double adfWeight[4] = {(1 - dfS) * (1 - dfT), dfS * (1 - dfT), (1 - dfS) * dfT,
                                      dfS * dfT};
         double dfSum = 0.0;

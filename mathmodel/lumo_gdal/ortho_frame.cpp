@@ -236,7 +236,9 @@ void OrthoFrame::HeightsOfGrid(double dfX0, double dfY0, double dfStepX, double 
     const bool bDirect = moToDem.IsIdentity() && mdfShiftSign == 0.0;
     const std::vector<int> anLatticeCols = LatticePositions(nCols);
     const std::vector<int> anLatticeRows = LatticePositions(nRows);
+    const std::size_t nLatticeCols = anLatticeCols.size();
     std::vector<LatticeNode> asLattice;
+    std::vector<LatticeSpan> asColSpans;
     if (!bDirect) {
         for (int nRow : anLatticeRows) {
             for (int nCol : anLatticeCols) {
@@ -246,59 +248,52 @@ void OrthoFrame::HeightsOfGrid(double dfX0, double dfY0, double dfStepX, double 
                 asLattice.push_back(sNode);
             }
         }
+        for (int nCol = 0; nCol < nCols; ++nCol) asColSpans.push_back(SpanOf(anLatticeCols, nCol));
     }
-    const std::size_t nLatticeCols = anLatticeCols.size();
+    std::vector<LatticeNode> asRowNodes(nLatticeCols);  // lattice blended to the current row
     std::vector<double> adfX(static_cast<std::size_t>(nCols));
     std::vector<double> adfY(adfX.size());
-    std::vector<double> adfShift(adfX.size());
+    std::vector<double> adfShift(adfX.size(), 0.0);
     std::vector<double> adfHeight(adfX.size());
-    std::size_t nCell = 0;
     for (int nRow = 0; nRow < nRows; ++nRow) {
         const double dfY = dfY0 + nRow * dfStepY;
-        const LatticeSpan sRows = SpanOf(anLatticeRows, nRow);
-        for (int nCol = 0; nCol < nCols; ++nCol) {
-            const double dfX = dfX0 + nCol * dfStepX;
-            adfShift[nCol] = 0.0;
-            if (bDirect) {
-                adfX[nCol] = dfX;
+        if (bDirect) {
+            for (int nCol = 0; nCol < nCols; ++nCol) {
+                adfX[nCol] = dfX0 + nCol * dfStepX;
                 adfY[nCol] = dfY;
-                continue;
             }
-            const LatticeSpan sCols = SpanOf(anLatticeCols, nCol);
-            const LatticeNode* apsNode[4] = {&asLattice[sRows.n0 * nLatticeCols + sCols.n0],
-                                             &asLattice[sRows.n0 * nLatticeCols + sCols.n1],
-                                             &asLattice[sRows.n1 * nLatticeCols + sCols.n0],
-                                             &asLattice[sRows.n1 * nLatticeCols + sCols.n1]};
-            const bool bAllOk =
-                apsNode[0]->bOk && apsNode[1]->bOk && apsNode[2]->bOk && apsNode[3]->bOk;
-            if (!bAllOk) {
-                // Near a failing node: compute this point exactly.
-                if (!DemPosition(dfX, dfY, adfX[nCol], adfY[nCol], adfShift[nCol])) {
+        } else {
+            const LatticeSpan sRows = SpanOf(anLatticeRows, nRow);
+            for (std::size_t i = 0; i < nLatticeCols; ++i) {
+                const LatticeNode& sA = asLattice[sRows.n0 * nLatticeCols + i];
+                const LatticeNode& sB = asLattice[sRows.n1 * nLatticeCols + i];
+                const double dfT = sRows.dfWeight;
+                asRowNodes[i] = {sA.dfDemX + dfT * (sB.dfDemX - sA.dfDemX),
+                                 sA.dfDemY + dfT * (sB.dfDemY - sA.dfDemY),
+                                 sA.dfShift + dfT * (sB.dfShift - sA.dfShift), sA.bOk && sB.bOk};
+            }
+            for (int nCol = 0; nCol < nCols; ++nCol) {
+                const LatticeSpan& sCols = asColSpans[nCol];
+                const LatticeNode& sA = asRowNodes[sCols.n0];
+                const LatticeNode& sB = asRowNodes[sCols.n1];
+                if (sA.bOk && sB.bOk) {
+                    const double dfS = sCols.dfWeight;
+                    adfX[nCol] = sA.dfDemX + dfS * (sB.dfDemX - sA.dfDemX);
+                    adfY[nCol] = sA.dfDemY + dfS * (sB.dfDemY - sA.dfDemY);
+                    adfShift[nCol] = sA.dfShift + dfS * (sB.dfShift - sA.dfShift);
+                } else if (!DemPosition(dfX0 + nCol * dfStepX, dfY, adfX[nCol], adfY[nCol],
+                                        adfShift[nCol])) {
+                    // Near a failing node the point is computed exactly.
                     adfX[nCol] = std::numeric_limits<double>::quiet_NaN();
                 }
-                continue;
             }
-            const double dfS = sCols.dfWeight;
-            const double dfT = sRows.dfWeight;
-            const double adfW[4] = {(1 - dfS) * (1 - dfT), dfS * (1 - dfT), (1 - dfS) * dfT,
-                                    dfS * dfT};
-            double dfDemX = 0.0;
-            double dfDemY = 0.0;
-            double dfShift = 0.0;
-            for (int k = 0; k < 4; ++k) {
-                dfDemX += adfW[k] * apsNode[k]->dfDemX;
-                dfDemY += adfW[k] * apsNode[k]->dfDemY;
-                dfShift += adfW[k] * apsNode[k]->dfShift;
-            }
-            adfX[nCol] = dfDemX;
-            adfY[nCol] = dfDemY;
-            adfShift[nCol] = dfShift;
         }
         moDem.GetHeights(nCols, adfX.data(), adfY.data(), adfHeight.data());
-        for (int nCol = 0; nCol < nCols; ++nCol, ++nCell) {
-            pafZ[nCell] = adfHeight[nCol] == nova::dem::kNoHeight
-                              ? std::numeric_limits<float>::quiet_NaN()
-                              : static_cast<float>(adfHeight[nCol] + adfShift[nCol]);
+        float* pafRow = pafZ + static_cast<std::size_t>(nRow) * nCols;
+        for (int nCol = 0; nCol < nCols; ++nCol) {
+            pafRow[nCol] = adfHeight[nCol] == nova::dem::kNoHeight
+                               ? std::numeric_limits<float>::quiet_NaN()
+                               : static_cast<float>(adfHeight[nCol] + adfShift[nCol]);
         }
     }
 }
