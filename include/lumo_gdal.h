@@ -91,7 +91,8 @@ struct ImageInfo {
     double adfGeoTransform[6] = {0, 1, 0, 0, 0, 1};
     bool bHasRPC = false;
     std::vector<ImageGCP> asGCPs;
-    std::string osGCPCRS;  // WKT of the control points' CRS
+    std::string osGCPCRS;      // WKT of the control points' CRS
+    std::string osGCPCRSCode;  // its "AUTHORITY:CODE" ("EPSG:32631") when it has one
 };
 
 // Size, bands, georeferencing, whether it carries rational polynomials, and

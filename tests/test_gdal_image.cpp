@@ -165,6 +165,14 @@ TEST_F(ImageFileTest, ControlPointsAndGeoreferencingComeBackAndInfoShowsThem) {
     EXPECT_NE(sRun.osOut.find("gcps: 3 in WGS 84 / UTM zone 31N"), std::string::npos) << sRun.osOut;
     EXPECT_NE(sRun.osOut.find("rpc: none"), std::string::npos) << sRun.osOut;
 
+    // The stored points fit a model in their own CRS, over the image's size.
+    const lumo::support::RunResult sFit = lumo::support::RunTool(
+        {"fit", "--model", "poly", "--gcps", osPath, "-o", Path("poly.json")});
+    EXPECT_EQ(sFit.nCode, 0) << sFit.osErr;
+    const std::string osModel = lumo::support::ReadText(Path("poly.json"));
+    EXPECT_NE(osModel.find("\"UTM 31 D000\""), std::string::npos) << osModel;
+    EXPECT_NE(osModel.find("\"pixels\": 64"), std::string::npos) << osModel;
+
     const lumo::support::RunResult sBad = lumo::support::RunTool({"info", Path("none.tif")});
     EXPECT_EQ(sBad.nCode, 1);
     EXPECT_NE(sBad.osErr.find("none.tif: no such file"), std::string::npos) << sBad.osErr;

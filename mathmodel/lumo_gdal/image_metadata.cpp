@@ -124,7 +124,15 @@ ImageInfo ReadImageInfo(const std::string& osPath) {
     sInfo.bHasGeoTransform = GDALGetGeoTransform(hDataset, sInfo.adfGeoTransform) == CE_None;
     sInfo.bHasRPC = GDALGetMetadata(hDataset, kRpcDomain) != nullptr;
     sInfo.asGCPs = ReadGCPs(hDataset);
-    sInfo.osGCPCRS = detail::WktOf(GDALGetGCPSpatialRef(hDataset));
+    OGRSpatialReferenceH hGcpSRS = GDALGetGCPSpatialRef(hDataset);
+    sInfo.osGCPCRS = detail::WktOf(hGcpSRS);
+    if (hGcpSRS != nullptr) {
+        const char* pszAuthority = OSRGetAuthorityName(hGcpSRS, nullptr);
+        const char* pszCode = OSRGetAuthorityCode(hGcpSRS, nullptr);
+        if (pszAuthority != nullptr && pszCode != nullptr) {
+            sInfo.osGCPCRSCode = std::string(pszAuthority) + ":" + pszCode;
+        }
+    }
     return sInfo;
 }
 

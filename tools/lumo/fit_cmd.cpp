@@ -16,6 +16,7 @@
 
 #include "cli_error.h"
 #include "commands.h"
+#include "control_points.h"
 #include "fit_refine.h"
 #include "geosys_option.h"
 #include "lrs_io.h"
@@ -298,17 +299,22 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     }
     const RefineOptions refine =
         options.osRefine.empty() ? RefineOptions{} : ParseRefine(options.osRefine);
-    PointSet gcps = ReadPointsFile(options.osGcps, PointKind::ControlPoint);
+    // Control points stored in an image bring their CRS and the image size.
+    ControlPointSource source = ReadControlPointSource(options.osGcps);
+    PointSet& gcps = source.sPoints;
     NoteDisabledPoints(gcps, "lumo fit", context.err);
     if (gcps.asPoints.empty()) LUMO_CLI_FAIL(options.osGcps + ": holds no control points");
+    FitOptions given = options;
+    if (given.nPixels < 0) given.nPixels = source.nPixels;
+    if (given.nLines < 0) given.nLines = source.nLines;
     if (options.osModel == "rf") {
         ApplyHeights(gcps, options.sPoints, true, "the rational function model");
         RFFitOptions rf;
         rf.osRpc = options.osRpc;
         if (!options.osAdjust.empty()) rf.osAdjust = options.osAdjust;
         rf.osOutput = options.osOutput;
-        rf.nPixels = options.nPixels;
-        rf.nLines = options.nLines;
+        rf.nPixels = given.nPixels;
+        rf.nLines = given.nLines;
         rf.sPoints = options.sPoints;
         rf.sPoints.osGeosys = options.osGeosys;
         rf.sRefine = refine;
@@ -351,7 +357,7 @@ void RunFit(const FitOptions& options, CommandContext& context) {
     if (!residuals.anDropped.empty()) c = ToArrays(KeptPoints(gcps, residuals));
     int nPixels = 0;
     int nLines = 0;
-    ImageSize(options, c, nPixels, nLines);
+    ImageSize(given, c, nPixels, nLines);
 
     nlohmann::json document;
     if (options.osModel == "poly") {
@@ -401,7 +407,9 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
                      "rf: image-space adjustment fitted to the control points: shift (1 point "
                      "or more), affine (3; the default) or second (second order, 6)")
         ->check(CLI::IsMember({"shift", "affine", "second"}));
-    command->add_option("--gcps", options->osGcps, "control points (CSV with pixel,line,x,y)")
+    command
+        ->add_option("--gcps", options->osGcps,
+                     "control points: CSV with pixel,line,x,y[,z], or an image that stores them")
         ->required();
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
         ->check(CLI::Range(1, GCP_MAX_ORDER));

@@ -18,6 +18,7 @@
 #include "gdal_commands.h"
 #include "lumo_gdal.h"
 #include "model_object.h"
+#include "points_io.h"
 #include "progress.h"
 #include "rf_io.h"
 
@@ -97,9 +98,10 @@ void RunOrtho(OrthoCommandOptions& options, CommandContext& context) {
         lumo::gdal::Orthorectify(options.osImage, *model, *dem, options.osOutput, ortho);
     const double seconds =
         std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+    const nova::ogc::CRSPtr crs(nova::ogc::utils::CreateCRSFromDefinition(grid.osCRS));
     context.out << "wrote " << options.osOutput << ": " << grid.nPixels << " x " << grid.nLines
-                << " pixels of " << grid.adfGeoTransform[1] << " units, "
-                << image.aosBandTypes.size() << " band(s), in " << seconds << " s\n";
+                << " pixels of " << grid.adfGeoTransform[1] << " in " << crs->GetName() << ", "
+                << image.aosBandTypes.size() << " band(s), in " << FormatDouble(seconds) << " s\n";
 }
 
 }  // namespace
