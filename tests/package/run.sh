@@ -7,9 +7,18 @@ SOURCE_DIR="$(cd "$(dirname "${BASH_SOURCE[0]}")" && pwd)"
 WORK="$(mktemp -d)"
 trap 'rm -rf "$WORK"' EXIT
 cmake --install "$BUILD_DIR" --prefix "$WORK/prefix" >/dev/null
+# liblumo itself never depends on GDAL (only the optional lumo_gdal does).
+LIBLUMO="$(find "$WORK/prefix" -name 'liblumo.so' | head -n 1)"
+if readelf -d "$LIBLUMO" | grep -q 'NEEDED.*gdal'; then
+  echo "liblumo depends on GDAL" >&2
+  exit 1
+fi
 cmake -S "$SOURCE_DIR" -B "$WORK/build" -DCMAKE_PREFIX_PATH="$WORK/prefix" >/dev/null
 cmake --build "$WORK/build" >/dev/null
 LD_LIBRARY_PATH="$WORK/prefix/lib:$WORK/prefix/lib64:${LD_LIBRARY_PATH:-}" "$WORK/build/consumer"
+if [[ -x "$WORK/build/consumer_gdal" ]]; then
+  LD_LIBRARY_PATH="$WORK/prefix/lib:$WORK/prefix/lib64:${LD_LIBRARY_PATH:-}" "$WORK/build/consumer_gdal"
+fi
 PKG_CONFIG_PATH="$(dirname "$(find "$WORK/prefix" -name lumo.pc)")"
 export PKG_CONFIG_PATH
 # shellcheck disable=SC2046
