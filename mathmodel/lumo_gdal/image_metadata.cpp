@@ -51,7 +51,8 @@ std::string MetadataToRpcText(CSLConstList papszMetadata) {
         std::istringstream oValues(pszValue);
         std::string osValue;
         for (int i = 1; oValues >> osValue; ++i) {
-            osText += osKey + "_" + std::to_string(i) + ": " + osValue + "\n";
+            osText.append(osKey).append("_").append(std::to_string(i)).append(": ");
+            osText.append(osValue).append("\n");
         }
     }
     return osText;
@@ -74,12 +75,15 @@ std::vector<std::string> RpcTextToMetadata(const std::string& osText) {
         const std::string osBase = osKey.substr(0, nUnderscore);
         if (nUnderscore != std::string::npos && IsCoefficientKey(osBase)) {
             std::string& osList = oCoefficients[osBase];
-            osList += (osList.empty() ? "" : " ") + osValue;
+            if (!osList.empty()) osList += ' ';
+            osList += osValue;
         } else {
-            aosItems.push_back(osKey + "=" + osValue);
+            aosItems.push_back(osKey.append("=").append(osValue));
         }
     }
-    for (const auto& [osKey, osList] : oCoefficients) aosItems.push_back(osKey + "=" + osList);
+    for (const auto& [osKey, osList] : oCoefficients) {
+        aosItems.push_back(std::string(osKey).append("=").append(osList));
+    }
     return aosItems;
 }
 
@@ -160,6 +164,7 @@ void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF) {
                        osDriver + ")");
     }
     std::vector<char*> apszItems;
+    apszItems.reserve(aosItems.size() + 1);
     for (const std::string& osItem : aosItems)
         apszItems.push_back(const_cast<char*>(osItem.c_str()));
     apszItems.push_back(nullptr);

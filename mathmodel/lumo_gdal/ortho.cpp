@@ -284,7 +284,7 @@ OrthoGrid Orthorectify(const std::string& osImage, const nova::mathmodel::IMathM
     DatasetPtr poSource = detail::OpenRaster(osImage);
     const SourceBands sBands = ReadSourceBands(poSource.get());
     nova::ogc::CRSPtr poOutputCRS;
-    const OrthoGrid sGrid =
+    OrthoGrid sGrid =
         detail::PlanGrid(oModel, GDALGetRasterXSize(poSource.get()),
                          GDALGetRasterYSize(poSource.get()), oDem, sOptions, poOutputCRS);
     const double dfNoData = sOptions.bHasNoData     ? sOptions.dfNoData

@@ -67,7 +67,7 @@ class RunRegistry {
         for (auto it = moRuns.begin(); it != moRuns.end();) {
             it = it->second.expired() ? moRuns.erase(it) : std::next(it);
         }
-        const std::string osKey = std::to_string(++mnNext);
+        std::string osKey = std::to_string(++mnNext);
         moRuns[osKey] = poRun;
         return osKey;
     }
