@@ -242,6 +242,20 @@ TEST_F(OrthoTest, BadInputFailsNamingItAndLeavesNoFile) {
     lumo::gdal::OrthoOptions sHuge;
     sHuge.dfResolution = 1e-4;
     Fails(Path("image.tif"), osOutput, sHuge, "coarser resolution");
+    // A model that maps no image point to the ground has no footprint.
+    lumo::cli::RFPtr psBroken(lumo::gdal::ReadImageRPC(Path("image.tif")));
+    psBroken->dfXScale = 0.0;
+    const auto poBroken =
+        lumo::cli::MakeRpcModelObject(lumo::cli::ShareRFRecord(std::move(psBroken)), 600, 500);
+    lumo::gdal::OrthoOptions sUtm;
+    sUtm.osOutputCRS = "EPSG:32632";
+    try {
+        lumo::gdal::Orthorectify(Path("image.tif"), *poBroken, *poDem, osOutput, sUtm);
+        ADD_FAILURE() << "orthorectified without a footprint";
+    } catch (const nova::DataException& e) {
+        EXPECT_NE(std::string(e.what()).find("footprint cannot be computed"), std::string::npos)
+            << e.what();
+    }
 
     RasterSpec sPlain;
     sPlain.nCols = sPlain.nRows = 10;

@@ -159,9 +159,6 @@ OrthoGrid PlanGrid(const nova::mathmodel::IMathModel& oModel, int nImagePixels, 
         poOutput = UtmZoneOf(dfLon, dfLat);
     }
     const OrthoFrame oFrame(oModel, oDem, nova::ogc::CRSPtr(poOutput->Clone()));
-    const double dfRes = sOptions.dfResolution > 0.0
-                             ? sOptions.dfResolution
-                             : GroundSampleDistance(oFrame, nImagePixels, nImageLines);
     Box sBox;
     if (sOptions.bHasExtent) {
         sBox.Add(sOptions.adfExtent[0], sOptions.adfExtent[1]);
@@ -182,6 +179,9 @@ OrthoGrid PlanGrid(const nova::mathmodel::IMathModel& oModel, int nImagePixels, 
                 sBox.nPoints, nTried, oDem.GetDescription().c_str()));
         }
     }
+    const double dfRes = sOptions.dfResolution > 0.0
+                             ? sOptions.dfResolution
+                             : GroundSampleDistance(oFrame, nImagePixels, nImageLines);
     OrthoGrid sGrid;
     const double dfMinX = std::floor(sBox.dfMinX / dfRes) * dfRes;
     const double dfMaxY = std::ceil(sBox.dfMaxY / dfRes) * dfRes;
