@@ -13,12 +13,16 @@
 #include <string>
 #include <vector>
 
+#include <gdal_alg.h>
+
 #include "lumo.h"
 #include "lumo_gdal.h"
 #include "marked_scene.h"
 #include "model_object.h"
 #include "rf_io.h"
+#include "rpc_fit.h"
 #include "runtime.h"
+#include "srit_io.h"
 #include "support/cli_runner.h"
 #include "support/gdal_rasters.h"
 
@@ -83,9 +87,12 @@ class OrthoTest : public lumo::support::ScratchDirTest {
         });
     }
 
-    static std::unique_ptr<nova::mathmodel::IMathModel> ImageRpcModel(const std::string& osPath) {
+    static std::unique_ptr<nova::mathmodel::IMathModel> ImageRpcModel(const std::string& osPath,
+                                                                      int nPixels = 600,
+                                                                      int nLines = 500) {
         lumo::cli::RFPtr psRF(lumo::gdal::ReadImageRPC(osPath));
-        return lumo::cli::MakeRpcModelObject(lumo::cli::ShareRFRecord(std::move(psRF)), 600, 500);
+        return lumo::cli::MakeRpcModelObject(lumo::cli::ShareRFRecord(std::move(psRF)), nPixels,
+                                             nLines);
     }
 
     // Largest difference, in image pixels, between the coordinate bands of
@@ -115,7 +122,37 @@ class OrthoTest : public lumo::support::ScratchDirTest {
     }
 };
 
-TEST_F(OrthoTest, MarksOfASimulatedImageLandOnTheirMapPositions) {
+// Largest distance, in pixels, between the image positions of a model and
+// those GDAL's own RPC transformer gives from the image's rational
+// polynomials, over the raster and the heights (above the ellipsoid).
+double RpcDisagreement(const nova::mathmodel::IMathModel& oModel, const std::string& osImage,
+                       int nSize, const std::vector<double>& adfHeights) {
+    GDALDatasetH hDs = GDALOpen(osImage.c_str(), GA_ReadOnly);
+    GDALRPCInfoV2 sInfo{};
+    EXPECT_TRUE(GDALExtractRPCInfoV2(GDALGetMetadata(hDs, "RPC"), &sInfo));
+    GDALClose(hDs);
+    void* pTransformer = GDALCreateRPCTransformerV2(&sInfo, FALSE, 0.0, nullptr);
+    const lumo::cli::EllipsoidalGround oGround(oModel);
+    double dfWorst = 0.0;
+    for (double dfHeight : adfHeights) {
+        for (int j = 0; j <= 16; ++j) {
+            for (int i = 0; i <= 16; ++i) {
+                const double dfPixel = 0.5 + (nSize - 1.0) * i / 16,
+                             dfLine = 0.5 + (nSize - 1.0) * j / 16;
+                double dfX = 0.0, dfY = 0.0, dfZ = dfHeight;
+                int bOk = FALSE;
+                EXPECT_TRUE(oGround.Map(dfPixel, dfLine, dfHeight, dfX, dfY));
+                GDALRPCTransform(pTransformer, TRUE, 1, &dfX, &dfY, &dfZ, &bOk);
+                EXPECT_TRUE(bOk);
+                dfWorst = std::max(dfWorst, std::hypot(dfX - dfPixel, dfY - dfLine));
+            }
+        }
+    }
+    GDALDestroyRPCTransformer(pTransformer);
+    return dfWorst;
+}
+
+TEST_F(OrthoTest, MarksLandOnTheirMapPositionsThroughTheModelAndItsExportedPolynomials) {
     lumo::sim::SceneParams sParams;
     sParams.nPixels = sParams.nLines = 320;
     sParams.dfRollDeg = 15.0;
@@ -128,14 +165,31 @@ TEST_F(OrthoTest, MarksOfASimulatedImageLandOnTheirMapPositions) {
         lumo::cli::MakeMarkedScene(sParams, *poDem, 4, 20, Path("scene.tif"));
     const nova::mathmodel::LumoMathModel oModel(LUMO_CODE_SRIT, sScene.psModel.get());
 
-    lumo::gdal::OrthoOptions sOptions;
-    const lumo::gdal::OrthoGrid sGrid =
-        lumo::gdal::Orthorectify(Path("scene.tif"), oModel, *poDem, Path("ortho.tif"), sOptions);
-    EXPECT_NEAR(sGrid.adfGeoTransform[1], 5.0, 0.5);  // the model's ground sample distance
-    const lumo::cli::MarkStats sStats = lumo::cli::MeasureMarks(Path("ortho.tif"), sScene);
-    EXPECT_EQ(sStats.nFound, 16);
-    EXPECT_LT(sStats.dfMax, 0.5) << "rms " << sStats.dfRms;
-    RecordProperty("MarkErrorMaxPx", std::to_string(sStats.dfMax));
+    // The rigorous model, then its rational polynomials fitted over the
+    // hills' heights (200 to 1000 m above sea level, some 50 m more above
+    // the ellipsoid) and read back by the ortho run from the image's sidecar.
+    std::ofstream(Path("srit.json")) << lumo::cli::SritToJson(*sScene.psModel).dump();
+    const lumo::support::RunResult sFit = lumo::support::RunTool(
+        {"rpc", "--fit", Path("srit.json"), Path("scene.RPB"), "--heights", "150", "1150"});
+    ASSERT_EQ(sFit.nCode, 0) << sFit.osErr;
+    const double dfGdal =
+        RpcDisagreement(oModel, Path("scene.tif"), 320, {150.0, 500.0, 800.0, 1150.0});
+    EXPECT_LT(dfGdal, 0.01);
+    RecordProperty("GdalRpcVersusModelMaxPx", std::to_string(dfGdal));
+    const auto poRpc = ImageRpcModel(Path("scene.tif"), 320, 320);
+    const std::vector<const nova::mathmodel::IMathModel*> apoModels = {&oModel, poRpc.get()};
+    for (const nova::mathmodel::IMathModel* poModel : apoModels) {
+        lumo::gdal::OrthoOptions sOptions;
+        sOptions.osOutputCRS = "EPSG:32631";
+        const lumo::gdal::OrthoGrid sGrid = lumo::gdal::Orthorectify(
+            Path("scene.tif"), *poModel, *poDem, Path("ortho.tif"), sOptions);
+        EXPECT_NEAR(sGrid.adfGeoTransform[1], 5.0, 0.5);  // the model's ground sample distance
+        const lumo::cli::MarkStats sStats = lumo::cli::MeasureMarks(Path("ortho.tif"), sScene);
+        EXPECT_EQ(sStats.nFound, 16);
+        EXPECT_LT(sStats.dfMax, 0.5) << "rms " << sStats.dfRms;
+        RecordProperty(poModel == &oModel ? "MarkErrorMaxPxRigorous" : "MarkErrorMaxPxRpc",
+                       std::to_string(sStats.dfMax));
+    }
 }
 
 TEST_F(OrthoTest, GeometryAgreesWithGdalwarpOnTheSameInputs) {

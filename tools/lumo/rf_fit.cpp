@@ -117,8 +117,7 @@ void RunRFFit(PointSet& gcps, const RFFitOptions& options, CommandContext& conte
     }
     const int nPixels = options.nPixels >= 0 ? options.nPixels : model.nPixels;
     const int nLines = options.nLines >= 0 ? options.nLines : model.nLines;
-    WriteFileReplacing(options.osOutput,
-                       RFModelContents(psRF, form, nPixels, nLines, model.aoFields));
+    WriteRFModel(psRF, form, options.osOutput, nPixels, nLines, model.aoFields);
     NoteDroppedRPCFields(model.aoFields, form, options.osOutput, "lumo fit", context.err);
     context.out << "fitted rf adjustment " << options.osAdjust << " to " << kept.Count()
                 << " control points\nresiduals before (all " << c.Count() << " points): " << before

@@ -10,6 +10,10 @@
 
 #include "cli_error.h"
 
+#ifdef LUMO_HAVE_GDAL
+#include "lumo_gdal.h"
+#endif
+
 namespace lumo::cli {
 namespace {
 
@@ -82,8 +86,8 @@ std::string BinaryBlock(RFInfo_t* psRF) {
 std::string RFOutputForm(const std::string& to, const std::string& outputPath) {
     if (!to.empty()) {
         const std::string form = Lower(to);
-        if (form != "txt" && form != "rpb" && form != "bin" && form != "json") {
-            LUMO_CLI_FAIL("--to " + Quoted(to) + ": must be txt, rpb, bin or json");
+        if (form != "txt" && form != "rpb" && form != "bin" && form != "json" && form != "tif") {
+            LUMO_CLI_FAIL("--to " + Quoted(to) + ": must be txt, rpb, bin, json or tif");
         }
         return form;
     }
@@ -92,8 +96,9 @@ std::string RFOutputForm(const std::string& to, const std::string& outputPath) {
     if (extension == ".rpb") return "rpb";
     if (extension == ".json") return "json";
     if (extension == ".bin" || extension == ".rf") return "bin";
+    if (extension == ".tif" || extension == ".tiff") return "tif";
     LUMO_CLI_FAIL(outputPath + ": cannot tell the output form from the extension " +
-                  Quoted(extension) + "; give --to txt, rpb, bin or json");
+                  Quoted(extension) + "; give --to txt, rpb, bin, json or tif");
 }
 
 RFModelInput ReadRFModelAnyForm(const std::string& path) {
@@ -120,11 +125,28 @@ std::string RFModelContents(RFInfo_t* psRF, const std::string& form, int nPixels
 void NoteDroppedRPCFields(const std::vector<LumoRPCField>& fields, const std::string& form,
                           const std::string& outputPath, const std::string& prefix,
                           std::ostream& err) {
-    if (fields.empty() || form != "bin") return;
+    if (fields.empty() || (form != "bin" && form != "tif")) return;
     std::string keys;
     for (const LumoRPCField& field : fields) keys += (keys.empty() ? "" : ", ") + field.osKey;
-    err << prefix << ": note: the binary block has no room for " << keys << "; " << outputPath
+    err << prefix << ": note: "
+        << (form == "bin" ? "the binary block" : "the GeoTIFF's RPC metadata")
+        << " has no room for " << keys << "; " << outputPath
         << " does not keep them (a .json, .txt or .rpb output does)\n";
+}
+
+void WriteRFModel(RFInfo_t* psRF, const std::string& form, const std::string& path, int nPixels,
+                  int nLines, const std::vector<LumoRPCField>& fields) {
+    if (form != "tif") {
+        WriteFileReplacing(path, RFModelContents(psRF, form, nPixels, nLines, fields));
+        return;
+    }
+#ifdef LUMO_HAVE_GDAL
+    // Goes through the RPC text writer: an adjustment is folded in exactly
+    // as in the text forms, or the model is refused.
+    lumo::gdal::AttachRPC(path, *psRF);
+#else
+    LUMO_CLI_FAIL(path + ": attaching rational polynomials to a GeoTIFF needs the GDAL component");
+#endif
 }
 
 }  // namespace lumo::cli
