@@ -77,7 +77,12 @@ TEST_F(ImageFileTest, ReadsRationalPolynomialsFromEveryCarrier) {
     WriteImage("rpb.tif");
     Write("rpb.RPB", LumoRFInfoToRPCText(psTruth.get(), LUMO_RPC_TEXT_RPB));
     lumo::gdal::AttachRPC(WriteImage("tags.tif"), *psTruth);
-    for (const char* pszName : {"txt.tif", "rpb.tif", "tags.tif"}) {
+    WriteImage("tool.tif");
+    ASSERT_EQ(lumo::support::RunTool(
+                  {"rpc", LUMO_SOURCE_DIR "/examples/rf_scene_RPC.TXT", Path("tool.tif")})
+                  .nCode,
+              0);
+    for (const char* pszName : {"txt.tif", "rpb.tif", "tags.tif", "tool.tif"}) {
         RFPtr psRead(lumo::gdal::ReadImageRPC(Path(pszName)));
         EXPECT_LT(LargestImageDifference(*psTruth, *psRead), 1e-9) << pszName;
         EXPECT_TRUE(lumo::gdal::ReadImageInfo(Path(pszName)).bHasRPC) << pszName;
