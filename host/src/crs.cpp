@@ -30,11 +30,7 @@ constexpr const char* kWGS84EllipsoidalCode = "4979";
 // Longest piece of a user text quoted in an error message.
 constexpr std::size_t kQuotedTextLength = 80;
 
-struct PjDeleter {
-    void operator()(PJ* poPj) const { proj_destroy(poPj); }
-};
-using PjPtr = std::unique_ptr<PJ, PjDeleter>;
-
+using detail::PJPtr;
 [[noreturn]] void ThrowParameter(const char* pszName, const std::string& osMessage,
                                  const char* pszFunction, int nLine) {
     throw ParameterException(pszName, 1, "", "", osMessage, kSourceFile, pszFunction, nLine);
@@ -84,7 +80,7 @@ class ProjCRS final : public cs::ICRS {
 };
 
 int AxisCount(PJ_CONTEXT* poCtx, const PJ* poCrs) {
-    PjPtr poCs(proj_crs_get_coordinate_system(poCtx, poCrs));
+    PJPtr poCs(proj_crs_get_coordinate_system(poCtx, poCrs));
     return poCs ? proj_cs_get_axis_count(poCtx, poCs.get()) : 0;
 }
 
@@ -106,13 +102,13 @@ void Classify(PJ_CONTEXT* poCtx, const PJ* poCrs, CRSDescription& sOut) {
             sOut.eVertical = cs::CS_VD_Orthometric;
             break;
         case PJ_TYPE_BOUND_CRS: {
-            PjPtr poBase(proj_get_source_crs(poCtx, poCrs));
+            PJPtr poBase(proj_get_source_crs(poCtx, poCrs));
             if (poBase) Classify(poCtx, poBase.get(), sOut);
             break;
         }
         case PJ_TYPE_COMPOUND_CRS: {
-            PjPtr poHorizontal(proj_crs_get_sub_crs(poCtx, poCrs, 0));
-            PjPtr poVertical(proj_crs_get_sub_crs(poCtx, poCrs, 1));
+            PJPtr poHorizontal(proj_crs_get_sub_crs(poCtx, poCrs, 0));
+            PJPtr poVertical(proj_crs_get_sub_crs(poCtx, poCrs, 1));
             if (poHorizontal) Classify(poCtx, poHorizontal.get(), sOut);
             if (poVertical) Classify(poCtx, poVertical.get(), sOut);
             sOut.bCompound = true;
@@ -144,7 +140,7 @@ bool IsHorizontal2D(PJ_CONTEXT* poCtx, const PJ* poCrs) {
         case PJ_TYPE_PROJECTED_CRS:
             return AxisCount(poCtx, poCrs) == 2;
         case PJ_TYPE_BOUND_CRS: {
-            PjPtr poBase(proj_get_source_crs(poCtx, poCrs));
+            PJPtr poBase(proj_get_source_crs(poCtx, poCrs));
             return poBase && IsHorizontal2D(poCtx, poBase.get());
         }
         default:
@@ -154,17 +150,17 @@ bool IsHorizontal2D(PJ_CONTEXT* poCtx, const PJ* poCrs) {
 
 // The 2-D horizontal part of a CRS: itself, the first member of a compound
 // system, or a 3-D system without its height axis. Null when there is none.
-PjPtr HorizontalPart(PJ_CONTEXT* poCtx, const PJ* poCrs) {
-    if (IsHorizontal2D(poCtx, poCrs)) return PjPtr(proj_clone(poCtx, poCrs));
+PJPtr HorizontalPart(PJ_CONTEXT* poCtx, const PJ* poCrs) {
+    if (IsHorizontal2D(poCtx, poCrs)) return PJPtr(proj_clone(poCtx, poCrs));
     switch (proj_get_type(poCrs)) {
         case PJ_TYPE_COMPOUND_CRS: {
-            PjPtr poFirst(proj_crs_get_sub_crs(poCtx, poCrs, 0));
+            PJPtr poFirst(proj_crs_get_sub_crs(poCtx, poCrs, 0));
             return poFirst ? HorizontalPart(poCtx, poFirst.get()) : nullptr;
         }
         case PJ_TYPE_GEOGRAPHIC_3D_CRS:
         case PJ_TYPE_PROJECTED_CRS:
         case PJ_TYPE_BOUND_CRS: {
-            PjPtr poDemoted(proj_crs_demote_to_2D(poCtx, nullptr, poCrs));
+            PJPtr poDemoted(proj_crs_demote_to_2D(poCtx, nullptr, poCrs));
             if (poDemoted && IsHorizontal2D(poCtx, poDemoted.get())) return poDemoted;
             return nullptr;
         }
@@ -188,8 +184,8 @@ const char* UnitCode(const cs::LinearUnit& oUnit) {
 }
 
 // Horizontal system plus EGM96 heights.
-PjPtr MakeOrthometric(PJ_CONTEXT* poCtx, PJ* poHorizontal, const cs::LinearUnit& oUnit) {
-    PjPtr poVertical(
+PJPtr MakeOrthometric(PJ_CONTEXT* poCtx, PJ* poHorizontal, const cs::LinearUnit& oUnit) {
+    PJPtr poVertical(
         proj_create_from_database(poCtx, "EPSG", kGeoidHeightCode, PJ_CATEGORY_CRS, 0, nullptr));
     if (!poVertical) return nullptr;
     if (!IsMetre(oUnit)) {
@@ -205,7 +201,7 @@ PjPtr MakeOrthometric(PJ_CONTEXT* poCtx, PJ* poHorizontal, const cs::LinearUnit&
     }
     const std::string osName = TextOrEmpty(proj_get_name(poHorizontal)) + " + " +
                                TextOrEmpty(proj_get_name(poVertical.get()));
-    return PjPtr(proj_create_compound_crs(poCtx, osName.c_str(), poHorizontal, poVertical.get()));
+    return PJPtr(proj_create_compound_crs(poCtx, osName.c_str(), poHorizontal, poVertical.get()));
 }
 
 // Sets the unit of the height axis (the third) of a 3-D system given as
@@ -228,15 +224,15 @@ bool SetHeightUnit(nlohmann::json& oCrs, const cs::LinearUnit& oUnit) {
 }
 
 // Horizontal system with ellipsoidal heights: the same system made 3-D.
-PjPtr MakeEllipsoidal(PJ_CONTEXT* poCtx, const PJ* poHorizontal, const cs::LinearUnit& oUnit) {
-    PjPtr poCrs(proj_crs_promote_to_3D(poCtx, nullptr, poHorizontal));
+PJPtr MakeEllipsoidal(PJ_CONTEXT* poCtx, const PJ* poHorizontal, const cs::LinearUnit& oUnit) {
+    PJPtr poCrs(proj_crs_promote_to_3D(poCtx, nullptr, poHorizontal));
     if (!poCrs || IsMetre(oUnit)) return poCrs;
     const char* pszJson = proj_as_projjson(poCtx, poCrs.get(), nullptr);
     if (pszJson == nullptr) return nullptr;
     nlohmann::json oCrs = nlohmann::json::parse(pszJson, nullptr, false);
     if (oCrs.is_discarded() || !SetHeightUnit(oCrs, oUnit)) return nullptr;
     const std::string osJson = oCrs.dump(-1, ' ', false, nlohmann::json::error_handler_t::replace);
-    return PjPtr(proj_create(poCtx, osJson.c_str()));
+    return PJPtr(proj_create(poCtx, osJson.c_str()));
 }
 
 // "EPSG:4326" -> ("EPSG", "4326"); "4326" -> ("EPSG", "4326"). False when
@@ -275,7 +271,7 @@ class CSAuthorityFactory final : public ICSAuthorityFactory {
                            __PRETTY_FUNCTION__, __LINE__);
         }
         PJ_CONTEXT* poCtx = detail::ThreadProjContext();
-        PjPtr poCrs(proj_create_from_database(poCtx, osAuthority.c_str(), osNumber.c_str(),
+        PJPtr poCrs(proj_create_from_database(poCtx, osAuthority.c_str(), osNumber.c_str(),
                                               PJ_CATEGORY_CRS, 0, nullptr));
         if (!poCrs) {
             ThrowParameter("osCode", "Unknown coordinate reference system code " + Quoted(osCode),
@@ -336,12 +332,12 @@ cs::ICRS* ProjInfoToCRS(const ProjInfo_t& sInfo) {
     const std::string osDefinition = detail::ProjInfoToProjDefinition(sInfo);
     if (osDefinition.empty()) return nullptr;
     PJ_CONTEXT* poCtx = detail::ThreadProjContext();
-    PjPtr poCrs(proj_create(poCtx, osDefinition.c_str()));
+    PJPtr poCrs(proj_create(poCtx, osDefinition.c_str()));
     if (!poCrs || proj_is_crs(poCrs.get()) == 0) return nullptr;
     // Systems given by parameters alone are named after their description.
     if (TextOrEmpty(proj_get_name(poCrs.get())) == "unknown") {
         const std::string osText(sInfo.szProj, strnlen(sInfo.szProj, sizeof(sInfo.szProj)));
-        PjPtr poNamed(proj_alter_name(poCtx, poCrs.get(), osText.c_str()));
+        PJPtr poNamed(proj_alter_name(poCtx, poCrs.get(), osText.c_str()));
         if (poNamed) poCrs = std::move(poNamed);
     }
     return MakeCRS(poCtx, poCrs.get(), false);
@@ -349,7 +345,7 @@ cs::ICRS* ProjInfoToCRS(const ProjInfo_t& sInfo) {
 
 cs::ICRS* CreateCRSFromDefinition(const std::string& osDefinition) {
     PJ_CONTEXT* poCtx = detail::ThreadProjContext();
-    PjPtr poCrs(osDefinition.empty() ? nullptr : proj_create(poCtx, osDefinition.c_str()));
+    PJPtr poCrs(osDefinition.empty() ? nullptr : proj_create(poCtx, osDefinition.c_str()));
     if (!poCrs || proj_is_crs(poCrs.get()) == 0) {
         ThrowParameter("osDefinition",
                        "Not a coordinate reference system definition: " + Quoted(osDefinition),
@@ -375,15 +371,15 @@ cs::ICRS* CreateCompoundCS(const cs::ICRS* poHorizontal, DatumType eVertical,
             __PRETTY_FUNCTION__, __LINE__);
     }
     PJ_CONTEXT* poCtx = detail::ThreadProjContext();
-    PjPtr poSource(proj_create(poCtx, poHorizontal->GetDefinition().c_str()));
-    PjPtr poHorizontal2D = poSource ? HorizontalPart(poCtx, poSource.get()) : nullptr;
+    PJPtr poSource(proj_create(poCtx, poHorizontal->GetDefinition().c_str()));
+    PJPtr poHorizontal2D = poSource ? HorizontalPart(poCtx, poSource.get()) : nullptr;
     if (!poHorizontal2D) {
         ThrowParameter(
             "poHorizontal",
             "Not a horizontal coordinate reference system: " + Quoted(poHorizontal->GetName()),
             __PRETTY_FUNCTION__, __LINE__);
     }
-    PjPtr poCompound = eVertical == cs::CS_VD_Orthometric
+    PJPtr poCompound = eVertical == cs::CS_VD_Orthometric
                            ? MakeOrthometric(poCtx, poHorizontal2D.get(), oHeightUnit)
                            : MakeEllipsoidal(poCtx, poHorizontal2D.get(), oHeightUnit);
     if (!poCompound) {

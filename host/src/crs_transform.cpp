@@ -18,16 +18,8 @@ namespace {
 
 constexpr const char* kSourceFile = "host/src/crs_transform.cpp";
 
-struct PjDeleter {
-    void operator()(PJ* poPj) const { proj_destroy(poPj); }
-};
-using PjPtr = std::unique_ptr<PJ, PjDeleter>;
-
-struct ContextDeleter {
-    void operator()(PJ_CONTEXT* poCtx) const { proj_context_destroy(poCtx); }
-};
-using ContextPtr = std::unique_ptr<PJ_CONTEXT, ContextDeleter>;
-
+using detail::ContextPtr;
+using detail::PJPtr;
 struct OperationListDeleter {
     void operator()(PJ_OBJ_LIST* poList) const { proj_list_destroy(poList); }
 };
@@ -60,7 +52,7 @@ struct Sides {
 // keep per-call state.
 class ProjTransform final : public ct::IMathTransform {
   public:
-    ProjTransform(ContextPtr poCtx, PjPtr poOperation, Sides sSides)
+    ProjTransform(ContextPtr poCtx, PJPtr poOperation, Sides sSides)
         : mpoCtx(std::move(poCtx)), mpoOperation(std::move(poOperation)), msSides(sSides) {}
 
     bool TransformPoint(double dfX, double dfY, double dfZ, double& dfOutX, double& dfOutY,
@@ -91,7 +83,7 @@ class ProjTransform final : public ct::IMathTransform {
 
     // Declared before the operation so that the operation goes first.
     ContextPtr mpoCtx;
-    PjPtr mpoOperation;
+    PJPtr mpoOperation;
     Sides msSides;
     mutable std::mutex moMutex;
 };
@@ -138,20 +130,20 @@ bool GeoidModelAvailable(PJ_CONTEXT* poCtx, const PJ* poFrom, const PJ* poTo) {
     if (!poList) return false;
     const int nCount = proj_list_get_count(poList.get());
     for (int i = 0; i < nCount; ++i) {
-        PjPtr poOperation(proj_list_get(poCtx, poList.get(), i));
+        PJPtr poOperation(proj_list_get(poCtx, poList.get(), i));
         if (poOperation && UsesAvailableGrid(poCtx, poOperation.get())) return true;
     }
     return false;
 }
 
-PjPtr CreateOperation(PJ_CONTEXT* poCtx, const PJ* poFrom, const PJ* poTo, double dfAccuracy) {
+PJPtr CreateOperation(PJ_CONTEXT* poCtx, const PJ* poFrom, const PJ* poTo, double dfAccuracy) {
     const std::string osAccuracy = FormatString("ACCURACY=%.17g", dfAccuracy);
     const char* apszOptions[] = {osAccuracy.c_str(), nullptr};
-    PjPtr poOperation(proj_create_crs_to_crs_from_pj(poCtx, poFrom, poTo, nullptr,
+    PJPtr poOperation(proj_create_crs_to_crs_from_pj(poCtx, poFrom, poTo, nullptr,
                                                      dfAccuracy > 0.0 ? apszOptions : nullptr));
     if (!poOperation) return nullptr;
     // Longitude/easting first, whatever the axis order of the definitions.
-    return PjPtr(proj_normalize_for_visualization(poCtx, poOperation.get()));
+    return PJPtr(proj_normalize_for_visualization(poCtx, poOperation.get()));
 }
 
 }  // namespace
@@ -173,14 +165,14 @@ ct::IMathTransform* CreateCRSTransform(const cs::ICRS* poFrom, const cs::ICRS* p
     if (!poCtx) return nullptr;
     proj_context_set_enable_network(poCtx.get(), 0);
 
-    PjPtr poSource(proj_create(poCtx.get(), poFrom->GetDefinition().c_str()));
-    PjPtr poTarget(proj_create(poCtx.get(), poTo->GetDefinition().c_str()));
+    PJPtr poSource(proj_create(poCtx.get(), poFrom->GetDefinition().c_str()));
+    PJPtr poTarget(proj_create(poCtx.get(), poTo->GetDefinition().c_str()));
     if (!poSource || !poTarget) return nullptr;
     if (NeedsGeoidModel(poFrom, poTo) &&
         !GeoidModelAvailable(poCtx.get(), poSource.get(), poTarget.get())) {
         return nullptr;
     }
-    PjPtr poOperation = CreateOperation(poCtx.get(), poSource.get(), poTarget.get(), dfAccuracy);
+    PJPtr poOperation = CreateOperation(poCtx.get(), poSource.get(), poTarget.get(), dfAccuracy);
     if (!poOperation) return nullptr;
     // The systems are no longer needed; the operation stays with its context.
     poSource.reset();

@@ -27,21 +27,13 @@ constexpr int kNodeCols = 1440;  // longitudes -180 to 179.75, wrapping
 constexpr int kNodeRows = 721;   // latitudes 90 down to -90
 constexpr double kDegToRad = M_PI / 180.0;
 
-struct PjDeleter {
-    void operator()(PJ* poPj) const { proj_destroy(poPj); }
-};
-using PjPtr = std::unique_ptr<PJ, PjDeleter>;
-
-struct ContextDeleter {
-    void operator()(PJ_CONTEXT* poCtx) const { proj_context_destroy(poCtx); }
-};
-using ContextPtr = std::unique_ptr<PJ_CONTEXT, ContextDeleter>;
-
+using detail::ContextPtr;
+using detail::PJPtr;
 // A PROJ operation that adds the geoid undulation to a height, with its own
 // context so that any thread may use it. Null when no grid is installed.
 struct GeoidShift {
     ContextPtr poCtx;
-    PjPtr poShift;
+    PJPtr poShift;
 
     static GeoidShift Open() {
         GeoidShift sShift;

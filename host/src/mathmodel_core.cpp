@@ -550,5 +550,38 @@ int GroundToImage(const IMathModel* poModel, int nCols, int nRows, int nGridStep
                          dfStep2, dfTolerance, bFlag);
 }
 
+int PointMathModel::ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
+                                  const float* pafLine, const float* pafZ, float* pafX, float* pafY,
+                                  unsigned char* pabyValid, double dfOriginPixel,
+                                  double dfOriginLine, double dfStepPixel, double dfStepLine,
+                                  double dfTolerance, bool bFlag) const {
+    return mathmodel::ImageToGround(this, nCols, nRows, nGridStep, pafPixel, pafLine, pafZ, pafX,
+                                    pafY, pabyValid, dfOriginPixel, dfOriginLine, dfStepPixel,
+                                    dfStepLine, dfTolerance, bFlag);
+}
+
+int PointMathModel::ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel,
+                                  double* padfX, double* padfY, int* panValid, bool bFlag) const {
+    return mathmodel::ImageToGround(this, dfLine, dfZ, nCount, padfPixel, padfX, padfY, panValid,
+                                    bFlag);
+}
+
+int PointMathModel::GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX,
+                                  const float* pafY, const float* pafZ, float* pafPixel,
+                                  float* pafLine, unsigned char* pabyValid, double dfOriginX,
+                                  double dfOriginY, double dfStepX, double dfStepY,
+                                  double dfTolerance, bool bFlag) const {
+    return mathmodel::GroundToImage(this, nCols, nRows, nGridStep, pafX, pafY, pafZ, pafPixel,
+                                    pafLine, pabyValid, dfOriginX, dfOriginY, dfStepX, dfStepY,
+                                    dfTolerance, bFlag);
+}
+
+int PointMathModel::GroundToImage(double dfY, double dfZ, int nCount, const double* padfX,
+                                  double* padfPixel, double* padfLine, int* panValid,
+                                  bool bFlag) const {
+    return mathmodel::GroundToImage(this, dfY, dfZ, nCount, padfX, padfPixel, padfLine, panValid,
+                                    bFlag);
+}
+
 }  // namespace mathmodel
 }  // namespace nova

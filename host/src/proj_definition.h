@@ -26,11 +26,16 @@ namespace detail {
 // Safe to call from any thread; never throws.
 std::string ProjInfoToProjDefinition(const ProjInfo_t& sInfo);
 
-// Owner of a PROJ object.
+// Owners of PROJ objects and contexts.
 struct PJDeleter {
     void operator()(PJ* pj) const noexcept { proj_destroy(pj); }
 };
 using PJPtr = std::unique_ptr<PJ, PJDeleter>;
+
+struct ContextDeleter {
+    void operator()(PJ_CONTEXT* poCtx) const noexcept { proj_context_destroy(poCtx); }
+};
+using ContextPtr = std::unique_ptr<PJ_CONTEXT, ContextDeleter>;
 
 // The calling thread's PROJ context (created on first use, released when the
 // thread ends). PROJ objects must only be used with the context that made them.

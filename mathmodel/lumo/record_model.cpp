@@ -21,8 +21,11 @@ constexpr const char* kSourceFile = "mathmodel/lumo/record_model.cpp";
                              "nova::mathmodel::CreateRecordMathModel", nLine);
 }
 
-class RecordMathModel final : public IMathModel {
+class RecordMathModel final : public PointMathModel {
   public:
+    using PointMathModel::GroundToImage;
+    using PointMathModel::ImageToGround;
+
     RecordMathModel(int nModelCode, std::shared_ptr<void> poRecord, ogc::CRSPtr poCRS, int nPixels,
                     int nLines)
         : mnModelCode(nModelCode),
@@ -70,33 +73,6 @@ class RecordMathModel final : public IMathModel {
         dfPixel = dfOutPixel;
         dfLine = dfOutLine;
         return 0;
-    }
-    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel, double* padfX,
-                      double* padfY, int* panValid, bool bFlag) const override {
-        return mathmodel::ImageToGround(this, dfLine, dfZ, nCount, padfPixel, padfX, padfY,
-                                        panValid, bFlag);
-    }
-    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfX, double* padfPixel,
-                      double* padfLine, int* panValid, bool bFlag) const override {
-        return mathmodel::GroundToImage(this, dfY, dfZ, nCount, padfX, padfPixel, padfLine,
-                                        panValid, bFlag);
-    }
-    int ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
-                      const float* pafLine, const float* pafZ, float* pafX, float* pafY,
-                      unsigned char* pabyValid, double dfOriginPixel, double dfOriginLine,
-                      double dfStepPixel, double dfStepLine, double dfTolerance,
-                      bool bFlag) const override {
-        return mathmodel::ImageToGround(this, nCols, nRows, nGridStep, pafPixel, pafLine, pafZ,
-                                        pafX, pafY, pabyValid, dfOriginPixel, dfOriginLine,
-                                        dfStepPixel, dfStepLine, dfTolerance, bFlag);
-    }
-    int GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX, const float* pafY,
-                      const float* pafZ, float* pafPixel, float* pafLine, unsigned char* pabyValid,
-                      double dfOriginX, double dfOriginY, double dfStepX, double dfStepY,
-                      double dfTolerance, bool bFlag) const override {
-        return mathmodel::GroundToImage(this, nCols, nRows, nGridStep, pafX, pafY, pafZ, pafPixel,
-                                        pafLine, pabyValid, dfOriginX, dfOriginY, dfStepX, dfStepY,
-                                        dfTolerance, bFlag);
     }
 
   private:

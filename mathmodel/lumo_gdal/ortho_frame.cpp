@@ -32,8 +32,11 @@ nova::ogc::CRSPtr WithEllipsoidalHeights(const nova::ogc::cs::ICRS& oCrs) {
 }
 
 // The model with its ground positions in another CRS. Borrows the model.
-class ReprojectedModel final : public IMathModel {
+class ReprojectedModel final : public nova::mathmodel::PointMathModel {
   public:
+    using PointMathModel::GroundToImage;
+    using PointMathModel::ImageToGround;
+
     ReprojectedModel(const IMathModel& oModel, const nova::ogc::cs::ICRS& oOutput)
         : moModel(oModel),
           mpoCRS(nova::ogc::utils::CreateCompoundCS(
@@ -73,33 +76,6 @@ class ReprojectedModel final : public IMathModel {
         double dfMY = 0.0;
         if (!moToModel.Apply(dfX, dfY, dfMX, dfMY)) return -1;
         return moModel.GroundToImage(dfMX, dfMY, dfZ, dfPixel, dfLine, bFlag);
-    }
-    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel, double* padfX,
-                      double* padfY, int* panValid, bool bFlag) const override {
-        return nova::mathmodel::ImageToGround(this, dfLine, dfZ, nCount, padfPixel, padfX, padfY,
-                                              panValid, bFlag);
-    }
-    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfX, double* padfPixel,
-                      double* padfLine, int* panValid, bool bFlag) const override {
-        return nova::mathmodel::GroundToImage(this, dfY, dfZ, nCount, padfX, padfPixel, padfLine,
-                                              panValid, bFlag);
-    }
-    int ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
-                      const float* pafLine, const float* pafZ, float* pafX, float* pafY,
-                      unsigned char* pabyValid, double dfOriginPixel, double dfOriginLine,
-                      double dfStepPixel, double dfStepLine, double dfTolerance,
-                      bool bFlag) const override {
-        return nova::mathmodel::ImageToGround(
-            this, nCols, nRows, nGridStep, pafPixel, pafLine, pafZ, pafX, pafY, pabyValid,
-            dfOriginPixel, dfOriginLine, dfStepPixel, dfStepLine, dfTolerance, bFlag);
-    }
-    int GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX, const float* pafY,
-                      const float* pafZ, float* pafPixel, float* pafLine, unsigned char* pabyValid,
-                      double dfOriginX, double dfOriginY, double dfStepX, double dfStepY,
-                      double dfTolerance, bool bFlag) const override {
-        return nova::mathmodel::GroundToImage(this, nCols, nRows, nGridStep, pafX, pafY, pafZ,
-                                              pafPixel, pafLine, pabyValid, dfOriginX, dfOriginY,
-                                              dfStepX, dfStepY, dfTolerance, bFlag);
     }
 
   private:

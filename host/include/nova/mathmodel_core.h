@@ -144,5 +144,34 @@ int GroundToImage(const IMathModel* poModel, int nCols, int nRows, int nGridStep
                   float* pafOut2, unsigned char* pabyValid, double dfOrigin1, double dfOrigin2,
                   double dfStep1, double dfStep2, double dfTolerance, bool bFlag);
 
+// A math model defined by its point operations: its array and block
+// operations are the host's evaluators above, called with the model itself.
+// Models that wrap records or other models derive from it and implement the
+// rest of the interface.
+class PointMathModel : public IMathModel {
+  public:
+    using IMathModel::GroundToImage;
+    using IMathModel::ImageToGround;
+
+    int ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
+                      const float* pafLine, const float* pafZ, float* pafX, float* pafY,
+                      unsigned char* pabyValid, double dfOriginPixel, double dfOriginLine,
+                      double dfStepPixel, double dfStepLine, double dfTolerance,
+                      bool bFlag) const override;
+    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel, double* padfX,
+                      double* padfY, int* panValid, bool bFlag) const override;
+    int GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX, const float* pafY,
+                      const float* pafZ, float* pafPixel, float* pafLine, unsigned char* pabyValid,
+                      double dfOriginX, double dfOriginY, double dfStepX, double dfStepY,
+                      double dfTolerance, bool bFlag) const override;
+    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfX, double* padfPixel,
+                      double* padfLine, int* panValid, bool bFlag) const override;
+
+  protected:
+    PointMathModel() = default;
+    PointMathModel(const PointMathModel&) = default;
+    PointMathModel& operator=(const PointMathModel&) = default;
+};
+
 }  // namespace mathmodel
 }  // namespace nova
