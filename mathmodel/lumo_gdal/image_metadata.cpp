@@ -153,9 +153,15 @@ RFInfo_t* ReadImageRPC(const std::string& osPath) {
 }
 
 void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF) {
-    // The text writer refuses models without an RPC equivalent.
-    const std::vector<std::string> aosItems =
-        RpcTextToMetadata(LumoRFInfoToRPCText(&sRF, LUMO_RPC_TEXT_TXT));
+    // Through the text writer: an image-space adjustment is folded in as in
+    // the text forms, and models without an RPC equivalent are refused.
+    std::string osText;
+    try {
+        osText = LumoRFInfoToRPCText(&sRF, LUMO_RPC_TEXT_TXT);
+    } catch (const nova::DataException& e) {
+        LUMO_GDAL_FAIL(osGeoTiff + ": " + e.what());
+    }
+    const std::vector<std::string> aosItems = RpcTextToMetadata(osText);
     DatasetPtr poDataset = detail::OpenRaster(osGeoTiff, true);
     const std::string osDriver = GDALGetDriverShortName(GDALGetDatasetDriver(poDataset.get()));
     if (osDriver != "GTiff") {
