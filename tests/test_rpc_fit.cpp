@@ -20,14 +20,15 @@ class RpcFitTest : public lumo::support::ScratchDirTest {
 };
 
 TEST_F(RpcFitTest, FitsEverySampleModelWithinItsShape) {
-    // Rigorous and rational models are smooth enough for a cubic ratio to
-    // follow them to thousandths of a pixel; a spline through control points
-    // and a frame camera with lens distortion only to hundredths.
-    const std::pair<const char*, double> aCases[] = {{"srit_spot5_roll20.json", 0.02},
-                                                     {"poly_utm31.json", 1e-3},
-                                                     {"rf_scene.json", 1e-3},
-                                                     {"tps_utm31.json", 0.1},
-                                                     {"ap_frame_utm31.json", 0.2}};
+    // Rigorous, radar and rational models are smooth enough for a cubic
+    // ratio to follow them to thousandths of a pixel; a spline through
+    // control points and a frame camera with lens distortion only to
+    // hundredths; a scanner whose swath spans thousands of kilometres only
+    // to a few pixels.
+    const std::pair<const char*, double> aCases[] = {
+        {"srit_spot5_roll20.json", 0.02}, {"poly_utm31.json", 1e-3},    {"rf_scene.json", 1e-3},
+        {"tps_utm31.json", 0.1},          {"ap_frame_utm31.json", 0.2}, {"rtcs_scene.json", 0.01},
+        {"lrs_avhrr_pass.json", 4.0}};
     for (const auto& [pszFile, dfBound] : aCases) {
         const lumo::cli::LoadedModel model =
             lumo::cli::ReadModelFile(std::string(LUMO_SOURCE_DIR "/examples/") + pszFile);
@@ -49,6 +50,14 @@ TEST_F(RpcFitTest, WritesWhatItFittedAndNamesBadRequests) {
     RFInfo_t* psRF = LumoRPCTextToRFInfo(osText.data(), osText.size(), LUMO_RPC_TEXT_TXT, "t");
     EXPECT_NEAR(psRF->dfZOffset, 500.0, 1e-9);
     EXPECT_NEAR(psRF->dfZScale, 500.0, 1e-9);
+    RFDeallocate(psRF);
+    const lumo::support::RunResult sRadar = lumo::support::RunTool(
+        {"rpc", "--fit", LUMO_SOURCE_DIR "/examples/rtcs_scene.json", Path("radar.RPB")});
+    ASSERT_EQ(sRadar.nCode, 0) << sRadar.osErr;
+    EXPECT_NE(sRadar.osOut.find("(rtcs), 1000 x 1000 pixels"), std::string::npos) << sRadar.osOut;
+    const std::string osRpb = lumo::support::ReadText(Path("radar.RPB"));
+    psRF = LumoRPCTextToRFInfo(osRpb.data(), osRpb.size(), LUMO_RPC_TEXT_RPB, "t");
+    EXPECT_NEAR(psRF->dfZOffset, 1000.0, 1e-9);
     RFDeallocate(psRF);
 
     const std::pair<std::vector<std::string>, std::string> aBad[] = {

@@ -18,12 +18,17 @@ struct ObjectKind {
     DatumType eHeights;  // record models only: the heights the family uses
 };
 
+// Model objects take their heights from the record (the radar model's
+// height reference, for instance); their entries' eHeights is not read.
+
 constexpr ObjectKind kObjectKinds[] = {
     {LUMO_CODE_SRIT, true, nova::ogc::cs::CS_VD_Orthometric},
     {LUMO_CODE_POLY, true, nova::ogc::cs::CS_VD_Ellipsoidal},
     {LUMO_CODE_TPS, true, nova::ogc::cs::CS_VD_Ellipsoidal},
     {LUMO_CODE_AP, false, nova::ogc::cs::CS_VD_Orthometric},
     {LUMO_CODE_RF, false, nova::ogc::cs::CS_VD_Ellipsoidal},
+    {LUMO_CODE_RTCS, true, nova::ogc::cs::CS_VD_Ellipsoidal},
+    {LUMO_CODE_LRS, true, nova::ogc::cs::CS_VD_Ellipsoidal},
 };
 
 }  // namespace

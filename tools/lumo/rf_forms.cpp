@@ -85,7 +85,7 @@ std::string BinaryBlock(RFInfo_t* psRF) {
 
 std::string RFOutputForm(const std::string& to, const std::string& outputPath) {
     if (!to.empty()) {
-        const std::string form = Lower(to);
+        std::string form = Lower(to);
         if (form != "txt" && form != "rpb" && form != "bin" && form != "json" && form != "tif") {
             LUMO_CLI_FAIL("--to " + Quoted(to) + ": must be txt, rpb, bin, json or tif");
         }

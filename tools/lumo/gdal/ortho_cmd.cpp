@@ -101,7 +101,7 @@ void RunOrtho(OrthoCommandOptions& options, CommandContext& context) {
     const nova::ogc::CRSPtr crs(nova::ogc::utils::CreateCRSFromDefinition(grid.osCRS));
     context.out << "wrote " << options.osOutput << ": " << grid.nPixels << " x " << grid.nLines
                 << " pixels of " << grid.adfGeoTransform[1] << " in " << crs->GetName() << ", "
-                << image.aosBandTypes.size() << " band(s), in " << FormatDouble(seconds) << " s\n";
+                << image.aosBandTypes.size() << " band(s), in " << FormatShort(seconds) << " s\n";
 }
 
 }  // namespace
