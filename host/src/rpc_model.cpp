@@ -111,7 +111,7 @@ RpcMathModel::RpcMathModel(const RpcCoefficients& sCoefs, const ogc::cs::ICRS* p
 }
 
 RpcMathModel::RpcMathModel(const RpcMathModel& oOther)
-    : IMathModel(oOther),
+    : PointMathModel(oOther),
       msCoefs(oOther.msCoefs),
       mnPixels(oOther.mnPixels),
       mnLines(oOther.mnLines),
@@ -308,39 +308,6 @@ bool RpcMathModel::IsEqual(const IMathModel* poOther) const {
            std::equal(a.adfLineDen, a.adfLineDen + kRpcTerms, b.adfLineDen) &&
            std::equal(a.adfPixelNum, a.adfPixelNum + kRpcTerms, b.adfPixelNum) &&
            std::equal(a.adfPixelDen, a.adfPixelDen + kRpcTerms, b.adfPixelDen);
-}
-
-int RpcMathModel::ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
-                                const float* pafLine, const float* pafZ, float* pafX, float* pafY,
-                                unsigned char* pabyValid, double dfOriginPixel, double dfOriginLine,
-                                double dfStepPixel, double dfStepLine, double dfTolerance,
-                                bool bFlag) const {
-    return mathmodel::ImageToGround(this, nCols, nRows, nGridStep, pafPixel, pafLine, pafZ, pafX,
-                                    pafY, pabyValid, dfOriginPixel, dfOriginLine, dfStepPixel,
-                                    dfStepLine, dfTolerance, bFlag);
-}
-
-int RpcMathModel::ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel,
-                                double* padfX, double* padfY, int* panValid, bool bFlag) const {
-    return mathmodel::ImageToGround(this, dfLine, dfZ, nCount, padfPixel, padfX, padfY, panValid,
-                                    bFlag);
-}
-
-int RpcMathModel::GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX,
-                                const float* pafY, const float* pafZ, float* pafPixel,
-                                float* pafLine, unsigned char* pabyValid, double dfOriginX,
-                                double dfOriginY, double dfStepX, double dfStepY,
-                                double dfTolerance, bool bFlag) const {
-    return mathmodel::GroundToImage(this, nCols, nRows, nGridStep, pafX, pafY, pafZ, pafPixel,
-                                    pafLine, pabyValid, dfOriginX, dfOriginY, dfStepX, dfStepY,
-                                    dfTolerance, bFlag);
-}
-
-int RpcMathModel::GroundToImage(double dfY, double dfZ, int nCount, const double* padfX,
-                                double* padfPixel, double* padfLine, int* panValid,
-                                bool bFlag) const {
-    return mathmodel::GroundToImage(this, dfY, dfZ, nCount, padfX, padfPixel, padfLine, panValid,
-                                    bFlag);
 }
 
 IMathModel* RpcMathModel::Clone() const {

@@ -67,8 +67,11 @@ struct RpcFitReport {
 // box it was fitted over, widened by a tenth of its size on every side
 // (normalised coordinates within +-1.1): outside it a cubic ratio is an
 // extrapolation that cannot be trusted, and both directions fail there.
-class RpcMathModel : public IMathModel {
+class RpcMathModel : public PointMathModel {
   public:
+    using PointMathModel::GroundToImage;
+    using PointMathModel::ImageToGround;
+
     // Throws nova::ParameterException naming the field when an offset or
     // scale is not finite, a scale is zero, a coefficient is not finite or a
     // denominator's constant term is not 1. poCRS is cloned (may be null).
@@ -91,13 +94,6 @@ class RpcMathModel : public IMathModel {
     // and raster size.
     bool IsEqual(const IMathModel* poOther) const override;
 
-    int ImageToGround(int nCols, int nRows, int nGridStep, const float* pafPixel,
-                      const float* pafLine, const float* pafZ, float* pafX, float* pafY,
-                      unsigned char* pabyValid, double dfOriginPixel, double dfOriginLine,
-                      double dfStepPixel, double dfStepLine, double dfTolerance,
-                      bool bFlag) const override;
-    int ImageToGround(double dfLine, double dfZ, int nCount, const double* padfPixel, double* padfX,
-                      double* padfY, int* panValid, bool bFlag) const override;
     // Newton's method on the forward functions from a linear first guess,
     // stopping when a step moves less than 1e-12 (normalised) or after 30
     // steps; the answer is accepted only when projecting it forward lands
@@ -106,12 +102,6 @@ class RpcMathModel : public IMathModel {
     int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
                       bool bFlag) const override;
 
-    int GroundToImage(int nCols, int nRows, int nGridStep, const float* pafX, const float* pafY,
-                      const float* pafZ, float* pafPixel, float* pafLine, unsigned char* pabyValid,
-                      double dfOriginX, double dfOriginY, double dfStepX, double dfStepY,
-                      double dfTolerance, bool bFlag) const override;
-    int GroundToImage(double dfY, double dfZ, int nCount, const double* padfX, double* padfPixel,
-                      double* padfLine, int* panValid, bool bFlag) const override;
     // Failure (-1, outputs -1e20): a non-finite input, a point outside the
     // model's domain, or a denominator that vanishes there.
     int GroundToImage(double dfX, double dfY, double dfZ, double& dfPixel, double& dfLine,
