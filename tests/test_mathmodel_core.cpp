@@ -6,12 +6,15 @@
 #include <atomic>
 #include <cmath>
 #include <cstddef>
+#include <cstring>
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "nova/mathmodel_core.h"
+#include "nova/parallel.h"
 #include "nova/runtime.h"
 #include "support/model_stubs.h"
 #include "support/warnings.h"
@@ -398,4 +401,74 @@ TEST(MathModelCore, ModelExceptionsPropagateAndConcurrentCallsAgree) {
             EXPECT_NEAR(dfY, aoOut[0].afOut2[i], 0.01 + FloatUlp(dfY));
         }
     }
+}
+
+// Splitting across threads changes nothing: outputs, flags and status are the
+// same bit for bit as on one thread, for both forms, with failing points.
+TEST(MathModelCore, ThreadCountDoesNotChangeResults) {
+    SmoothModel oModel;
+    oModel.mdfFailFromPixel = 1703.5;
+    const int nCols = 1800;
+    const int nRows = 700;
+    std::vector<float> afZ = Terrain(nCols, nRows);
+    afZ[400 * nCols + 33] = kNullF;
+    std::vector<double> adfIn(100000);
+    for (std::size_t i = 0; i < adfIn.size(); ++i) adfIn[i] = 0.021 * static_cast<double>(i);
+    struct Run {
+        std::vector<Block> aoBlocks;
+        std::vector<double> adfOut1, adfOut2;
+        std::vector<int> anValid, anResult;
+    };
+    auto Evaluate = [&](int nThreads) {
+        nova::SetEvaluationThreads(nThreads);
+        Run o;
+        for (const auto& [nStep, dfTol] : {std::pair{1, 0.0}, std::pair{32, 0.01}}) {
+            o.aoBlocks.emplace_back(nCols, nRows);
+            Block& b = o.aoBlocks.back();
+            o.anResult.push_back(nm::ImageToGround(
+                &oModel, nCols, nRows, nStep, nullptr, nullptr, afZ.data(), b.afOut1.data(),
+                b.afOut2.data(), b.abyValid.data(), -50.0, -30.0, 1.0, 1.0, dfTol, false));
+        }
+        o.adfOut1.resize(adfIn.size());
+        o.adfOut2.resize(adfIn.size());
+        o.anValid.resize(adfIn.size());
+        o.anResult.push_back(nm::ImageToGround(&oModel, 12.5, 40.0, static_cast<int>(adfIn.size()),
+                                               adfIn.data(), o.adfOut1.data(), o.adfOut2.data(),
+                                               o.anValid.data(), false));
+        return o;
+    };
+    const Run oOne = Evaluate(1);
+    const Run oMany = Evaluate(3);
+    nova::SetEvaluationThreads(0);
+    EXPECT_EQ(std::vector<int>(3, -1), oOne.anResult);
+    EXPECT_EQ(oOne.anResult, oMany.anResult);
+    for (std::size_t k = 0; k < oOne.aoBlocks.size(); ++k) {
+        EXPECT_EQ(0, std::memcmp(oOne.aoBlocks[k].afOut1.data(), oMany.aoBlocks[k].afOut1.data(),
+                                 oOne.aoBlocks[k].Size() * sizeof(float)));
+        EXPECT_EQ(0, std::memcmp(oOne.aoBlocks[k].afOut2.data(), oMany.aoBlocks[k].afOut2.data(),
+                                 oOne.aoBlocks[k].Size() * sizeof(float)));
+        EXPECT_EQ(oOne.aoBlocks[k].abyValid, oMany.aoBlocks[k].abyValid);
+    }
+    EXPECT_EQ(0, std::memcmp(oOne.adfOut1.data(), oMany.adfOut1.data(), adfIn.size() * 8));
+    EXPECT_EQ(0, std::memcmp(oOne.adfOut2.data(), oMany.adfOut2.data(), adfIn.size() * 8));
+    EXPECT_EQ(oOne.anValid, oMany.anValid);
+
+    // A model's exception still reaches the caller from a worker thread.
+    nova::SetEvaluationThreads(4);
+    ThrowingModel oThrowing;
+    std::vector<double> adfX(adfIn.size()), adfY(adfIn.size());
+    EXPECT_THROW(nm::ImageToGround(&oThrowing, 0.0, 0.0, static_cast<int>(adfIn.size()),
+                                   adfIn.data(), adfX.data(), adfY.data(), nullptr, false),
+                 std::runtime_error);
+
+    // Counts outside 0..256 are refused by name and leave the setting alone.
+    WarningCapture oCapture;
+    nova::SetEvaluationThreads(-2);
+    nova::SetEvaluationThreads(257);
+    EXPECT_EQ(4, nova::GetEvaluationThreads());
+    ASSERT_EQ(2u, oCapture.maoReports.size());
+    EXPECT_NE(std::string::npos, oCapture.maoReports[0].osText.find("-2"));
+    EXPECT_NE(std::string::npos, oCapture.maoReports[1].osText.find("257"));
+    nova::SetEvaluationThreads(0);
+    EXPECT_GE(nova::GetEvaluationThreads(), 1);
 }

@@ -6,11 +6,13 @@
 #include "nova/mathmodel_core.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cmath>
 #include <cstddef>
 #include <string>
 #include <vector>
 
+#include "nova/parallel.h"
 #include "nova/runtime.h"
 
 namespace nova {
@@ -29,6 +31,10 @@ constexpr double kHeightDelta = 10.0;
 // Cells narrower than this are evaluated exactly: splitting them further
 // would cost more check evaluations than the points they hold.
 constexpr int kMinSplitSize = 4;
+
+// Fewest points a worker thread is given: below this, starting the thread
+// costs about as much as the points it would take over.
+constexpr std::size_t kMinPointsPerThread = 4096;
 
 enum class Direction { kImageToGround, kGroundToImage };
 
@@ -90,22 +96,27 @@ int EvaluateArray(const IMathModel* poModel, Direction eDir, double dfFixed, dou
         return RejectArguments(eDir, "null coordinate array");
 
     const PointEvaluator oEval(poModel, eDir, bFlag);
-    int nFailed = 0;
-    for (int i = 0; i < nCount; ++i) {
-        double dfOut1 = kMathModelNullValue;
-        double dfOut2 = kMathModelNullValue;
-        // The row's fixed coordinate is the second input in both directions
-        // (line, resp. ground Y).
-        const bool bOk = oEval.Evaluate(padfIn[i], dfFixed, dfZ, dfOut1, dfOut2);
-        if (!bOk) {
-            dfOut1 = kMathModelNullValue;
-            dfOut2 = kMathModelNullValue;
-            ++nFailed;
+    std::atomic<int> nFailed{0};
+    const auto EvaluateRange = [&](std::size_t nBegin, std::size_t nEnd) {
+        int nRangeFailed = 0;
+        for (std::size_t i = nBegin; i < nEnd; ++i) {
+            double dfOut1 = kMathModelNullValue;
+            double dfOut2 = kMathModelNullValue;
+            // The row's fixed coordinate is the second input in both
+            // directions (line, resp. ground Y).
+            const bool bOk = oEval.Evaluate(padfIn[i], dfFixed, dfZ, dfOut1, dfOut2);
+            if (!bOk) {
+                dfOut1 = kMathModelNullValue;
+                dfOut2 = kMathModelNullValue;
+                ++nRangeFailed;
+            }
+            padfOut1[i] = dfOut1;
+            padfOut2[i] = dfOut2;
+            if (panValid != nullptr) panValid[i] = bOk ? 1 : 0;
         }
-        padfOut1[i] = dfOut1;
-        padfOut2[i] = dfOut2;
-        if (panValid != nullptr) panValid[i] = bOk ? 1 : 0;
-    }
+        nFailed += nRangeFailed;
+    };
+    ForEachRange(static_cast<std::size_t>(nCount), kMinPointsPerThread, EvaluateRange);
     return nFailed == 0 ? 0 : -1;
 }
 
@@ -334,8 +345,8 @@ class BlockEvaluator {
         moOut.Set(nCol, nRow, bOk, dfOut1, dfOut2);
     }
 
-    void EvaluateAllExactly(int nCols, int nRows) {
-        for (int nRow = 0; nRow < nRows; ++nRow)
+    void EvaluateRowsExactly(int nCols, int nRowBegin, int nRowEnd) {
+        for (int nRow = nRowBegin; nRow < nRowEnd; ++nRow)
             for (int nCol = 0; nCol < nCols; ++nCol) EvaluatePoint(nCol, nRow);
     }
 
@@ -453,16 +464,19 @@ std::vector<int> GridPositions(int nSize, int nStep) {
     return anPos;
 }
 
-void EvaluateOnGrid(BlockEvaluator& oBlock, int nCols, int nRows, int nGridStep) {
-    const std::vector<int> anCols = GridPositions(nCols, nGridStep);
-    const std::vector<int> anRows = GridPositions(nRows, nGridStep);
+// The cells between the coarse grid's rows nFirst and nLast (positions in
+// anRows). A range starts on its own first row of nodes, so ranges given to
+// different threads share nothing but their inputs.
+void EvaluateGridRows(BlockEvaluator& oBlock, const std::vector<int>& anCols,
+                      const std::vector<int>& anRows, std::size_t nFirst, std::size_t nLast) {
     const std::size_t nNodeCols = anCols.size();
 
     // Two rows of nodes at a time keep the working storage small.
     std::vector<Node> aoUpper(nNodeCols);
     std::vector<Node> aoLower(nNodeCols);
-    for (std::size_t i = 0; i < nNodeCols; ++i) aoUpper[i] = oBlock.MakeNode(anCols[i], anRows[0]);
-    for (std::size_t j = 0; j + 1 < anRows.size(); ++j) {
+    for (std::size_t i = 0; i < nNodeCols; ++i)
+        aoUpper[i] = oBlock.MakeNode(anCols[i], anRows[nFirst]);
+    for (std::size_t j = nFirst; j < nLast; ++j) {
         for (std::size_t i = 0; i < nNodeCols; ++i)
             aoLower[i] = oBlock.MakeNode(anCols[i], anRows[j + 1]);
         const bool bLastRow = j + 2 == anRows.size();
@@ -505,15 +519,39 @@ int EvaluateBlock(const IMathModel* poModel, Direction eDir, int nCols, int nRow
 
     const PointEvaluator oEval(poModel, eDir, bFlag);
     const BlockInput oIn{nCols, pafIn1, pafIn2, pafZ, dfOrigin1, dfOrigin2, dfStep1, dfStep2};
-    BlockOutput oOut{nCols, pafOut1, pafOut2, pabyValid, 0};
     const bool bExactOnly = !(dfTolerance > 0.0) || nGridStep == 1 || nCols < 3 || nRows < 3;
     const bool bHeightDerivative = !bExactOnly && pafZ != nullptr && poModel->IsHeightDependent();
-    BlockEvaluator oBlock(oEval, oIn, oOut, dfTolerance, bHeightDerivative);
-    if (bExactOnly)
-        oBlock.EvaluateAllExactly(nCols, nRows);
-    else
-        EvaluateOnGrid(oBlock, nCols, nRows, nGridStep);
-    return oOut.nFailed == 0 ? 0 : -1;
+
+    // Rows of points (exact evaluation) or rows of grid cells are split
+    // across threads; every point is written by exactly one range.
+    std::atomic<std::size_t> nFailed{0};
+    const auto InRange = [&](auto&& fnWork) {
+        BlockOutput oOut{nCols, pafOut1, pafOut2, pabyValid, 0};
+        BlockEvaluator oBlock(oEval, oIn, oOut, dfTolerance, bHeightDerivative);
+        fnWork(oBlock);
+        nFailed += oOut.nFailed;
+    };
+    const std::size_t nCols64 = static_cast<std::size_t>(nCols);
+    if (bExactOnly) {
+        ForEachRange(static_cast<std::size_t>(nRows), kMinPointsPerThread / nCols64 + 1,
+                     [&](std::size_t nBegin, std::size_t nEnd) {
+                         InRange([&](BlockEvaluator& oBlock) {
+                             oBlock.EvaluateRowsExactly(nCols, static_cast<int>(nBegin),
+                                                        static_cast<int>(nEnd));
+                         });
+                     });
+    } else {
+        const std::vector<int> anCols = GridPositions(nCols, nGridStep);
+        const std::vector<int> anRows = GridPositions(nRows, nGridStep);
+        const std::size_t nPointsPerCellRow = static_cast<std::size_t>(nGridStep) * nCols64;
+        ForEachRange(anRows.size() - 1, kMinPointsPerThread / nPointsPerCellRow + 1,
+                     [&](std::size_t nBegin, std::size_t nEnd) {
+                         InRange([&](BlockEvaluator& oBlock) {
+                             EvaluateGridRows(oBlock, anCols, anRows, nBegin, nEnd);
+                         });
+                     });
+    }
+    return nFailed == 0 ? 0 : -1;
 }
 
 }  // namespace

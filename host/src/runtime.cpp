@@ -91,6 +91,10 @@ void Report(int nCode, int bFatal, const std::string& osDetail) {
         std::lock_guard<std::mutex> oLock(SinkMutex());
         oSink = CurrentSink();
     }
+    // Evaluations split across threads may warn from several at once: the
+    // sink sees one report at a time (recursive, for a sink that reports).
+    static std::recursive_mutex oCallMutex;
+    std::lock_guard<std::recursive_mutex> oCallLock(oCallMutex);
     if (oSink) {
         oSink(sReport);
     } else {

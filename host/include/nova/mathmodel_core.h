@@ -89,6 +89,11 @@ class IMathModel {
 // Value written to the outputs of a point that could not be evaluated.
 constexpr double kMathModelNullValue = -1e20;
 
+// Both forms below split large arrays and blocks across worker threads
+// (nova/parallel.h: at most GetEvaluationThreads(), none for small ones), so
+// the model's const point operations must be safe to call concurrently. The
+// results do not depend on the number of threads.
+
 // Array form: evaluates nCount points of one row through the model's point
 // operation.
 //   dfFixed   the coordinate shared by the row: the line for ImageToGround,

@@ -162,6 +162,8 @@ using ErrorSink = std::function<void(const ErrorReport&)>;
 
 // Replaces the warning sink (null restores the default, standard error) and
 // returns the previous one. Fatal reports are thrown, not sent to the sink.
+// The sink may be called from the worker threads of an evaluation, but never
+// by two threads at once.
 ErrorSink SetErrorSink(ErrorSink sink);
 // Catalogue wording of a message number ("Unknown error" for others).
 const char* ErrorCatalogueText(int code);
