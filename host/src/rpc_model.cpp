@@ -7,6 +7,7 @@
 
 #include "nova/crs.h"
 #include "nova/rpc.h"
+#include "nova/rpc_terms.h"
 #include "nova/runtime.h"
 
 namespace nova {
@@ -24,21 +25,6 @@ constexpr double kSmallestDenominator = 1e-8;
 constexpr int kMaxNewtonSteps = 30;
 constexpr double kNewtonStepTolerance = 1e-12;
 constexpr double kInverseTolerancePixels = 1e-6;
-
-// Derivatives of the terms by L and by P.
-void TermsByL(double L, double P, double H, double* d) {
-    const double z[kRpcTerms] = {0.0,         1.0, 0.0, 0.0,         P,           H,     0.0,
-                                 2.0 * L,     0.0, 0.0, P * H,       3.0 * L * L, P * P, H * H,
-                                 2.0 * L * P, 0.0, 0.0, 2.0 * L * H, 0.0,         0.0};
-    std::copy(z, z + kRpcTerms, d);
-}
-
-void TermsByP(double L, double P, double H, double* d) {
-    const double z[kRpcTerms] = {0.0,   0.0,         1.0,   0.0,   L,           0.0,         H,
-                                 0.0,   2.0 * P,     0.0,   L * H, 0.0,         2.0 * L * P, 0.0,
-                                 L * L, 3.0 * P * P, H * H, 0.0,   2.0 * P * H, 0.0};
-    std::copy(z, z + kRpcTerms, d);
-}
 
 double Dot20(const double* a, const double* b) {
     double s = 0.0;
@@ -71,26 +57,7 @@ void CheckCoefficients(const double* padf, const char* pszName) {
 }  // namespace
 
 void RpcTerms(double L, double P, double H, double* t) {
-    t[0] = 1.0;
-    t[1] = L;
-    t[2] = P;
-    t[3] = H;
-    t[4] = L * P;
-    t[5] = L * H;
-    t[6] = P * H;
-    t[7] = L * L;
-    t[8] = P * P;
-    t[9] = H * H;
-    t[10] = P * L * H;
-    t[11] = L * L * L;
-    t[12] = L * P * P;
-    t[13] = L * H * H;
-    t[14] = L * L * P;
-    t[15] = P * P * P;
-    t[16] = P * H * H;
-    t[17] = L * L * H;
-    t[18] = P * P * H;
-    t[19] = H * H * H;
+    RpcTermValues(L, P, H, t);
 }
 
 RpcMathModel::RpcMathModel(const RpcCoefficients& sCoefs, const ogc::cs::ICRS* poCRS)
@@ -149,8 +116,7 @@ bool EvaluateNormalised(const RpcCoefficients& c, double L, double P, double H, 
 bool Jacobian(const RpcCoefficients& c, double L, double P, double H, double j[2][2]) {
     double t[kRpcTerms], dL[kRpcTerms], dP[kRpcTerms];
     RpcTerms(L, P, H, t);
-    TermsByL(L, P, H, dL);
-    TermsByP(L, P, H, dP);
+    RpcTermDerivatives(L, P, H, dL, dP);
     const double* nums[2] = {c.adfPixelNum, c.adfLineNum};
     const double* dens[2] = {c.adfPixelDen, c.adfLineDen};
     for (int r = 0; r < 2; ++r) {

@@ -13,22 +13,26 @@
 #include "null_value.h"
 #include "projection.h"
 #include "record_check.h"
+#include "rf_common.h"
+#include "rpc_terms.h"
 #include "runtime.h"
+
+using lumo::rf::FromCallerImage;
+using lumo::rf::IsEvaluable;
+using lumo::rf::IsGeographic;
+using lumo::rf::IsPlaceOnEarth;
+using lumo::rf::kMaxNewtonSteps;
+using lumo::rf::kResidualPixels;
+using lumo::rf::kSingularJacobian;
+using lumo::rf::kStepTolerance;
+using lumo::rf::ReportUnusableRecord;
+using lumo::rf::ToCallerImage;
+using lumo::rf::UsableTerms;
+using lumo::rf::WrapLongitude;
 
 namespace {
 
 constexpr const char* kDefaultGeosys = "LON D0";
-constexpr int kMaxNewtonSteps = 20;
-constexpr double kStepTolerance = 1e-5;     // normalised units
-constexpr double kSingularJacobian = 1e-5;  // |det| below this stops the iteration
-// The inverse also stops as soon as the functions map its estimate within
-// this many pixels of the point asked for: a further step changes nothing
-// that matters.
-constexpr double kResidualPixels = 1e-9;
-// A first guess farther than this from the cube's centre (normalised units)
-// is not trusted; the iteration then starts at the centre.
-constexpr double kMaxStartDistance = 10.0;
-
 // The forward transform is the hot loop of orthorectification, the inverse
 // that of georeferencing: on x86-64 Linux both are also built for AVX2/FMA
 // processors and picked at load time.
@@ -38,79 +42,10 @@ constexpr double kMaxStartDistance = 10.0;
 #define LUMO_HOT_CLONES
 #endif
 
-// Values of the 20 terms, and their derivatives by U and by V.
+// Values of the 20 terms, or their derivatives.
 struct TermSet {
     double t[RF_MAX_TERMS];
 };
-
-inline void FormTerms(double u, double v, double w, double* t) {
-    t[0] = 1.0;
-    t[1] = u;
-    t[2] = v;
-    t[3] = w;
-    t[4] = u * v;
-    t[5] = u * w;
-    t[6] = v * w;
-    t[7] = u * u;
-    t[8] = v * v;
-    t[9] = w * w;
-    t[10] = u * v * w;
-    t[11] = u * u * u;
-    t[12] = u * v * v;
-    t[13] = u * w * w;
-    t[14] = u * u * v;
-    t[15] = v * v * v;
-    t[16] = v * w * w;
-    t[17] = u * u * w;
-    t[18] = v * v * w;
-    t[19] = w * w * w;
-}
-
-inline void FormDerivativeTermsU(double u, double v, double w, double* d) {
-    d[0] = 0.0;
-    d[1] = 1.0;
-    d[2] = 0.0;
-    d[3] = 0.0;
-    d[4] = v;
-    d[5] = w;
-    d[6] = 0.0;
-    d[7] = 2.0 * u;
-    d[8] = 0.0;
-    d[9] = 0.0;
-    d[10] = v * w;
-    d[11] = 3.0 * u * u;
-    d[12] = v * v;
-    d[13] = w * w;
-    d[14] = 2.0 * u * v;
-    d[15] = 0.0;
-    d[16] = 0.0;
-    d[17] = 2.0 * u * w;
-    d[18] = 0.0;
-    d[19] = 0.0;
-}
-
-inline void FormDerivativeTermsV(double u, double v, double w, double* d) {
-    d[0] = 0.0;
-    d[1] = 0.0;
-    d[2] = 1.0;
-    d[3] = 0.0;
-    d[4] = u;
-    d[5] = 0.0;
-    d[6] = w;
-    d[7] = 0.0;
-    d[8] = 2.0 * v;
-    d[9] = 0.0;
-    d[10] = u * w;
-    d[11] = 0.0;
-    d[12] = 2.0 * u * v;
-    d[13] = 0.0;
-    d[14] = u * u;
-    d[15] = 3.0 * v * v;
-    d[16] = w * w;
-    d[17] = 0.0;
-    d[18] = 2.0 * v * w;
-    d[19] = 0.0;
-}
 
 // Sum of c[i] * t[i] over the terms in use. The full model is the common
 // case; its fixed length lets the compiler unroll and vectorise the sum.
@@ -145,29 +80,60 @@ inline double DerivativeV(const double* c, double u, double v, double w) {
             2.0 * c[18] * v * w);
 }
 
-// Only 20 terms exist: a larger count evaluates those, a negative one none.
-inline int UsableTerms(const RFInfo_t* psRF) {
-    return std::clamp(psRF->nTerms, 0, RF_MAX_TERMS);
+// The four sums at normalised (u, v, w).
+struct Ratios {
+    double dfPixelNum, dfPixelDen, dfLineNum, dfLineDen;
+};
+
+inline Ratios EvaluateSums(const RFInfo_t* psRF, const double* t) {
+    const int n = UsableTerms(psRF);
+    return {Sum(psRF->padfPixelNum, t, n), Sum(psRF->padfPixelDen, t, n),
+            Sum(psRF->padfLineNum, t, n), Sum(psRF->padfLineDen, t, n)};
 }
 
-bool IsUsableScale(double dfScale) {
-    return std::isfinite(dfScale) && dfScale != 0.0;
+// Image position the rational functions give, before the adjustment or the
+// half-pixel shift. False where a denominator vanishes (a pole of the model:
+// no image position there) or the result is not finite.
+inline bool RationalImage(const RFInfo_t* psRF, double u, double v, double w, double* pdfPixel,
+                          double* pdfLine) {
+    TermSet sTerms;
+    nova::RpcTermValues(u, v, w, sTerms.t);
+    const Ratios r = EvaluateSums(psRF, sTerms.t);
+    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return false;
+    *pdfPixel = r.dfPixelNum / r.dfPixelDen * psRF->dfPixelScale + psRF->dfPixelOffset;
+    *pdfLine = r.dfLineNum / r.dfLineDen * psRF->dfLineScale + psRF->dfLineOffset;
+    return std::isfinite(*pdfPixel) && std::isfinite(*pdfLine);
 }
 
-// A record whose arrays exist and whose normalisation is finite with
-// non-zero scales; anything else would give NaN or infinity silently.
-bool IsEvaluable(const RFInfo_t* psRF) {
-    return psRF != nullptr && psRF->padfPixelNum != nullptr && psRF->padfPixelDen != nullptr &&
-           psRF->padfLineNum != nullptr && psRF->padfLineDen != nullptr &&
-           IsUsableScale(psRF->dfXScale) && IsUsableScale(psRF->dfYScale) &&
-           IsUsableScale(psRF->dfZScale) && IsUsableScale(psRF->dfPixelScale) &&
-           IsUsableScale(psRF->dfLineScale) && std::isfinite(psRF->dfXOffset) &&
-           std::isfinite(psRF->dfYOffset) && std::isfinite(psRF->dfZOffset) &&
-           std::isfinite(psRF->dfPixelOffset) && std::isfinite(psRF->dfLineOffset);
+// The failure values of the inverse: both ground coordinates the null value.
+int NoGroundPoint(double* pdfX, double* pdfY) {
+    lumo::SetNullPair(pdfX, pdfY);
+    return 0;
 }
 
-// Names the first field that makes a record unusable.
-void ReportUnusableRecord(const RFInfo_t* psRF) {
+// Places a new record's contents into the caller's record, or hands the new
+// record over.
+RFInfo_t* PlaceRecord(RFInfo_t* psNew, RFInfo_t* psExisting) {
+    if (psExisting == nullptr) return psNew;
+    *psExisting = *psNew;
+    std::free(psNew);
+    return psExisting;
+}
+
+// Normalises the default georeferencing text; the normalised form may be
+// longer than the buffer, so it is cut to fit.
+void SetDefaultGeosys(RFInfo_t* psRF) {
+    char szNormalised[NOVA_GEOSYS_LEN] = {};
+    DecodeGeosys(kDefaultGeosys, szNormalised);
+    const std::size_t nCopy = strnlen(szNormalised, RF_TEXT_SIZE - 1);
+    std::memcpy(psRF->pszGeosys, szNormalised, nCopy);
+    psRF->pszGeosys[nCopy] = '\0';
+    Geosys2ProjInfo(psRF->psProjInfo, psRF->pszGeosys, 0.0, 0.0, 1.0, 1.0);
+}
+
+}  // namespace
+
+void lumo::rf::ReportUnusableRecord(const RFInfo_t* psRF) {
     if (psRF == nullptr || psRF->padfPixelNum == nullptr || psRF->padfPixelDen == nullptr ||
         psRF->padfLineNum == nullptr || psRF->padfLineDen == nullptr) {
         lumo::Warn(lumo::Err::kBadArgument,
@@ -198,86 +164,6 @@ void ReportUnusableRecord(const RFInfo_t* psRF) {
         }
     }
 }
-
-// Longitude wrap for models near the antimeridian: a model centred east of
-// 90 degrees sees negative longitudes as beyond 180, and the converse.
-inline double WrapLongitude(double dfX, double dfXOffset) {
-    if (std::fabs(dfXOffset) > 90.0) {
-        if (dfXOffset > 0.0 && dfX < 0.0) return dfX + 360.0;
-        if (dfXOffset < 0.0 && dfX > 0.0) return dfX - 360.0;
-    }
-    return dfX;
-}
-
-// The four sums at normalised (u, v, w).
-struct Ratios {
-    double dfPixelNum, dfPixelDen, dfLineNum, dfLineDen;
-};
-
-inline Ratios EvaluateSums(const RFInfo_t* psRF, const double* t) {
-    const int n = UsableTerms(psRF);
-    return {Sum(psRF->padfPixelNum, t, n), Sum(psRF->padfPixelDen, t, n),
-            Sum(psRF->padfLineNum, t, n), Sum(psRF->padfLineDen, t, n)};
-}
-
-// Image position the rational functions give, before the adjustment or the
-// half-pixel shift. False where a denominator vanishes (a pole of the model:
-// no image position there) or the result is not finite.
-inline bool RationalImage(const RFInfo_t* psRF, double u, double v, double w, double* pdfPixel,
-                          double* pdfLine) {
-    TermSet sTerms;
-    FormTerms(u, v, w, sTerms.t);
-    const Ratios r = EvaluateSums(psRF, sTerms.t);
-    if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return false;
-    *pdfPixel = r.dfPixelNum / r.dfPixelDen * psRF->dfPixelScale + psRF->dfPixelOffset;
-    *pdfLine = r.dfLineNum / r.dfLineDen * psRF->dfLineScale + psRF->dfLineOffset;
-    return std::isfinite(*pdfPixel) && std::isfinite(*pdfLine);
-}
-
-bool IsGeographic(const RFInfo_t* psRF) {
-    return psRF->psProjInfo != nullptr && psRF->psProjInfo->nProjKind == NOVA_PROJ_GEOGRAPHIC;
-}
-
-// A ground position an inverse may give: for geographic models a latitude
-// within +-90 degrees and a longitude within half a turn of the model's.
-bool IsPlaceOnEarth(const RFInfo_t* psRF, double dfX, double dfY) {
-    if (!std::isfinite(dfX) || !std::isfinite(dfY)) return false;
-    if (!IsGeographic(psRF)) return true;
-    return std::fabs(dfY) <= 90.0 && std::fabs(dfX - psRF->dfXOffset) <= 180.0;
-}
-
-// Adjustment polynomial a0 + a1 p + a2 l + a3 p l + a4 p^2 + a5 l^2.
-inline double Adjustment(const double* a, double p, double l) {
-    return a[0] + a[1] * p + a[2] * l + a[3] * p * l + a[4] * p * p + a[5] * l * l;
-}
-
-// The failure values of the inverse: both ground coordinates the null value.
-int NoGroundPoint(double* pdfX, double* pdfY) {
-    lumo::SetNullPair(pdfX, pdfY);
-    return 0;
-}
-
-// Places a new record's contents into the caller's record, or hands the new
-// record over.
-RFInfo_t* PlaceRecord(RFInfo_t* psNew, RFInfo_t* psExisting) {
-    if (psExisting == nullptr) return psNew;
-    *psExisting = *psNew;
-    std::free(psNew);
-    return psExisting;
-}
-
-// Normalises the default georeferencing text; the normalised form may be
-// longer than the buffer, so it is cut to fit.
-void SetDefaultGeosys(RFInfo_t* psRF) {
-    char szNormalised[NOVA_GEOSYS_LEN] = {};
-    DecodeGeosys(kDefaultGeosys, szNormalised);
-    const std::size_t nCopy = strnlen(szNormalised, RF_TEXT_SIZE - 1);
-    std::memcpy(psRF->pszGeosys, szNormalised, nCopy);
-    psRF->pszGeosys[nCopy] = '\0';
-    Geosys2ProjInfo(psRF->psProjInfo, psRF->pszGeosys, 0.0, 0.0, 1.0, 1.0);
-}
-
-}  // namespace
 
 RFInfo_t* RFAllocate(RFInfo_t* psExisting, int nTerms) {
     // Every piece is owned by the unique_ptr until the record is complete, so
@@ -342,16 +228,7 @@ void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, double* pdfPi
         *pdfLine = LUMO_NULL_VALUE;
         return;
     }
-    if (psRF->nAdjust) {
-        *pdfPixel = p + Adjustment(psRF->adfPixelAdjust, p, l);
-        *pdfLine = l + Adjustment(psRF->adfLineAdjust, p, l);
-    } else if (psRF->nHalfPixelShift) {
-        *pdfPixel = p + 0.5;
-        *pdfLine = l + 0.5;
-    } else {
-        *pdfPixel = p;
-        *pdfLine = l;
-    }
+    ToCallerImage(psRF, p, l, pdfPixel, pdfLine);
 }
 
 namespace {
@@ -375,8 +252,7 @@ Jacobian JacobianAt(const RFInfo_t* psRF, const Ratios& r, double dfU, double df
     } else {
         // Fewer terms: the derivatives take the same terms as the values.
         TermSet sDu, sDv;
-        FormDerivativeTermsU(dfU, dfV, dfW, sDu.t);
-        FormDerivativeTermsV(dfU, dfV, dfW, sDv.t);
+        nova::RpcTermDerivatives(dfU, dfV, dfW, sDu.t, sDv.t);
         ru = EvaluateSums(psRF, sDu.t);
         rv = EvaluateSums(psRF, sDv.t);
     }
@@ -418,7 +294,7 @@ NewtonOutcome NewtonStep(const RFInfo_t* psRF, double pn, double ln, double dfU,
                          double dfW, InverseState& state) {
     NewtonOutcome s;
     TermSet sT;
-    FormTerms(dfU, dfV, dfW, sT.t);
+    nova::RpcTermValues(dfU, dfV, dfW, sT.t);
     const Ratios r = EvaluateSums(psRF, sT.t);
     // A vanishing denominator has no ratio and no derivative: no step.
     if (r.dfPixelDen == 0.0 || r.dfLineDen == 0.0) return s;
@@ -449,13 +325,15 @@ NewtonOutcome NewtonStep(const RFInfo_t* psRF, double pn, double ln, double dfU,
     return s;
 }
 
+}  // namespace
+
 // Starting point of the inverse: the exact inverse of the functions' first
 // order part at the height w, where pN (D0 + D1 u + D2 v + D3 w) =
 // N0 + N1 u + N2 v + N3 w is linear in (u, v). Real models are nearly that,
 // so Newton starts close and needs a step or two. False when that part is
 // singular or its answer implausible.
-bool FirstOrderStart(const RFInfo_t* psRF, double pn, double ln, double w, double* pdfU,
-                     double* pdfV) {
+bool lumo::rf::FirstOrderStart(const RFInfo_t* psRF, double pn, double ln, double w, double* pdfU,
+                               double* pdfV) {
     const int n = UsableTerms(psRF);
     auto c = [n](const double* a, int i) { return i < n ? a[i] : 0.0; };
     auto row = [&](const double* num, const double* den, double target, double* a) {
@@ -475,8 +353,6 @@ bool FirstOrderStart(const RFInfo_t* psRF, double pn, double ln, double w, doubl
     *pdfV = v;
     return true;
 }
-
-}  // namespace
 
 int Newton(RFInfo_t* psRF, double dfPixelN, double dfLineN, double dfU, double dfV, double dfW,
            double* pdfU, double* pdfV) {
@@ -523,20 +399,14 @@ int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, doubl
     // Remove the image-space adjustment or the half-pixel shift.
     double p = dfPixel;
     double l = dfLine;
-    if (psRF->nAdjust) {
-        p = dfPixel - Adjustment(psRF->adfPixelAdjust, dfPixel, dfLine);
-        l = dfLine - Adjustment(psRF->adfLineAdjust, dfPixel, dfLine);
-    } else if (psRF->nHalfPixelShift) {
-        p = dfPixel - 0.5;
-        l = dfLine - 0.5;
-    }
+    FromCallerImage(psRF, dfPixel, dfLine, &p, &l);
     const double pn = (p - psRF->dfPixelOffset) / psRF->dfPixelScale;
     const double ln = (l - psRF->dfLineOffset) / psRF->dfLineScale;
 
     double u = (dfStartX - psRF->dfXOffset) / psRF->dfXScale;
     double v = (dfStartY - psRF->dfYOffset) / psRF->dfYScale;
     const double w = (dfHeight - psRF->dfZOffset) / psRF->dfZScale;
-    if (bNoGuess) FirstOrderStart(psRF, pn, ln, w, &u, &v);
+    if (bNoGuess) lumo::rf::FirstOrderStart(psRF, pn, ln, w, &u, &v);
     InverseState state;
     state.dfPixelLimit = kResidualPixels / std::fabs(psRF->dfPixelScale);
     state.dfLineLimit = kResidualPixels / std::fabs(psRF->dfLineScale);
@@ -651,7 +521,7 @@ std::string CheckDomain(const RFInfo_t& rf) {
         const int nU = k % 3, nV = (k / 3) % 3, nW = k / 9;  // node indices 0..2
         const double u = nU - 1.0, v = nV - 1.0, w = nW - 1.0;
         TermSet sTerms;
-        FormTerms(u, v, w, sTerms.t);
+        nova::RpcTermValues(u, v, w, sTerms.t);
         const Ratios r = EvaluateSums(&rf, sTerms.t);
         const double p = r.dfPixelNum / r.dfPixelDen, l = r.dfLineNum / r.dfLineDen;
         if (dfPixelSign == 0.0) dfPixelSign = r.dfPixelDen;

@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "nova/mathmodel_core.h"
+#include "nova/rpc_terms.h"
 
 namespace nova {
 namespace ogc {
@@ -28,7 +29,7 @@ class ICRS;
 
 namespace mathmodel {
 
-constexpr int kRpcTerms = 20;
+constexpr int kRpcTerms = kRpcTermCount;
 
 // Coefficients and normalisation of a rational polynomial model. Normalised
 // value = (value - offset) / scale; longitudes are taken continuous around
