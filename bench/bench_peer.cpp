@@ -302,8 +302,10 @@ struct RfSetUp {
     RfSetUp& operator=(const RfSetUp&) = delete;
 };
 
+// Argument: 0 point by point, 1 through the batch entry point.
 void BM_PeerRfForward(benchmark::State& state) {
     RfSetUp s;
+    const bool batch = state.range(0) != 0;
     std::vector<double> a(kPoints), b(kPoints), z(kPoints), pixel(kPoints), line(kPoints);
     std::vector<int> ok(kPoints);
     SideBySide t;
@@ -316,6 +318,11 @@ void BM_PeerRfForward(benchmark::State& state) {
                              ok.data());
         });
         t.lumo += Seconds([&] {
+            if (batch) {
+                RFGeo2ImgBatch(s.ours.get(), static_cast<int>(kPoints), s.lon.data(), s.lat.data(),
+                               s.height.data(), pixel.data(), line.data(), nullptr);
+                return;
+            }
             for (std::size_t k = 0; k < kPoints; ++k)
                 RFGeo2Img(s.ours.get(), s.lon[k], s.lat[k], s.height[k], &pixel[k], &line[k]);
         });
@@ -328,12 +335,14 @@ void BM_PeerRfForward(benchmark::State& state) {
     state.counters["max_diff_px"] = worst;
     state.counters["convention_shift_px"] = s.shift;
 }
-BENCHMARK(BM_PeerRfForward)->UseRealTime();
+BENCHMARK(BM_PeerRfForward)->ArgName("batch")->Arg(0)->Arg(1)->UseRealTime();
 
 // Image to ground at known heights, both sides to kInverseTolerance pixels;
 // the accuracy counters project each answer forward with our model.
+// Argument: 0 point by point, 1 through the batch entry point.
 void BM_PeerRfInverse(benchmark::State& state) {
     RfSetUp s;
+    const bool batch = state.range(0) != 0;
     std::vector<double> pixel(kPoints), line(kPoints);
     for (std::size_t k = 0; k < kPoints; ++k)
         RFGeo2Img(s.ours.get(), s.lon[k], s.lat[k], s.height[k], &pixel[k], &line[k]);
@@ -351,6 +360,11 @@ void BM_PeerRfInverse(benchmark::State& state) {
                              ok.data());
         });
         t.lumo += Seconds([&] {
+            if (batch) {
+                RFImg2GeoBatch(s.ours.get(), static_cast<int>(kPoints), pixel.data(), line.data(),
+                               s.height.data(), x.data(), y.data(), nullptr);
+                return;
+            }
             for (std::size_t k = 0; k < kPoints; ++k) {
                 double height = s.height[k];
                 x[k] = y[k] = 0.0;
@@ -371,6 +385,6 @@ void BM_PeerRfInverse(benchmark::State& state) {
     state.counters["peer_err_px"] = worstError(a, b);
     state.counters["lumo_err_px"] = worstError(x, y);
 }
-BENCHMARK(BM_PeerRfInverse)->UseRealTime();
+BENCHMARK(BM_PeerRfInverse)->ArgName("batch")->Arg(0)->Arg(1)->UseRealTime();
 
 }  // namespace

@@ -80,6 +80,26 @@ LUMO_API void RFGeo2Img(RFInfo_t* psRF, double dfX, double dfY, double dfZ, doub
 // finite.
 LUMO_API int RFImg2Geo(RFInfo_t* psRF, double dfPixel, double dfLine, double* pdfX, double* pdfY,
                        double* pdfZ);
+// Batch forms: nCount points per call, for rasters and point clouds. Each
+// point gets what the point function gives it, up to rounding (about 1e-12
+// pixel): groups of points share vector instructions, large batches are
+// split across threads (nova/parallel.h), and the inverse starts every point
+// from the functions' first-order inverse (no caller's guess) and verifies
+// it like RFImg2Geo. padfZ may be null: height 0 for the forward, the
+// model's height offset for the inverse; a height of -1e20 means the same.
+// A failed point gets -1e20 in both outputs; panValid, when not null,
+// receives 1 per point that succeeded and 0 per failed one. An output may
+// be the array of the same point's input. Returns 1 when every point
+// succeeded, else 0. A negative count, a null array, one array for both
+// outputs or a record that cannot be evaluated is reported as a warning and
+// nothing is written. Points of the inverse whose pixel, line or height is
+// not finite fail, and the first of them is named in one warning per call.
+LUMO_API int RFGeo2ImgBatch(RFInfo_t* psRF, int nCount, const double* padfX, const double* padfY,
+                            const double* padfZ, double* padfPixel, double* padfLine,
+                            int* panValid);
+LUMO_API int RFImg2GeoBatch(RFInfo_t* psRF, int nCount, const double* padfPixel,
+                            const double* padfLine, const double* padfZ, double* padfX,
+                            double* padfY, int* panValid);
 // One Newton step towards the normalised image position (dfPixelN,
 // dfLineN) at the fixed normalised height dfW. Returns 1 and the new
 // estimate, or 0 (outputs untouched) when the Jacobian is near-singular or
