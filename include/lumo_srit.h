@@ -15,6 +15,20 @@
 
 constexpr int SRIT_NUM_COEFS = 23;
 constexpr int SRIT_NUM_AUX = 4;
+// anAux[SRIT_AUX_FORM] selects the form of the elevation scale (1 - 2 k Z / c0)
+// in the image-to-ground equations. Over the curved Earth the local vertical
+// at across-track distance u is tilted by 2u / c0, so the tangent of the
+// incidence angle, and with it the elevation displacement, grows by
+// (tan^2 + 1) 2u / c0. The classic form (0, what SRITAllocate gives) takes
+// k = 1, right at nadir only; the curved-incidence form (1) takes
+// k = c15^2 + 1, as the displacement rate c9 does. Off nadir the classic form
+// misses by 2 c15^2 Z u / c0: about 20 m at the swath edge at 40 degrees of
+// roll over 2000 m of relief. A computation uses the form the caller set in
+// the record and keeps it; the transforms read it, so a record means the same
+// wherever it is evaluated.
+constexpr int SRIT_AUX_FORM = 1;
+constexpr int32_t SRIT_FORM_CLASSIC = 0;
+constexpr int32_t SRIT_FORM_CURVED_INCIDENCE = 1;
 constexpr int SRIT_AUX_TEXT_SIZE = 17;  // 16 characters and the terminator
 constexpr int SRIT_NUM_AUX_VALUES = 3;
 constexpr int SRIT_AUX_BLOCK_SIZE = 1024;
@@ -28,7 +42,8 @@ constexpr int SRIT_ID_SIZE = 64;  // image and point identifiers, blank padded
 // arrays, the segment and the projection copy.
 struct SRITInfo_t {
     double adfCoef[SRIT_NUM_COEFS];  // model coefficients c0 ... c22
-    // [0] is the math model object's downsample factor; the rest are carried.
+    // [0] is the math model object's downsample factor, [SRIT_AUX_FORM] the
+    // form of the equations; the rest are carried.
     int32_t anAux[SRIT_NUM_AUX];
     char szAuxA[SRIT_AUX_TEXT_SIZE];               // conformal working projection (host's)
     char szAuxB[SRIT_AUX_TEXT_SIZE];               // model's ground projection text (host's)
@@ -67,7 +82,8 @@ LUMO_API void LumoFreeSRITInfo(SRITInfo_t* psModel);
 // Why a record cannot be evaluated, naming the field and its value; empty
 // when it can: finite coefficients, c0 (twice the Earth's radius of
 // curvature) within 1e7..1.5e7 m, non-zero divisors c2, c11, c12, c6 in
-// (0, 1], and a segment EphemerisSegValidate accepts. Every reader of a
+// (0, 1], a known form in anAux[SRIT_AUX_FORM], and a segment
+// EphemerisSegValidate accepts. Every reader of a
 // model file runs it.
 LUMO_API std::string SRITValidate(const SRITInfo_t* psModel);
 
@@ -76,6 +92,8 @@ LUMO_API std::string SRITValidate(const SRITInfo_t* psModel);
 // ground (X, Y) when bImageFirst is true, the reverse when false; padfZ is
 // the elevation. Returns 1 when a model was computed (the record then adopts
 // psEphemeris), 0 otherwise (fewer than 3 points: nothing is touched).
+// The equations take the form set in psModel->anAux[SRIT_AUX_FORM] (for
+// SRITCalculateN, each image's record); an unknown form is error 11.
 // Fatal numbered errors (thrown; the record is untouched and the segment
 // stays the caller's): 32 for a projection that is not a conformal ground
 // unit or a bad earth model, 19 for an unsupported sensor (also a sensor

@@ -69,7 +69,8 @@ TEST(RecordValidation, ModelFilesOfEveryFamily) {
                   ReadModelDocument);
     ExpectRefused("srit_spot5_roll20.json",
                   {{[](json& d) { d["srit"]["coefficients"][12] = 0; }, "adfCoef[12] = 0"},
-                   {[](json& d) { d["srit"]["segment"]["nNumLines"] = -1; }, "nNumLines = -1"}},
+                   {[](json& d) { d["srit"]["segment"]["nNumLines"] = -1; }, "nNumLines = -1"},
+                   {[](json& d) { d["srit"]["elevationScale"] = "flat"; }, "found \"flat\""}},
                   ReadModelDocument);
     ExpectRefused("segment_optical_attitude.json",
                   {{[](json& d) { d["nNumLines"] = -1; }, "nNumLines = -1"},

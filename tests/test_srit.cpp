@@ -174,6 +174,12 @@ TEST(SRITCalculate, FailuresLeaveTheRecordAndSegmentToTheCaller) {
     const auto sEarth = FatalOf([&] { fnFit(sBadEarth); });
     EXPECT_EQ(sEarth.first, 32);
     EXPECT_NE(sEarth.second.find("Earth model"), std::string::npos);
+    // A record asking for an unknown form of the equations: error 11 naming it.
+    psModel->anAux[SRIT_AUX_FORM] = 7;
+    const auto sForm = FatalOf([&] { fnFit(sScene.Projection()); });
+    EXPECT_EQ(sForm.first, 11);
+    EXPECT_NE(sForm.second.find("anAux[1] (the model form) is 7"), std::string::npos);
+    psModel->anAux[SRIT_AUX_FORM] = SRIT_FORM_CLASSIC;
     EXPECT_EQ(FatalOf([&] {
                   SRITCalculate(psModel.get(), true, psSeg.get(), 6, &sScene.Projection(), nullptr,
                                 g.l.data(), g.z.data(), g.x.data(), g.y.data());

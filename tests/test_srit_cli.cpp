@@ -75,6 +75,24 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     const nlohmann::json written = nlohmann::json::parse(in);
     EXPECT_EQ(again["srit"]["coefficients"], written["srit"]["coefficients"]);
     EXPECT_EQ(psModel->psEphemeris->nNumLines, 12000);
+    // The curved elevation scale is the tool's default and travels with the
+    // file; the classic one is asked for, and a file without the field (as
+    // written before it existed) reads as classic.
+    EXPECT_EQ(written["srit"]["elevationScale"], "curved");
+    EXPECT_EQ(psModel->anAux[SRIT_AUX_FORM], SRIT_FORM_CURVED_INCIDENCE);
+    r = RunTool({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model,
+                 "--elevation-scale", "classic"});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    EXPECT_EQ(static_cast<const SRITInfo_t*>(lumo::cli::ReadModelFile(model).poRecord.get())
+                  ->anAux[SRIT_AUX_FORM],
+              SRIT_FORM_CLASSIC);
+    nlohmann::json old = written;
+    old["srit"].erase("elevationScale");
+    std::ofstream(Path("old.json")) << old.dump();
+    EXPECT_EQ(
+        static_cast<const SRITInfo_t*>(lumo::cli::ReadModelFile(Path("old.json")).poRecord.get())
+            ->anAux[SRIT_AUX_FORM],
+        SRIT_FORM_CLASSIC);
 
     // Errors: each names what is wrong.
     r = RunTool({"fit", "--model", "srit", "--gcps", gcps, "-o", Path("x.json")});

@@ -36,6 +36,13 @@ struct BlockOptions {
     bool bConstrain = false;      // hold every image's P3 ... P7 near their orbit values
     bool bNoLeaveOneOut = false;  // skip the one adjustment per control observation
     std::string osRefine;         // --refine TOLERANCE[,MIN_POINTS]
+    std::string osElevationScale = "curved";
+};
+
+// How the block is adjusted.
+struct BlockSettings {
+    bool bConstrain = false;  // every image's constraint flag set
+    int32_t nForm = SRIT_FORM_CURVED_INCIDENCE;
 };
 
 // A block needs 3 control observations.
@@ -176,13 +183,13 @@ struct BlockResult {
     std::vector<double> out[9];  // given, estimated, residual X Y Z
 };
 
-BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
+BlockResult ComputeBlock(const BlockProject& project, const BlockSettings& settings) {
     std::vector<SegmentPtr> segments;
     for (const BlockImage& image : project.asImages) {
         segments.push_back(ReadSegmentFile(image.osSegmentPath));
         // The segment's constraint flag asks the adjustment for the
         // pseudo-observations; the written models carry it.
-        if (bConstrain) segments.back()->nSupplementFlag = 1;
+        if (settings.bConstrain) segments.back()->nSupplementFlag = 1;
     }
     const EphemerisSeg_t& first = *segments.front();
     const std::string geosys =
@@ -206,6 +213,7 @@ BlockResult ComputeBlock(const BlockProject& project, bool bConstrain) {
     std::vector<EphemerisSeg_t*> segmentPointers;
     for (std::size_t k = 0; k < nImages; ++k) {
         r.models.emplace_back(SRITAllocate());
+        r.models.back()->anAux[SRIT_AUX_FORM] = settings.nForm;
         modelPointers.push_back(r.models.back().get());
         segmentPointers.push_back(segments[k].get());
     }
@@ -289,11 +297,12 @@ std::size_t ImageIndex(const BlockProject& project, const std::string& id) {
 
 // The block adjusted with some of the control observations, mapping every
 // observation into its image.
-ImageFit BlockImageFit(const BlockProject& project, const ControlObservations& c, bool bConstrain) {
-    return [&project, &c, bConstrain](const std::vector<char>& use, std::vector<double>& pixel,
-                                      std::vector<double>& line) {
+ImageFit BlockImageFit(const BlockProject& project, const ControlObservations& c,
+                       const BlockSettings& settings) {
+    return [&project, &c, settings](const std::vector<char>& use, std::vector<double>& pixel,
+                                    std::vector<double>& line) {
         try {
-            const BlockResult r = ComputeBlock(Without(project, c, use), bConstrain);
+            const BlockResult r = ComputeBlock(Without(project, c, use), settings);
             pixel.resize(c.index.size());
             line.resize(c.index.size());
             for (std::size_t k = 0; k < c.index.size(); ++k) {
@@ -335,18 +344,21 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
             "--refine needs the leave-one-out residuals: drop "
             "--no-leave-one-out");
     }
+    BlockSettings settings;
+    settings.bConstrain = options.bConstrain;
+    settings.nForm = FormOfWord(options.osElevationScale);
     const ControlObservations control = UsedControl(allControl);
     FitResiduals residuals;
     if (!options.bNoLeaveOneOut) {
-        residuals = RefineAndMeasure(BlockImageFit(allControl, control, options.bConstrain),
-                                     control.points, kBlockLeastControl, refine, "lumo block");
+        residuals = RefineAndMeasure(BlockImageFit(allControl, control, settings), control.points,
+                                     kBlockLeastControl, refine, "lumo block");
     }
     const BlockProject project =
         residuals.anDropped.empty() ? allControl : Without(allControl, control, residuals.use);
     BlockResult r = [&] {
         const Activity activity("lumo block: adjusting " + std::to_string(project.asImages.size()) +
                                 " images");
-        return ComputeBlock(project, options.bConstrain);
+        return ComputeBlock(project, settings);
     }();
     const BlockArrays& a = r.a;
     const auto& models = r.models;
@@ -407,7 +419,7 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out) {
     const BlockProject project =
         ReadBlockProject((std::filesystem::path(examplesDir) / "block_stereo.json").string());
-    const BlockResult r = ComputeBlock(project, false);
+    const BlockResult r = ComputeBlock(project, BlockSettings{});
     out << "\nblock adjustment of block_stereo.json: " << project.asImages.size() << " images, "
         << FirstTieObservations(project).size() << " tie points of unknown elevation\n";
     char line[200];
@@ -439,6 +451,7 @@ void AddBlockCommand(CLI::App& app, CommandContext& context) {
                       "hold every image's scale, obliquity and shear terms near the values of "
                       "its orbit (as a segment's constraint flag does); steadies images whose "
                       "few control points cannot separate the elevation terms");
+    AddElevationScaleOption(*command, options->osElevationScale);
     command->add_option("--refine", options->osRefine,
                         "TOLERANCE[,MIN_POINTS]: drop the control observation with the largest "
                         "leave-one-out residual beyond TOLERANCE pixels and adjust again, until "

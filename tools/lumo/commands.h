@@ -61,12 +61,22 @@ void PrintOrbitDemo(const std::string& examplesDir, std::ostream& out);
 std::string SimulatedPointText(const std::vector<lumo::sim::SimPoint>& asPoints,
                                const char* pszPrefix, const std::string& osGeosys = "");
 
-// `lumo fit --model srit`: the rigorous model of the image of `segmentPath`
+// --elevation-scale classic|curved of the rigorous fits (fit, block): the
+// form of the equations' elevation scale; curved unless asked otherwise.
+void AddElevationScaleOption(CLI::App& command, std::string& word);
+
+struct SritFitOptions {
+    std::string osSegment;                       // the image's ephemeris segment file
+    std::string osOutput;                        // the model file to write
+    int32_t nForm = SRIT_FORM_CURVED_INCIDENCE;  // --elevation-scale
+    RefineOptions sRefine;
+};
+
+// `lumo fit --model srit`: the rigorous model of the image of the segment
 // from control points with heights, ground coordinates in `geosys` (empty:
-// the segment's), written to `outputPath`.
-// With `refine` enabled, blunders are dropped first (see fit_refine.h).
-void RunSritFit(const PointSet& gcps, const std::string& segmentPath, const std::string& geosys,
-                const std::string& outputPath, const RefineOptions& refine,
+// the segment's), in the form asked for, written to the output. With
+// refinement enabled, blunders are dropped first (see fit_refine.h).
+void RunSritFit(const PointSet& gcps, const SritFitOptions& options, const std::string& geosys,
                 CommandContext& context);
 
 // `lumo fit --model rf`: the image-space adjustment of the model in `osRpc`

@@ -25,6 +25,7 @@
 #include "points_io.h"
 #include "progress.h"
 #include "tool_warnings.h"
+#include "srit_io.h"
 #include "tps_io.h"
 
 namespace lumo::cli {
@@ -53,6 +54,7 @@ struct FitOptions {
     bool bAllowLowerOrder = false;  // write a lower order than asked for instead of failing
     PointFileOptions sPoints;       // --height
     std::string osRefine;           // --refine TOLERANCE[,MIN_POINTS]
+    std::string osElevationScale = "curved";  // srit only
 };
 
 std::string Number(double value) {
@@ -332,7 +334,12 @@ void RunFit(const FitOptions& options, CommandContext& context) {
         return;
     }
     if (bRigorous) {
-        RunSritFit(gcps, options.osSegment, geosys, options.osOutput, refine, context);
+        SritFitOptions srit;
+        srit.osSegment = options.osSegment;
+        srit.osOutput = options.osOutput;
+        srit.nForm = FormOfWord(options.osElevationScale);
+        srit.sRefine = refine;
+        RunSritFit(gcps, srit, geosys, context);
         return;
     }
     if (bRadar) {
@@ -411,6 +418,7 @@ void AddFitCommand(CLI::App& app, CommandContext& context) {
         ->add_option("--gcps", options->osGcps,
                      "control points: CSV with pixel,line,x,y[,z], or an image that stores them")
         ->required();
+    AddElevationScaleOption(*command, options->osElevationScale);
     command->add_option("--order", options->nOrder, "polynomial order 1..5 (poly only; default 1)")
         ->check(CLI::Range(1, GCP_MAX_ORDER));
     command->add_option("--geosys", options->osGeosys,

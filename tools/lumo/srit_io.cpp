@@ -68,6 +68,17 @@ void FillLineArrays(SRITInfo_t& model) {
 
 }  // namespace
 
+const char* FormWord(int32_t nForm) {
+    if (nForm == SRIT_FORM_CLASSIC) return "classic";
+    return nForm == SRIT_FORM_CURVED_INCIDENCE ? "curved" : nullptr;
+}
+
+int32_t FormOfWord(const std::string& word) {
+    if (word == "classic") return SRIT_FORM_CLASSIC;
+    if (word == "curved") return SRIT_FORM_CURVED_INCIDENCE;
+    return -1;
+}
+
 SritPtr SritFromJson(const ModelEnvelope& envelope, const json& section) {
     if (!section.is_object()) LUMO_CLI_FAIL(envelope.osSource + ": \"srit\" must be an object");
     const FieldContext ctx{envelope.osSource, "srit"};
@@ -77,6 +88,13 @@ SritPtr SritFromJson(const ModelEnvelope& envelope, const json& section) {
     model->nSensor = ReadInt(section, "sensorCode", 0, 186, ctx);
     model->nModelClass = ReadInt(section, "modelClass", -999, 6, ctx);
     model->anAux[0] = ReadInt(section, "downsample", 0, 1 << 20, ctx);
+    if (const json* form = FindField(section, "elevationScale")) {
+        const std::string word = TextValue(*form, "elevationScale", ctx);
+        model->anAux[SRIT_AUX_FORM] = FormOfWord(word);
+        if (model->anAux[SRIT_AUX_FORM] < 0) {
+            ctx.Fail("elevationScale", "must be \"classic\" or \"curved\", found " + Quoted(word));
+        }
+    }
     ReadText(section, "sensor", model->Sensor, SRIT_SENSOR_SIZE, true, ctx);
     ReadText(section, "workingGeosys", model->szAuxA, SRIT_AUX_TEXT_SIZE, false, ctx);
     ReadText(section, "groundGeosys", model->szAuxB, SRIT_AUX_TEXT_SIZE, false, ctx);
@@ -114,6 +132,13 @@ json SritToJson(const SRITInfo_t& model) {
     section["sensorCode"] = model.nSensor;
     section["modelClass"] = model.nModelClass;
     section["downsample"] = model.anAux[0];
+    const char* pszForm = FormWord(model.anAux[SRIT_AUX_FORM]);
+    if (pszForm == nullptr) {
+        LUMO_CLI_FAIL("cannot write model: the rigorous record's form (anAux[" +
+                      std::to_string(SRIT_AUX_FORM) + "]) is " +
+                      std::to_string(model.anAux[SRIT_AUX_FORM]) + ", neither classic nor curved");
+    }
+    section["elevationScale"] = pszForm;
     section["workingGeosys"] = BufferText(model.szAuxA, SRIT_AUX_TEXT_SIZE - 1);
     section["groundGeosys"] = BufferText(model.szAuxB, SRIT_AUX_TEXT_SIZE - 1);
     section["segment"] = json::parse(SegmentToJson(segment).dump());

@@ -64,6 +64,18 @@ void ReportNullArgument(const char* pszName) {
                 MkName(_("SRITCalculate: argument %s is null.\n"), pszName));
 }
 
+bool CurvedIncidenceAsked(const SRITInfo_t& sModel, const char* pszRecord) {
+    const int32_t nForm = sModel.anAux[SRIT_AUX_FORM];
+    if (nForm != SRIT_FORM_CLASSIC && nForm != SRIT_FORM_CURVED_INCIDENCE) {
+        lumo::Fatal(lumo::Err::kBadArgument,
+                    MkName(_("%s->anAux[%d] (the model form) is %d: it must be %d (classic) or %d "
+                             "(curved incidence).\n"),
+                           pszRecord, SRIT_AUX_FORM, static_cast<int>(nForm), SRIT_FORM_CLASSIC,
+                           SRIT_FORM_CURVED_INCIDENCE));
+    }
+    return nForm == SRIT_FORM_CURVED_INCIDENCE;
+}
+
 // Ellipsoid of the control points' projection.
 Ellipsoid EllipsoidOf(const ProjInfo_t& sProj, const char* pszDecoded) {
     double a = 0.0, b = 0.0;
@@ -167,6 +179,7 @@ int CalculateOne(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psEpheme
     RequireArgument(padfZ, "padfZ");
     RequireArgument(padfC, "padfC");
     RequireArgument(padfD, "padfD");
+    const bool bCurvedIncidence = CurvedIncidenceAsked(*psModel, "psModel");
 
     char szDecoded[NOVA_GEOSYS_LEN] = {};
     RequireConformal(*psProjInfo, szDecoded);
@@ -209,6 +222,7 @@ int CalculateOne(SRITInfo_t* psModel, bool bImageFirst, EphemerisSeg_t* psEpheme
     sImg.nUsedObservations = nGCP;
     SpreadElevations(sAdj, sAdj.asPoints.size());
     PrepareImages(sAdj);
+    sImg.sTerms.sSelect.bCurvedIncidence = bCurvedIncidence;
     Adjust(sAdj, "SRITCalculate");
     FillRecord(sAdj.asImages[0], psModel, psEphemeris, *psProjInfo);
     return 1;

@@ -263,6 +263,7 @@ void RequireInput(const BlockInput& in, SRITInfo_t* const* papsModels) {
     for (int k = 0; k < in.nImages; ++k) {
         RequireArgument(papsModels[k], "papsModels[k]");
         RequireArgument(in.papsEphemeris[k], "papsEphemeris[k]");
+        CurvedIncidenceAsked(*papsModels[k], MkName("papsModels[%d]", k));
         for (int j = 0; j < k; ++j) {
             // Each record adopts its segment and releases the one it held:
             // a shared segment, or a record holding another image's new
@@ -381,6 +382,10 @@ int SRITCalculateMulti(int nImages, const char* pszImageIds, SRITInfo_t** papsMo
 
     SpreadElevations(sAdj, nControlPoints);
     PrepareImages(sAdj);
+    for (int k = 0; k < nImages; ++k) {
+        sAdj.asImages[static_cast<std::size_t>(k)].sTerms.sSelect.bCurvedIncidence =
+            papsModels[k]->anAux[SRIT_AUX_FORM] == SRIT_FORM_CURVED_INCIDENCE;
+    }
     BuildPairs(sAdj);
     Adjust(sAdj, "SRITCalculateN");
     EstimatePoints(sAdj);

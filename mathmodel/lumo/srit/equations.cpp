@@ -61,6 +61,7 @@ GroundTerms ImageToAxes(const ModelTerms& m, double xc, double yc, double Z) {
     s.t = -yc * P[kLineSpacing];
     s.u = AcrossDistance(m, xc);
     s.H = f.bCurvature ? Z - s.u * s.u / m.dfTwoN : Z;
+    s.Z = Z;
     if (f.bElevationTerm) {
         s.g = ObliquityGain(m, xc);
         s.K = s.H * s.H / (2.0 * P[kAcrossScale]) + s.H;
@@ -68,7 +69,7 @@ GroundTerms ImageToAxes(const ModelTerms& m, double xc, double yc, double Z) {
     const double t = s.t, u = s.u, H = s.H;
     const double F =
         (P[kShear] - t * P[kShearAlong] - u * P[kShearAcross]) * t +
-        (1.0 - 2.0 * Z / m.dfTwoN) * u -
+        (1.0 - 2.0 * m.ElevationScaleRate() * Z / m.dfTwoN) * u -
         ((P[kAcrossTilt] * P[kAcrossTilt] + 1.0) / P[kAcrossScale] * u + m.dfTiltRatio) * H;
     const double dfLine = (1.0 - u * P[kLineAcross]) * t + H * P[kAlongTilt];
     double A = F, B = dfLine;
@@ -125,11 +126,12 @@ void AxesToImage(const ModelTerms& m, double x, double y, double dfZ, double* pd
     const Selectors& f = m.sSelect;
     const double c0 = m.dfTwoN, c2 = m.dfIfov, c6 = m.dfCosAlongTilt;
     const double h = dfZ;
+    const double dfScale = 1.0 + 2.0 * m.ElevationScaleRate() * h / c0;
     // Across-track ground position of (x', y') on the image's own axes.
     const auto Across = [&](double xp, double yp) {
         const double E =
             f.bRadarLike ? m.dfAcrossCube * xp * xp * xp : m.dfAcrossCube * xp * yp * yp;
-        return (x - P[kShear] * yp) * (1.0 + 2.0 * h / c0) + P[kShearAlong] * yp * yp +
+        return (x - P[kShear] * yp) * dfScale + P[kShearAlong] * yp * yp +
                P[kShearAcross] * xp * yp - E;
     };
     const double P3 = P[kAcrossScale], P4 = P[kAcrossTilt];
@@ -205,7 +207,11 @@ void ObservationCoefficients(const ModelTerms& m, const GroundTerms& s, bool bXR
     const double* P = m.P;
     const double ct = std::cos(P[kRotation]), st = std::sin(P[kRotation]);
     const double t = s.t, u = s.u, H = s.H;
-    const double dfP4Term = u * u / P[kAcrossScale] - H / m.dfCosAlongTilt;
+    double dfP4Term = u * u / P[kAcrossScale] - H / m.dfCosAlongTilt;
+    // The curved-incidence scale depends on P4 through c15 = P4 / c6.
+    if (m.sSelect.bCurvedIncidence) {
+        dfP4Term -= 4.0 * m.dfTiltRatio / m.dfCosAlongTilt * s.Z * u / m.dfTwoN;
+    }
     if (bXRow) {
         const double c[kMaxUnknowns] = {1.0,
                                         0.0,

@@ -31,14 +31,14 @@ constexpr double kStartLimitPixels = 1e7;  // a start farther out than this is n
 struct Constants {
     const double* P;
     double dfCurvature;  // 1 / 2N, or 0 without the curvature term
-    double dfScaleAtZ;   // 1 - 2Z / 2N
+    double dfScaleAtZ;   // 1 - 2kZ / 2N
     double dfInvP3, dfInvP6;
     double dfDisplacementRate;  // (P4^2 + 1) / P3: growth of the elevation displacement
 
     Constants(const ModelTerms& m, double dfZ) : P(m.P) {
         const double dfInvTwoN = 1.0 / m.dfTwoN;
         dfCurvature = m.sSelect.bCurvature ? dfInvTwoN : 0.0;
-        dfScaleAtZ = 1.0 - 2.0 * dfZ * dfInvTwoN;
+        dfScaleAtZ = 1.0 - 2.0 * m.ElevationScaleRate() * dfZ * dfInvTwoN;
         dfInvP3 = 1.0 / P[kAcrossScale];
         dfInvP6 = 1.0 / P[kLineSpacing];
         dfDisplacementRate = (P[kAcrossTilt] * P[kAcrossTilt] + 1.0) * dfInvP3;
@@ -80,6 +80,7 @@ GroundTerms StartOnAxes(const ModelTerms& m, const Constants& c, double dfAcross
     s.t = t;
     s.u = u;
     s.H = dfZ - u * u * c.dfCurvature;
+    s.Z = dfZ;
     if (m.sSelect.bElevationTerm) {
         s.g = ObliquityGain(m, *pdfXc);
         s.K = s.H * s.H * 0.5 * c.dfInvP3 + s.H;

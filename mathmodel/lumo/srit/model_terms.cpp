@@ -42,6 +42,7 @@ ModelTerms TermsOfRecord(const SRITInfo_t& sModel) {
     // A stored P12 below this size is taken as not adjusted.
     f.bElevationTerm = std::abs(c[kCoefElevationAcross]) >= 1e-7;
     f.bLens = S == kSensorFormosatPan;
+    f.bCurvedIncidence = sModel.anAux[SRIT_AUX_FORM] == SRIT_FORM_CURVED_INCIDENCE;
     if (bLineTableSensor) m.psLineTable = AttitudeLinesOf(sModel.psEphemeris);
     m.dfLineRounding = 0.5;
     if (sModel.psEphemeris != nullptr) m.nLines = sModel.psEphemeris->nNumLines;

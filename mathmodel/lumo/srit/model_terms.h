@@ -90,6 +90,9 @@ struct Selectors {
     bool bCurvature = true;      // the elevation loses u^2 / c0
     bool bElevationTerm = true;  // the P12 term of the general form
     bool bLens = false;          // lens distortion of the FORMOSAT panchromatic camera
+    // The elevation scale grows with the incidence angle's tangent
+    // (SRIT_FORM_CURVED_INCIDENCE) rather than only with the curvature.
+    bool bCurvedIncidence = false;
 };
 
 // The model of one image in the parameters' vocabulary.
@@ -115,6 +118,11 @@ struct ModelTerms {
 
     // c6, c15 and c9 from P3, P4 and P7.
     void UpdateDerived();
+    // k of the elevation scale (1 - 2 k Z / c0): c15^2 + 1 in the
+    // curved-incidence form, 1 in the classic one.
+    double ElevationScaleRate() const {
+        return sSelect.bCurvedIncidence ? dfTiltRatio * dfTiltRatio + 1.0 : 1.0;
+    }
 };
 
 // The view of a computed record, and the coefficients of a view.
@@ -127,6 +135,7 @@ struct GroundTerms {
     double t = 0.0;  // along-track ground distance
     double u = 0.0;  // across-track ground distance
     double H = 0.0;  // elevation less the curvature drop
+    double Z = 0.0;  // the elevation itself
     // Only where the P12 term applies (always in the adjustment): the
     // obliquity gain of the elevation term and H^2 / (2 P3) + H.
     double g = 0.0;

@@ -226,6 +226,9 @@ void EstimatePoints(Adjustment& sAdj);
 // ---------------------------------------------------------------------------
 
 [[noreturn]] void ReportNullArgument(const char* pszName);
+// Whether the record asks for the curved-incidence form (SRIT_AUX_FORM);
+// error 11 naming the record and the value for an unknown form.
+bool CurvedIncidenceAsked(const SRITInfo_t& sModel, const char* pszRecord);
 inline void RequireArgument(const void* pv, const char* pszName) {
     if (pv == nullptr) ReportNullArgument(pszName);
 }

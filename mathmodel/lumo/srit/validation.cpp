@@ -50,6 +50,11 @@ std::string SRITValidate(const SRITInfo_t* psModel) {
     if (!(c[6] > 0.0 && c[6] <= 1.0)) {
         return lumo::FieldProblem(Coefficient(6), c[6], "cos(atan(P7)) lies in (0, 1]");
     }
+    const int32_t nForm = psModel->anAux[SRIT_AUX_FORM];
+    if (nForm != SRIT_FORM_CLASSIC && nForm != SRIT_FORM_CURVED_INCIDENCE) {
+        return lumo::FieldProblem("anAux[" + std::to_string(SRIT_AUX_FORM) + "]", nForm,
+                                  "the model form is 0 (classic) or 1 (curved incidence)");
+    }
     problem = EphemerisSegValidate(psModel->psEphemeris);
     return problem.empty() ? "" : "psEphemeris: " + problem;
 }

@@ -58,6 +58,7 @@ SritPtr FitRigorousModel(const lumo::sim::Scene& oScene, int nGcps) {
         z.push_back(s.dfZ);
     }
     SritPtr psModel(SRITAllocate());
+    psModel->anAux[SRIT_AUX_FORM] = SRIT_FORM_CURVED_INCIDENCE;  // as lumo fit computes it
     EphemerisSeg_t* psSegment = oScene.MakeSegment();
     if (SRITCalculate(psModel.get(), true, psSegment, nGcps, &oScene.Projection(), p.data(),
                       l.data(), z.data(), x.data(), y.data()) != 1) {
