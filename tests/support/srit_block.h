@@ -3,6 +3,8 @@
 // benchmark.
 #pragma once
 
+#include <algorithm>
+#include <cmath>
 #include <string>
 #include <vector>
 
@@ -99,6 +101,104 @@ struct Block {
             adfOut[7].data(), adfOut[8].data());
         if (nResult == 1) bAdopted = true;
         return nResult;
+    }
+};
+
+// A grid of simulated images (strips side by side, alternating roll of 10
+// degrees, 6000 x 6000 pixels of 10 m), four control points and 25 check
+// observations per image, tie points between right and lower neighbours of
+// known or of estimated elevation. Constrained images are those whose
+// index abConstrained marks (all of them when it is true for every index).
+struct GridBlock {
+    Block sBlock;
+    int nTies = 0;
+    std::vector<std::vector<lumo::sim::SimPoint>> aasControl;  // per image
+    std::vector<std::vector<lumo::sim::SimPoint>> aasCheck;
+
+    GridBlock(int nRows, int nCols, int nTiePoints, bool bKnownElevation,
+              const std::vector<char>& abConstrained = {}) {
+        for (int r = 0; r < nRows; ++r) {
+            for (int c = 0; c < nCols; ++c) {
+                lumo::sim::SceneParams s;
+                s.nUtmZone = 31;
+                s.nPixels = s.nLines = 6000;
+                s.dfIFOV = 10.0 / 822000.0;
+                const auto k = static_cast<std::size_t>(r * nCols + c);
+                s.bConstrained = k < abConstrained.size() && abConstrained[k] != 0;
+                sBlock.AddImage(lumo::sim::AimAt(s, 46.0 - 0.4 * r, 1.0 + 0.55 * c,
+                                                 (r + c) % 2 ? 10.0 : -10.0, 0.0));
+            }
+        }
+        for (std::size_t k = 0; k < sBlock.asScenes.size(); ++k) {
+            const auto nSeed = static_cast<std::uint32_t>(k);
+            const std::string osPrefix = std::to_string(k) + "_";
+            aasControl.push_back(
+                sBlock.asScenes[k].SamplePoints(4, 1000 + nSeed, 0.0, 1200.0, 0.05));
+            aasCheck.push_back(
+                sBlock.asScenes[k].SamplePoints(25, 2000 + nSeed, 0.0, 1200.0, 0.05));
+            for (std::size_t i = 0; i < aasControl[k].size(); ++i) {
+                sBlock.AddGcp(static_cast<int>(k), "G" + osPrefix + std::to_string(i),
+                              aasControl[k][i], 'A');
+            }
+            for (std::size_t i = 0; i < aasCheck[k].size(); ++i) {
+                sBlock.AddGcp(static_cast<int>(k), "C" + osPrefix + std::to_string(i),
+                              aasCheck[k][i], 'C');
+            }
+        }
+        // Ties with the right and the lower neighbour, spread over the pairs.
+        const int nPairs = nRows * (nCols - 1) + (nRows - 1) * nCols;
+        int nPair = 0;
+        for (int r = 0; r < nRows; ++r) {
+            for (int c = 0; c < nCols; ++c) {
+                const int k = r * nCols + c;
+                for (int nNext : {c + 1 < nCols ? k + 1 : -1, r + 1 < nRows ? k + nCols : -1}) {
+                    if (nNext < 0) continue;
+                    const int nWanted = nTiePoints / nPairs + (nPair < nTiePoints % nPairs ? 1 : 0);
+                    ++nPair;
+                    AddTies(k, nNext, nWanted, bKnownElevation);
+                }
+            }
+        }
+    }
+
+    // The largest check-point RMS distance over the images (pixels), through
+    // the exact ground-to-image form.
+    double WorstCheckRms() const {
+        double dfWorst = 0.0;
+        for (std::size_t k = 0; k < aasCheck.size(); ++k) {
+            double dfSum = 0.0;
+            for (const lumo::sim::SimPoint& s : aasCheck[k]) {
+                double dfPixel = 0.0, dfLine = 0.0;
+                if (SRITGeo2ImgExact(sBlock.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine) !=
+                    1) {
+                    return HUGE_VAL;
+                }
+                dfSum += (dfPixel - s.dfPixel) * (dfPixel - s.dfPixel) +
+                         (dfLine - s.dfLine) * (dfLine - s.dfLine);
+            }
+            dfWorst = std::max(dfWorst, std::sqrt(dfSum / static_cast<double>(aasCheck[k].size())));
+        }
+        return dfWorst;
+    }
+
+  private:
+    void AddTies(int k, int nNext, int nWanted, bool bKnownElevation) {
+        const auto asCandidates = sBlock.asScenes[static_cast<std::size_t>(k)].SamplePoints(
+            600, static_cast<std::uint32_t>(3000 + k * 7 + nNext), 0.0, 1200.0, 0.02);
+        int nFound = 0;
+        for (const lumo::sim::SimPoint& s : asCandidates) {
+            if (nFound == nWanted) break;
+            lumo::sim::SimPoint sNext;
+            if (!lumo::sim::ProjectInto(sBlock.asScenes[static_cast<std::size_t>(nNext)], s, &sNext,
+                                        0.02)) {
+                continue;
+            }
+            const std::string osId = "T" + std::to_string(nTies++);
+            const double dfZ = bKnownElevation ? s.dfZ : LUMO_NULL_VALUE;
+            sBlock.AddTie(k, osId, s, dfZ);
+            sBlock.AddTie(nNext, osId, sNext, dfZ);
+            ++nFound;
+        }
     }
 };
 

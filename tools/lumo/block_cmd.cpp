@@ -18,6 +18,7 @@
 #include "block_io.h"
 #include "cli_error.h"
 #include "commands.h"
+#include "elevation_separation.h"
 #include "fit_refine.h"
 #include "geosys_option.h"
 #include "model_io.h"
@@ -37,13 +38,16 @@ struct BlockOptions {
     bool bNoLeaveOneOut = false;  // skip the one adjustment per control observation
     std::string osRefine;         // --refine TOLERANCE[,MIN_POINTS]
     std::string osElevationScale = "curved";
+    bool bNoAutoConstrain = false;  // never hold weak images by themselves
 };
 
 // How the block is adjusted.
 struct BlockSettings {
     bool bConstrain = false;  // every image's constraint flag set
     int32_t nForm = SRIT_FORM_CURVED_INCIDENCE;
+    std::vector<char> abHeld;  // per image: constraint flag set, its control being weak
 };
+
 
 // A block needs 3 control observations.
 constexpr int kBlockLeastControl = 3;
@@ -64,6 +68,40 @@ std::string Trimmed(const char* psz) {
     std::size_t n = strnlen(psz, SRIT_ID_SIZE);
     while (n > 0 && psz[n - 1] == ' ') --n;
     return std::string(psz, n);
+}
+
+// Each image's elevation separation over its used control observations
+// with heights (elevation_separation.h).
+std::vector<ElevationSeparation> ImageSeparations(const BlockProject& project) {
+    std::vector<ElevationSeparation> separations;
+    for (const BlockImage& image : project.asImages) {
+        const SegmentPtr segment = ReadSegmentFile(image.osSegmentPath);
+        std::vector<ControlSample> samples;
+        for (const BlockGcp& g : project.asGcps) {
+            if (g.bCheck || g.dfZ == LUMO_NULL_VALUE || Upper(g.osImage) != Upper(image.osId)) {
+                continue;
+            }
+            samples.push_back({g.dfPixel, g.dfLine, g.dfZ});
+        }
+        separations.push_back(SeparationOf(*segment, samples));
+    }
+    return separations;
+}
+
+// The settings of the options, with the images whose control points cannot
+// separate the elevation terms held near their orbit values unless the
+// options hold every image or none by itself.
+BlockSettings SettingsFor(const BlockProject& project, const BlockOptions& options,
+                          std::vector<ElevationSeparation>* pSeparations) {
+    BlockSettings settings;
+    settings.bConstrain = options.bConstrain;
+    settings.nForm = FormOfWord(options.osElevationScale);
+    *pSeparations = ImageSeparations(project);
+    for (const ElevationSeparation& separation : *pSeparations) {
+        const bool bWeak = separation.Weakest() < kWeakSeparation;
+        settings.abHeld.push_back(!options.bConstrain && !options.bNoAutoConstrain && bWeak);
+    }
+    return settings;
 }
 
 // A file name for an image identifier: letters, digits, '-' and '_' kept.
@@ -185,11 +223,12 @@ struct BlockResult {
 
 BlockResult ComputeBlock(const BlockProject& project, const BlockSettings& settings) {
     std::vector<SegmentPtr> segments;
-    for (const BlockImage& image : project.asImages) {
-        segments.push_back(ReadSegmentFile(image.osSegmentPath));
+    for (std::size_t k = 0; k < project.asImages.size(); ++k) {
+        segments.push_back(ReadSegmentFile(project.asImages[k].osSegmentPath));
         // The segment's constraint flag asks the adjustment for the
         // pseudo-observations; the written models carry it.
-        if (settings.bConstrain) segments.back()->nSupplementFlag = 1;
+        const bool bHeld = k < settings.abHeld.size() && settings.abHeld[k] != 0;
+        if (settings.bConstrain || bHeld) segments.back()->nSupplementFlag = 1;
     }
     const EphemerisSeg_t& first = *segments.front();
     const std::string geosys =
@@ -344,9 +383,8 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
             "--refine needs the leave-one-out residuals: drop "
             "--no-leave-one-out");
     }
-    BlockSettings settings;
-    settings.bConstrain = options.bConstrain;
-    settings.nForm = FormOfWord(options.osElevationScale);
+    std::vector<ElevationSeparation> separations;
+    BlockSettings settings = SettingsFor(allControl, options, &separations);
     const ControlObservations control = UsedControl(allControl);
     FitResiduals residuals;
     if (!options.bNoLeaveOneOut) {
@@ -355,6 +393,7 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
     }
     const BlockProject project =
         residuals.anDropped.empty() ? allControl : Without(allControl, control, residuals.use);
+    if (!residuals.anDropped.empty()) settings = SettingsFor(project, options, &separations);
     BlockResult r = [&] {
         const Activity activity("lumo block: adjusting " + std::to_string(project.asImages.size()) +
                                 " images");
@@ -375,14 +414,31 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
             (std::filesystem::path(options.osOutputDir) / (FileStem(id) + ".model.json")).string();
         WriteModelFile(path, SritToJson(*models[k]));
         const SRITInfo_t& model = *models[k];
-        report["images"].push_back(
-            {{"id", id},
-             {"model", path},
-             {"sensor", std::string(model.Sensor, strnlen(model.Sensor, SRIT_SENSOR_SIZE))},
-             {"constrained",
-              model.psEphemeris != nullptr && model.psEphemeris->nSupplementFlag != 0},
-             {"controlResiduals", ImageResiduals(project, id, model, false)},
-             {"checkResiduals", ImageResiduals(project, id, model, true)}});
+        const bool bConstrained =
+            model.psEphemeris != nullptr && model.psEphemeris->nSupplementFlag != 0;
+        nlohmann::json image{
+            {"id", id},
+            {"model", path},
+            {"sensor", std::string(model.Sensor, strnlen(model.Sensor, SRIT_SENSOR_SIZE))},
+            {"constrained", bConstrained},
+            {"elevationSeparation",
+             {{"across", separations[k].dfAcross}, {"along", separations[k].dfAlong}}},
+            {"controlResiduals", ImageResiduals(project, id, model, false)},
+            {"checkResiduals", ImageResiduals(project, id, model, true)}};
+        if (bConstrained) {
+            image["constrainedBy"] = options.bConstrain   ? "--constrain"
+                                     : settings.abHeld[k] ? "weak control points"
+                                                          : "segment";
+        }
+        report["images"].push_back(image);
+        if (settings.abHeld[k]) {
+            context.out << "image " << id
+                        << ": its control points cannot separate the elevation terms (out-of-plane "
+                           "spread across "
+                        << FormatShort(separations[k].dfAcross) << ", along "
+                        << FormatShort(separations[k].dfAlong) << " of their height spread, below "
+                        << FormatShort(kWeakSeparation) << "): held near its orbit values\n";
+        }
         context.out << "image " << id << ": wrote " << path << "\n";
     }
     report["controlPoints"] = nlohmann::json::array();
@@ -419,7 +475,8 @@ void RunBlock(const BlockOptions& options, CommandContext& context) {
 void PrintBlockDemo(const std::string& examplesDir, std::ostream& out) {
     const BlockProject project =
         ReadBlockProject((std::filesystem::path(examplesDir) / "block_stereo.json").string());
-    const BlockResult r = ComputeBlock(project, BlockSettings{});
+    std::vector<ElevationSeparation> separations;
+    const BlockResult r = ComputeBlock(project, SettingsFor(project, BlockOptions{}, &separations));
     out << "\nblock adjustment of block_stereo.json: " << project.asImages.size() << " images, "
         << FirstTieObservations(project).size() << " tie points of unknown elevation\n";
     char line[200];
@@ -451,6 +508,9 @@ void AddBlockCommand(CLI::App& app, CommandContext& context) {
                       "hold every image's scale, obliquity and shear terms near the values of "
                       "its orbit (as a segment's constraint flag does); steadies images whose "
                       "few control points cannot separate the elevation terms");
+    command->add_flag("--no-auto-constrain", options->bNoAutoConstrain,
+                      "adjust images whose control points cannot separate the elevation terms "
+                      "like the others (by default they are held near their orbit values)");
     AddElevationScaleOption(*command, options->osElevationScale);
     command->add_option("--refine", options->osRefine,
                         "TOLERANCE[,MIN_POINTS]: drop the control observation with the largest "
