@@ -18,6 +18,7 @@
 #include "lumo.h"
 #include "model_io.h"
 #include "rf_io.h"
+#include "rtcs_io.h"
 #include "fuzz_support.h"
 #include "runtime.h"
 #include "srit_io.h"
@@ -52,6 +53,8 @@ json WriteModel(const LoadedModel& model) {
             return lumo::cli::ApToJson(*static_cast<APInfo_t*>(record), nPixels, nLines);
         case LUMO_CODE_LRS:
             return lumo::cli::LrsToJson(*static_cast<LRSOrbitModel_t*>(record));
+        case LUMO_CODE_RTCS:
+            return lumo::cli::RtcsToJson(*static_cast<RTCSInfo_t*>(record));
         default:
             return lumo::cli::SritToJson(*static_cast<SRITInfo_t*>(record));
     }
