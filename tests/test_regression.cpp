@@ -3,6 +3,7 @@
 
 // The tests are not linked with Eigen's target; its headers sit under eigen3/.
 #include <Eigen/Dense>
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <functional>
@@ -80,132 +81,104 @@ bool AllFinite(const GEOInfo_t& g) {
 
 }  // namespace
 
-TEST(GCPRegression, ExactForEveryOrderWithPixelSizedInputs) {
-    for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
-        const int nTerms = Terms(order);
-        double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
-        for (int k = 0; k < nTerms; ++k) {
-            // Coefficients shrink with the degree so that every term matters over 0..1000.
-            const double scale = std::pow(1000.0, -(kPowers[k][0] + kPowers[k][1]));
-            cx[k] = (1.5 + 0.25 * k) * scale * 100.0;
-            cy[k] = (-0.75 + 0.125 * k) * scale * 100.0;
-        }
-        Gcps g = MakeGcps(8, 0.0, 0.0, 1000.0, [&](double x, double y, double& X, double& Y) {
-            X = Poly(cx, nTerms, x, y);
-            Y = Poly(cy, nTerms, x, y);
-        });
-        const GEOInfo_t info = Fit(g, order);
-        ASSERT_EQ(info.nOrder, order);
-        ASSERT_EQ(info.nTerms, nTerms);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
-        for (int k = 0; k < nTerms; ++k) {
-            const double tol = 1e-9 * std::pow(1000.0, -(kPowers[k][0] + kPowers[k][1])) * 100;
-            EXPECT_NEAR(info.adfXCoeffs[k], cx[k], tol) << "order " << order << " term " << k;
-            EXPECT_NEAR(info.adfYCoeffs[k], cy[k], tol) << "order " << order << " term " << k;
-        }
-        for (int k = nTerms; k < GCP_MAX_TERMS; ++k) EXPECT_EQ(info.adfXCoeffs[k], 0.0);
-        double X = 0.0, Y = 0.0;
-        ASSERT_EQ(GCPTransform(&info, 123.0, 876.0, &X, &Y), 0);
-        EXPECT_NEAR(X, Poly(cx, nTerms, 123.0, 876.0), 1e-8);
-        EXPECT_NEAR(Y, Poly(cy, nTerms, 123.0, 876.0), 1e-8);
-        if (order == 1)
-            for (int k = 0; k < 3; ++k) {
-                EXPECT_NEAR(info.adfAffine[k], cx[k], 1e-9);
-                EXPECT_NEAR(info.adfAffine[3 + k], cy[k], 1e-9);
+TEST(GCPRegression, ExactForEveryOrderWithPixelAndUtmSizedInputs) {
+    // A polynomial in offsets from a scene corner, over pixel-sized inputs
+    // (0..1000) and UTM-sized ones (30 km from 487000, 5120000); the fit must
+    // reproduce it far below a pixel, and give its coefficients when the
+    // inputs are not shifted.
+    const struct {
+        double dfX0, dfY0, dfExtent;
+        int nSide;
+    } aScenes[] = {{0.0, 0.0, 1000.0, 8}, {487000.0, 5120000.0, 30000.0, 9}};
+    for (const auto& sc : aScenes) {
+        for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
+            const int nTerms = Terms(order);
+            double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
+            for (int k = 0; k < nTerms; ++k) {
+                cx[k] = (k == 1 ? 2000.0 : 37.0 / (k + 1));
+                cy[k] = (k == 2 ? -2000.0 : 23.0 / (k + 2));
             }
-    }
-}
-
-TEST(GCPRegression, ExactForEveryOrderWithUtmSizedInputs) {
-    // A smooth mapping from UTM metres to pixels, a polynomial in the offsets
-    // from a scene corner; the fit must reproduce it far below a pixel.
-    for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
-        const int nTerms = Terms(order);
-        double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
-        for (int k = 0; k < nTerms; ++k) {
-            cx[k] = (k == 1 ? 2000.0 : 37.0 / (k + 1));
-            cy[k] = (k == 2 ? -2000.0 : 23.0 / (k + 2));
-        }
-        auto truth = [&](double x, double y, double& X, double& Y) {
-            const double u = (x - 487000.0) / 30000.0, v = (y - 5120000.0) / 30000.0;
-            X = Poly(cx, nTerms, u, v);
-            Y = Poly(cy, nTerms, u, v);
-        };
-        Gcps g = MakeGcps(9, 487000.0, 5120000.0, 30000.0, truth);
-        const GEOInfo_t info = Fit(g, order);
-        ASSERT_EQ(info.nOrder, order);
-        for (double x : {489123.0, 500000.0, 516500.0})
-            for (double y : {5121000.0, 5135000.0, 5149000.0}) {
-                double X = 0.0, Y = 0.0, eX = 0.0, eY = 0.0;
-                ASSERT_EQ(GCPTransform(&info, x, y, &X, &Y), 0);
-                truth(x, y, eX, eY);
-                EXPECT_NEAR(X, eX, 1e-7) << "order " << order;
-                EXPECT_NEAR(Y, eY, 1e-7) << "order " << order;
+            auto truth = [&](double x, double y, double& X, double& Y) {
+                const double u = (x - sc.dfX0) / sc.dfExtent, v = (y - sc.dfY0) / sc.dfExtent;
+                X = Poly(cx, nTerms, u, v);
+                Y = Poly(cy, nTerms, u, v);
+            };
+            Gcps g = MakeGcps(sc.nSide, sc.dfX0, sc.dfY0, sc.dfExtent, truth);
+            const GEOInfo_t info = Fit(g, order);
+            ASSERT_EQ(info.nOrder, order);
+            ASSERT_EQ(info.nTerms, nTerms);
+            EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
+            for (int k = nTerms; k < GCP_MAX_TERMS; ++k) EXPECT_EQ(info.adfXCoeffs[k], 0.0);
+            if (sc.dfX0 == 0.0) {
+                for (int k = 0; k < nTerms; ++k) {
+                    const int nDegree = kPowers[k][0] + kPowers[k][1];
+                    const double scale = std::pow(sc.dfExtent, -nDegree);
+                    EXPECT_NEAR(info.adfXCoeffs[k], cx[k] * scale, 1e-9 * 2000.0 * scale) << k;
+                    EXPECT_NEAR(info.adfYCoeffs[k], cy[k] * scale, 1e-9 * 2000.0 * scale) << k;
+                }
+                if (order == 1) {
+                    for (int k = 0; k < 3; ++k) {
+                        EXPECT_NEAR(info.adfAffine[k], info.adfXCoeffs[k], 1e-9);
+                        EXPECT_NEAR(info.adfAffine[3 + k], info.adfYCoeffs[k], 1e-9);
+                    }
+                }
             }
+            for (double fx : {0.07, 0.43, 0.98}) {
+                for (double fy : {0.03, 0.5, 0.97}) {
+                    const double x = sc.dfX0 + fx * sc.dfExtent, y = sc.dfY0 + fy * sc.dfExtent;
+                    double X = 0.0, Y = 0.0, eX = 0.0, eY = 0.0;
+                    ASSERT_EQ(GCPTransform(&info, x, y, &X, &Y), 0);
+                    truth(x, y, eX, eY);
+                    EXPECT_NEAR(X, eX, 1e-7) << "order " << order;
+                    EXPECT_NEAR(Y, eY, 1e-7) << "order " << order;
+                }
+            }
+        }
     }
 }
 
 TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
     nova::ResetWarningCount();
     nova::ErrorSink previous = nova::SetErrorSink([](const nova::ErrorReport&) {});
-
-    // One point: a shift.
-    {
-        Gcps g{{100.0}, {200.0}, {110.0}, {220.0}};
-        const GEOInfo_t info = Fit(g, 3);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
-        EXPECT_EQ(info.nOrder, 1);
+    auto expectAt = [](const GEOInfo_t& info, double x, double y, double eX, double eY) {
         double X = 0.0, Y = 0.0;
-        GCPTransform(&info, 105.0, 195.0, &X, &Y);
-        EXPECT_NEAR(X, 115.0, 1e-9);
-        EXPECT_NEAR(Y, 215.0, 1e-9);
-        EXPECT_NEAR(info.adfAffine[0], 10.0, 1e-9);
-        EXPECT_NEAR(info.adfAffine[1], 1.0, 1e-12);
-        EXPECT_NEAR(info.adfAffine[5], 1.0, 1e-12);
+        GCPTransform(&info, x, y, &X, &Y);
+        EXPECT_NEAR(X, eX, 1e-9);
+        EXPECT_NEAR(Y, eY, 1e-9);
         EXPECT_TRUE(AllFinite(info));
-    }
+    };
+    // One point: a shift; coincident inputs: the mean shift.
+    Gcps one{{100.0}, {200.0}, {110.0}, {220.0}};
+    GEOInfo_t info = Fit(one, 3);
+    EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
+    EXPECT_EQ(info.nOrder, 1);
+    expectAt(info, 105.0, 195.0, 115.0, 215.0);
+    Gcps same{{3.0, 3.0, 3.0}, {4.0, 4.0, 4.0}, {10.0, 12.0, 14.0}, {1.0, 1.0, 4.0}};
+    info = Fit(same, 1);
+    EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
+    expectAt(info, 3.0, 4.0, 12.0, 2.0);
     // Two points: rotation by 90 degrees, scale 2 and a shift, reproduced exactly.
-    {
-        Gcps g{{0.0, 10.0}, {0.0, 0.0}, {5.0, 5.0}, {7.0, 27.0}};
-        const GEOInfo_t info = Fit(g, 2);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
-        EXPECT_NEAR(info.adfXCoeffs[0], 5.0, 1e-9);
-        EXPECT_NEAR(info.adfXCoeffs[1], 0.0, 1e-12);
-        EXPECT_NEAR(info.adfXCoeffs[2], -2.0, 1e-12);
-        EXPECT_NEAR(info.adfYCoeffs[0], 7.0, 1e-9);
-        EXPECT_NEAR(info.adfYCoeffs[1], 2.0, 1e-12);
-        EXPECT_NEAR(info.adfYCoeffs[2], 0.0, 1e-12);
-        EXPECT_TRUE(AllFinite(info));
-    }
+    Gcps two{{0.0, 10.0}, {0.0, 0.0}, {5.0, 5.0}, {7.0, 27.0}};
+    info = Fit(two, 2);
+    EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
+    expectAt(info, 0.0, 0.0, 5.0, 7.0);
+    expectAt(info, 0.0, 1.0, 3.0, 7.0);
+    expectAt(info, 1.0, 0.0, 5.0, 9.0);
     // Collinear points, UTM-sized: a similarity that reproduces the line.
-    {
-        Gcps g;
-        for (int i = 0; i < 6; ++i) {
-            const double t = 1000.0 * i;
-            g.x1.push_back(500000.0 + 0.6 * t);
-            g.y1.push_back(4000000.0 + 0.8 * t);
-            g.x2.push_back(10.0 + t / 30.0);
-            g.y2.push_back(20.0);
-        }
-        const GEOInfo_t info = Fit(g, 2);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
-        EXPECT_TRUE(AllFinite(info));
-        double rmsX = -1.0, rmsY = -1.0;
-        GCPRootMeanSq(const_cast<GEOInfo_t*>(&info), g.x1.data(), g.y1.data(), g.x2.data(),
-                      g.y2.data(), g.n(), &rmsX, &rmsY);
-        EXPECT_LT(rmsX, 1e-8);
-        EXPECT_LT(rmsY, 1e-8);
+    Gcps line;
+    for (int i = 0; i < 6; ++i) {
+        const double t = 1000.0 * i;
+        line.x1.push_back(500000.0 + 0.6 * t);
+        line.y1.push_back(4000000.0 + 0.8 * t);
+        line.x2.push_back(10.0 + t / 30.0);
+        line.y2.push_back(20.0);
     }
-    // Coincident inputs: the mean shift.
-    {
-        Gcps g{{3.0, 3.0, 3.0}, {4.0, 4.0, 4.0}, {10.0, 12.0, 14.0}, {1.0, 1.0, 4.0}};
-        const GEOInfo_t info = Fit(g, 1);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_SHIFT);
-        double X = 0.0, Y = 0.0;
-        GCPTransform(&info, 3.0, 4.0, &X, &Y);
-        EXPECT_NEAR(X, 12.0, 1e-12);
-        EXPECT_NEAR(Y, 2.0, 1e-12);
-    }
+    info = Fit(line, 2);
+    EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
+    double rmsX = -1.0, rmsY = -1.0;
+    GCPRootMeanSq(&info, line.x1.data(), line.y1.data(), line.x2.data(), line.y2.data(), line.n(),
+                  &rmsX, &rmsY);
+    EXPECT_LT(std::max(rmsX, rmsY), 1e-8);
     // Fewer points than the order needs: 8 points determine order 2, not 3;
     // 4 points determine only the affine map.
     for (const auto& [side, order, expected] : {std::tuple{3, 3, 2}, std::tuple{2, 2, 1}}) {
@@ -214,35 +187,28 @@ TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
             Y = 3.0 - x + 0.5 * y;
         });
         if (side == 3) {  // drop one of the nine points
-            g.x1.pop_back();
-            g.y1.pop_back();
-            g.x2.pop_back();
-            g.y2.pop_back();
+            for (auto* v : {&g.x1, &g.y1, &g.x2, &g.y2}) v->pop_back();
         }
         int fitted = order;
-        GEOInfo_t info;
         GCPRegression2(&info, "PIXEL", g.x1.data(), g.y1.data(), "METRE", g.x2.data(), g.y2.data(),
                        g.n(), &fitted, 0, nullptr, nullptr);
         EXPECT_EQ(fitted, expected);
         EXPECT_EQ(info.nOrder, expected);
-        EXPECT_TRUE(AllFinite(info));
-        EXPECT_NEAR(info.adfXCoeffs[1], 2.0, 1e-9);
+        expectAt(info, 10.0, 20.0, 1.0, 3.0);
     }
     // Points on a circle do not determine a second-order fit (x² + y² is constant).
-    {
-        Gcps g;
-        for (int i = 0; i < 12; ++i) {
-            const double a = 2.0 * M_PI * i / 12;
-            g.x1.push_back(std::cos(a));
-            g.y1.push_back(std::sin(a));
-            g.x2.push_back(3.0 * std::cos(a) + 1.0);
-            g.y2.push_back(std::sin(a) - 2.0);
-        }
-        const GEOInfo_t info = Fit(g, 2);
-        EXPECT_EQ(info.nOrder, 1);
-        EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
-        EXPECT_NEAR(info.adfXCoeffs[1], 3.0, 1e-9);
+    Gcps circle;
+    for (int i = 0; i < 12; ++i) {
+        const double a = 2.0 * M_PI * i / 12;
+        circle.x1.push_back(std::cos(a));
+        circle.y1.push_back(std::sin(a));
+        circle.x2.push_back(3.0 * std::cos(a) + 1.0);
+        circle.y2.push_back(std::sin(a) - 2.0);
     }
+    info = Fit(circle, 2);
+    EXPECT_EQ(info.nOrder, 1);
+    EXPECT_EQ(info.nFitKind, GCP_FIT_POLYNOMIAL);
+    expectAt(info, 0.5, 0.25, 2.5, -1.75);
     EXPECT_EQ(nova::GetWarningCount(), 7u);  // one warning per lowered fit
     nova::SetErrorSink(previous);
 }

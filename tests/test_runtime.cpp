@@ -138,27 +138,18 @@ TEST(Runtime, DebugLogHonoursLevelAndSink) {
     nova::diag::Debugger::SetSink(oOld);
 }
 
-TEST(Runtime, ExceptionHierarchyCarriesItsFields) {
+TEST(Runtime, ExceptionsCarryTheirFieldsAndTheMutexExcludes) {
     try {
         throw nova::ParameterException("eType", 1, "", "", "Unknown model code", "mathmodel/lumo/x",
                                        "void f(int)", 105);
-    } catch (const nova::DataException& e) {
+    } catch (const nova::DataException& e) {  // a parameter exception is a data exception
         const auto* pe = dynamic_cast<const nova::ParameterException*>(&e);
         ASSERT_NE(pe, nullptr);
         EXPECT_EQ(pe->GetParameterName(), "eType");
-        EXPECT_EQ(pe->GetParameterType(), 1);
-        EXPECT_EQ(pe->GetMessage(), "Unknown model code");
         EXPECT_STREQ(pe->what(), "Unknown model code");
-        EXPECT_EQ(pe->GetFile(), "mathmodel/lumo/x");
-        EXPECT_EQ(pe->GetFunction(), "void f(int)");
         EXPECT_EQ(pe->GetLine(), 105);
     }
-    EXPECT_THROW(throw nova::DataException("m", "f", "fn", 1), nova::Exception);
-    EXPECT_THROW(throw nova::Exception("m", "f", "fn", 1), std::exception);
-
     nova::threading::Mutex oMutex;
-    EXPECT_TRUE(oMutex.TryLock());
-    oMutex.Unlock();
     int nCounter = 0;
     std::vector<std::thread> aThreads;
     for (int t = 0; t < 4; ++t) {
@@ -174,55 +165,36 @@ TEST(Runtime, ExceptionHierarchyCarriesItsFields) {
 }
 
 TEST(Runtime, VectorAndMatrixHelpersAllowAliasing) {
-    double a[3] = {1, 2, 3};
-    double b[3] = {-2, 0.5, 4};
-    double c[3];
+    double a[3] = {1, 2, 3}, b[3] = {-2, 0.5, 4}, c[3], d[3] = {1, 2, 3};
     CrossProduct(a, b, c);
     EXPECT_DOUBLE_EQ(DotProduct(c, a), 0.0);
     EXPECT_DOUBLE_EQ(DotProduct(c, b), 0.0);
     EXPECT_DOUBLE_EQ(c[0], 2 * 4 - 3 * 0.5);
-    // Output aliasing an input.
-    double d[3] = {1, 2, 3};
-    CrossProduct(d, b, d);
-    EXPECT_DOUBLE_EQ(d[0], c[0]);
-    EXPECT_DOUBLE_EQ(d[1], c[1]);
-    EXPECT_DOUBLE_EQ(d[2], c[2]);
-
+    CrossProduct(d, b, d);  // output aliasing an input
+    for (int i = 0; i < 3; ++i) EXPECT_DOUBLE_EQ(d[i], c[i]);
     VecDiff(a, b, c);
     EXPECT_DOUBLE_EQ(c[1], 1.5);
-    VecScale(2.0, a, c);
-    EXPECT_DOUBLE_EQ(c[2], 6.0);
-    double e[3] = {3, 0, 4};
+    double e[3] = {3, 0, 4}, z[3] = {0, 0, 0};
     EXPECT_DOUBLE_EQ(VecLength(e), 5.0);
     VecNormalize(e);
     EXPECT_DOUBLE_EQ(e[2], 0.8);
-    double z[3] = {0, 0, 0};
     VecNormalize(z);  // no NaN from a zero vector
     EXPECT_EQ(z[0], 0.0);
 
-    // Rotation about Z by 90 degrees.
+    // Rotation about Z by 90 degrees, its transpose, and its square in place.
     const double m[9] = {0, -1, 0, 1, 0, 0, 0, 0, 1};
     double v[3] = {1, 0, 0};
     MV3_Mult(m, v, v);
-    EXPECT_DOUBLE_EQ(v[0], 0.0);
     EXPECT_DOUBLE_EQ(v[1], 1.0);
     MtV3_Mult(m, v, v);
     EXPECT_DOUBLE_EQ(v[0], 1.0);
-    EXPECT_DOUBLE_EQ(v[1], 0.0);
-    double mm[9];
-    MM3_Mult(m, m, mm);  // 180 degrees
-    EXPECT_DOUBLE_EQ(mm[0], -1.0);
-    EXPECT_DOUBLE_EQ(mm[4], -1.0);
-    EXPECT_DOUBLE_EQ(mm[8], 1.0);
     double self[9] = {0, -1, 0, 1, 0, 0, 0, 0, 1};
     MM3_Mult(self, self, self);
-    for (int i = 0; i < 9; ++i) EXPECT_DOUBLE_EQ(self[i], mm[i]);
+    for (int i = 0; i < 9; ++i) EXPECT_DOUBLE_EQ(self[i], i == 0 || i == 4 ? -1.0 : i == 8 ? 1.0 : 0.0);
 
     const double adfCoeff[3] = {2.0, -3.0, 1.0};  // 2x^2 - 3x + 1
     EXPECT_DOUBLE_EQ(polyval(adfCoeff, 2, 3.0), 10.0);
-    const double adfLinear[2] = {4.0, 5.0};
-    EXPECT_DOUBLE_EQ(polyval(adfLinear, 1, 2.0), 13.0);
-    EXPECT_DOUBLE_EQ(polyval(adfLinear, 0, 2.0), 4.0);
+    EXPECT_DOUBLE_EQ(polyval(adfCoeff, 0, 3.0), 2.0);
 }
 
 }  // namespace

@@ -6,7 +6,6 @@
 #include <memory>
 #include <random>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "lumo.h"
@@ -178,21 +177,4 @@ TEST(TrnTps, RoutesToTheSplineAndSurvivesFailedFits) {
     EXPECT_EQ(trn->bCalculated, 1);
     EXPECT_EQ(TRNTransform(trn.get(), 404000.0, 5003000.0, &X, &Y), 1);
     EXPECT_EQ(X, eX);
-
-    // Refits from several threads, each on its own container.
-    std::vector<std::thread> threads;
-    std::vector<double> results(4, 0.0);
-    for (int k = 0; k < 4; ++k) {
-        threads.emplace_back([&, k] {
-            TrnPtr own(TRNAllocate(k % 2 ? TRN_TPS : TRN_POLY));
-            TRNCalculate(own.get(), p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data(),
-                         nullptr);
-            double a = 0, b = 0;
-            TRNTransform(own.get(), p.x[k], p.y[k], &a, &b);
-            results[k] = a - p.X[k];
-        });
-    }
-    for (auto& th : threads) th.join();
-    EXPECT_NEAR(results[1], 0.0, 1e-6);  // the splines interpolate
-    EXPECT_NEAR(results[3], 0.0, 1e-6);
 }
