@@ -80,6 +80,17 @@ Point To1A(const SRITInfo_t* psModel, Point s) {
 const Point kPoints[] = {
     {0.0, 0.0}, {1.0, 1.0}, {2999.5, 1500.25}, {-12.0, 6000.0}, {5999.0, 3.75}};
 
+// 1A -> 1B -> 1A and 1B -> 1A -> 1B give the points back.
+void ExpectRoundTrips(const SRITInfo_t* psModel, double dfTol) {
+    for (const Point& s : kPoints) {
+        for (const Point& sBack :
+             {To1A(psModel, To1B(psModel, s)), To1B(psModel, To1A(psModel, s))}) {
+            EXPECT_NEAR(sBack.p, s.p, dfTol);
+            EXPECT_NEAR(sBack.l, s.l, dfTol);
+        }
+    }
+}
+
 TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
     for (int i = 0; i < EPH_LEVEL_COEF_COUNT; ++i) K(i) = 3.0 + i;
     SetQ(4, 5, 6, 7);
@@ -87,16 +98,12 @@ TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
     for (int nForm : {0, 1, 19, 21, 38, 40, -20}) {
         SetForm(nForm);
         for (const Point& s : kPoints) {
-            const Point sB = To1B(&msModel, s);
-            const Point sA = To1A(&msModel, s);
-            EXPECT_EQ(sB.p, s.p);
-            EXPECT_EQ(sB.l, s.l);
-            EXPECT_EQ(sA.p, s.p);
-            EXPECT_EQ(sA.l, s.l);
             Point sC = s;
             SPOT1BTo1AControlPoint_imp(apsSegs, 0, &sC.p, &sC.l);
-            EXPECT_EQ(sC.p, s.p);
-            EXPECT_EQ(sC.l, s.l);
+            for (const Point& sOut : {To1B(&msModel, s), To1A(&msModel, s), sC}) {
+                EXPECT_EQ(sOut.p, s.p);
+                EXPECT_EQ(sOut.l, s.l);
+            }
         }
     }
     // A record without a segment, null records and null outputs are left alone.
@@ -115,18 +122,8 @@ TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
     EXPECT_EQ(dfLine, 5.0);
 }
 
-TEST_F(LevelConversion, CubicFormIdentityExactValuesAndInverse) {
+TEST_F(LevelConversion, CubicFormExactValuesAndInverse) {
     SetForm(20);
-    K(1) = K(5) = K(9) = K(13) = 1.0;
-    for (const Point& s : kPoints) {
-        const Point sB = To1B(&msModel, s);
-        const Point sA = To1A(&msModel, s);
-        EXPECT_EQ(sB.p, s.p);
-        EXPECT_EQ(sB.l, s.l);
-        EXPECT_EQ(sA.p, s.p);
-        EXPECT_EQ(sA.l, s.l);
-    }
-
     // Full cubics against a term-by-term evaluation with std::pow.
     for (int i = 0; i < 20; ++i) K(i) = 0.5 + 0.25 * i;
     K(2) = 1e-4, K(3) = -2e-8, K(6) = 3e-5, K(7) = 1e-9, K(18) = -1e-5, K(19) = 4e-9;
@@ -152,14 +149,7 @@ TEST_F(LevelConversion, CubicFormIdentityExactValuesAndInverse) {
                  d = 0.98;  // l' = a + b l, p' = (3 + 0.01 l') + (c + d p)
     K(0) = a, K(1) = b, K(16) = 3.0, K(17) = 0.01, K(4) = c, K(5) = d;
     K(8) = -a / b, K(9) = 1.0 / b, K(12) = -c / d, K(13) = 1.0 / d;
-    for (const Point& s : kPoints) {
-        const Point sBack = To1A(&msModel, To1B(&msModel, s));
-        EXPECT_NEAR(sBack.p, s.p, 1e-9);
-        EXPECT_NEAR(sBack.l, s.l, 1e-9);
-        const Point sForth = To1B(&msModel, To1A(&msModel, s));
-        EXPECT_NEAR(sForth.p, s.p, 1e-9);
-        EXPECT_NEAR(sForth.l, s.l, 1e-9);
-    }
+    ExpectRoundTrips(&msModel, 1e-9);
 }
 
 TEST_F(LevelConversion, RatioFormExactValuesAndInverse) {
@@ -178,14 +168,7 @@ TEST_F(LevelConversion, RatioFormExactValuesAndInverse) {
     EXPECT_NEAR(sB.p, sExpected.p, 1e-9 * std::fabs(sExpected.p));
     EXPECT_NEAR(sB.l, sExpected.l, 1e-12 * std::fabs(sExpected.l));
 
-    for (const Point& sIn : kPoints) {
-        const Point sBack = To1A(&msModel, To1B(&msModel, sIn));
-        EXPECT_NEAR(sBack.p, sIn.p, 1e-8);
-        EXPECT_NEAR(sBack.l, sIn.l, 1e-8);
-        const Point sForth = To1B(&msModel, To1A(&msModel, sIn));
-        EXPECT_NEAR(sForth.p, sIn.p, 1e-8);
-        EXPECT_NEAR(sForth.l, sIn.l, 1e-8);
-    }
+    ExpectRoundTrips(&msModel, 1e-8);
     // The exported entry points give the implementation's results.
     Point sEntry = s;
     SPOT1ATo1B(&msModel, &sEntry.p, &sEntry.l);

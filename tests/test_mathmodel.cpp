@@ -18,6 +18,7 @@
 #include "points_io.h"
 #include "support/model_records.h"
 #include "support/model_stubs.h"
+#include "support/warnings.h"
 
 namespace nova {
 namespace mathmodel {
@@ -178,9 +179,8 @@ TEST(LumoMathModel, ConstructionFailuresThrowExactExceptions) {
                    kFnInitModel);
     CatchParameter([] { nm::LumoMathModel m(4, nullptr); }, "pData", "null pointer", 312,
                    kFnInitModel);
-    Catch<nova::ParameterException>(
-        [&] { nm::LumoMathModel m(nm::LUMO_MODEL_CODE11, poly.get()); },
-        "Unknown model code passed to LumoMathModel constructor", 105);
+    Catch<nova::ParameterException>([&] { nm::LumoMathModel m(nm::LUMO_MODEL_CODE11, poly.get()); },
+                                    "Unknown model code passed to LumoMathModel constructor", 105);
     // Types and codes the object does not wrap are parameter errors too.
     for (nm::LumoModelType t : {nm::LUMO_MODEL_AP, nm::LUMO_MODEL_RF, nm::LUMO_MODEL_CODE12}) {
         EXPECT_THROW(nm::LumoMathModel(t, poly.get()), nova::ParameterException) << t;
@@ -292,18 +292,16 @@ TEST(LumoMathModel, NotThreadSafeObjectLogsAndThrowsFromBlocks) {
     PolyPtr poly = MakePoly();
     nm::LumoMathModel m(4, poly.get());
     Access::SetThreadSafe(m, false);
-    std::vector<nova::diag::DebugRecord> records;
-    const int oldLevel = nova::diag::Debugger::moDebugLevel;
-    nova::diag::Debugger::SetDebugLevel(1);
-    auto oldSink = nova::diag::Debugger::SetSink(
-        [&records](const nova::diag::DebugRecord& r) { records.push_back(r); });
     double a = 5, b = 6;
-    EXPECT_EQ(m.GroundToImage(1.0, 2.0, 0.0, a, b, false), -1);
-    EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);
-    nova::diag::Debugger::SetDebugLevel(0);
-    EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);  // silent at level 0
-    nova::diag::Debugger::SetSink(oldSink);
-    nova::diag::Debugger::SetDebugLevel(oldLevel);
+    std::vector<nova::diag::DebugRecord> records;
+    {
+        lumo::support::DebugCapture oLog(1);
+        EXPECT_EQ(m.GroundToImage(1.0, 2.0, 0.0, a, b, false), -1);
+        EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);
+        nova::diag::Debugger::SetDebugLevel(0);
+        EXPECT_EQ(m.ImageToGround(1.0, 2.0, 0.0, a, b, false), -1);  // silent at level 0
+        records = oLog.maoRecords;
+    }
     EXPECT_EQ(a, 5);
     EXPECT_EQ(b, 6);
     ASSERT_EQ(records.size(), 2u);

@@ -120,22 +120,15 @@ TEST(Runtime, ScanningFixedWidthFields) {
 }
 
 TEST(Runtime, DebugLogHonoursLevelAndSink) {
-    std::vector<nova::diag::DebugRecord> aRecords;
-    auto oOld = nova::diag::Debugger::SetSink(
-        [&](const nova::diag::DebugRecord& r) { aRecords.push_back(r); });
-    nova::diag::Debugger::SetDebugLevel(0);
+    lumo::support::DebugCapture oOff(0);
     nova::diag::Debugger::Debug("off", 1, "lumokit", "mathmodel/lumo/poly", 1);
-    EXPECT_TRUE(aRecords.empty());
-    nova::diag::Debugger::SetDebugLevel(1);
-    EXPECT_EQ(nova::diag::Debugger::GetDebugLevel(), 1u);
+    EXPECT_TRUE(oOff.maoRecords.empty());
+    lumo::support::DebugCapture oOn(1);
     nova::diag::Debugger::Debug("on", 1, "lumokit", "mathmodel/lumo/poly", 10);
     nova::diag::Debugger::Debug("too detailed", 2, "lumokit", "mathmodel/lumo/poly", 11);
-    ASSERT_EQ(aRecords.size(), 1u);
-    EXPECT_EQ(aRecords[0].osMessage, "on");
-    EXPECT_EQ(aRecords[0].osModule, "lumokit");
-    EXPECT_EQ(aRecords[0].nLine, 10);
-    nova::diag::Debugger::SetDebugLevel(0);
-    nova::diag::Debugger::SetSink(oOld);
+    ASSERT_EQ(oOn.maoRecords.size(), 1u);
+    EXPECT_EQ(oOn.maoRecords[0].osMessage, "on");
+    EXPECT_EQ(oOn.maoRecords[0].nLine, 10);
 }
 
 TEST(Runtime, ExceptionsCarryTheirFieldsAndTheMutexExcludes) {
@@ -190,7 +183,8 @@ TEST(Runtime, VectorAndMatrixHelpersAllowAliasing) {
     EXPECT_DOUBLE_EQ(v[0], 1.0);
     double self[9] = {0, -1, 0, 1, 0, 0, 0, 0, 1};
     MM3_Mult(self, self, self);
-    for (int i = 0; i < 9; ++i) EXPECT_DOUBLE_EQ(self[i], i == 0 || i == 4 ? -1.0 : i == 8 ? 1.0 : 0.0);
+    for (int i = 0; i < 9; ++i)
+        EXPECT_DOUBLE_EQ(self[i], i == 0 || i == 4 ? -1.0 : i == 8 ? 1.0 : 0.0);
 
     const double adfCoeff[3] = {2.0, -3.0, 1.0};  // 2x^2 - 3x + 1
     EXPECT_DOUBLE_EQ(polyval(adfCoeff, 2, 3.0), 10.0);

@@ -10,6 +10,7 @@
 
 #include "lumo.h"
 #include "runtime.h"
+#include "support/warnings.h"
 
 namespace {
 
@@ -73,21 +74,14 @@ TEST(SensorCatalogue, ModelClasses) {
 }
 
 TEST(SensorCatalogue, GetModelWritesADebugMessageWhenLevelIsSet) {
-    std::vector<nova::diag::DebugRecord> asRecords;
-    auto oOldSink = nova::diag::Debugger::SetSink(
-        [&](const nova::diag::DebugRecord& r) { asRecords.push_back(r); });
-    const int nOldLevel = nova::diag::Debugger::moDebugLevel;
-    nova::diag::Debugger::SetDebugLevel(0);
+    lumo::support::DebugCapture oOff(0);
     GetModel(55);
-    EXPECT_TRUE(asRecords.empty());
-    nova::diag::Debugger::SetDebugLevel(1);
+    EXPECT_TRUE(oOff.maoRecords.empty());
+    lumo::support::DebugCapture oOn(1);
     EXPECT_EQ(GetModel(55), 1);
-    nova::diag::Debugger::SetDebugLevel(nOldLevel);
-    nova::diag::Debugger::SetSink(oOldSink);
-    ASSERT_EQ(asRecords.size(), 1u);
-    EXPECT_EQ(asRecords[0].osMessage, "Get Model nSensor=55\n");
-    EXPECT_EQ(asRecords[0].osModule, "lumokit");
-    EXPECT_EQ(asRecords[0].osFile, "mathmodel/lumo/calcfunc");
+    ASSERT_EQ(oOn.maoRecords.size(), 1u);
+    EXPECT_EQ(oOn.maoRecords[0].osMessage, "Get Model nSensor=55\n");
+    EXPECT_EQ(oOn.maoRecords[0].osFile, "mathmodel/lumo/calcfunc");
 }
 
 }  // namespace

@@ -11,6 +11,7 @@
 #include "lumo.h"
 #include "regression.h"
 #include "runtime.h"
+#include "support/warnings.h"
 
 namespace {
 
@@ -19,17 +20,7 @@ struct TrnDeleter {
 };
 using TrnPtr = std::unique_ptr<TRNInfo_t, TrnDeleter>;
 
-class WarningRecorder {
-  public:
-    WarningRecorder() {
-        moOld = nova::SetErrorSink([this](const nova::ErrorReport& r) { aoReports.push_back(r); });
-    }
-    ~WarningRecorder() { nova::SetErrorSink(moOld); }
-    std::vector<nova::ErrorReport> aoReports;
-
-  private:
-    nova::ErrorSink moOld;
-};
+using WarningRecorder = lumo::support::WarningCapture;
 
 struct Points {
     std::vector<double> x, y, X, Y;
@@ -80,12 +71,12 @@ TEST(TrnContainer, UnknownKindsWarnOnceAndAreNoOps) {
     for (int kind : {0, 7, -1, -6}) {
         WarningRecorder warnings;
         TrnPtr trn(TRNAllocate(kind));
-        ASSERT_EQ(warnings.aoReports.size(), 1u);
-        EXPECT_EQ(warnings.aoReports[0].nCode, 11);
-        EXPECT_FALSE(warnings.aoReports[0].bFatal);
+        ASSERT_EQ(warnings.maoReports.size(), 1u);
+        EXPECT_EQ(warnings.maoReports[0].nCode, 11);
+        EXPECT_FALSE(warnings.maoReports[0].bFatal);
         const std::string expected =
             "Illegal nType (" + std::to_string(kind) + ") passed to TRNAllocate().";
-        EXPECT_NE(warnings.aoReports[0].osText.find(expected), std::string::npos);
+        EXPECT_NE(warnings.maoReports[0].osText.find(expected), std::string::npos);
         EXPECT_EQ(trn->pModel, nullptr);
         TRNCalculate(trn.get(), p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data(), nullptr);
         EXPECT_EQ(trn->bCalculated, 0);
@@ -99,7 +90,7 @@ TEST(TrnContainer, UnknownKindsWarnOnceAndAreNoOps) {
                       &rx, &ry);
         EXPECT_EQ(rx, 5.0);  // left untouched
         EXPECT_EQ(ry, 5.0);
-        EXPECT_EQ(warnings.aoReports.size(), 1u);
+        EXPECT_EQ(warnings.maoReports.size(), 1u);
     }
 }
 

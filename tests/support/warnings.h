@@ -1,4 +1,5 @@
-// Collects the numbered warnings reported while the object lives.
+// Collects the numbered warnings, or the debug records, reported while the
+// object lives.
 #pragma once
 
 #include <vector>
@@ -27,6 +28,29 @@ class WarningCapture {
 
   private:
     nova::ErrorSink moPrevious;
+};
+
+// Sets the debug level and collects the debug records while the object
+// lives; the former level and sink come back after.
+class DebugCapture {
+  public:
+    explicit DebugCapture(int nLevel) : mnPreviousLevel(nova::diag::Debugger::moDebugLevel) {
+        nova::diag::Debugger::SetDebugLevel(nLevel);
+        moPrevious = nova::diag::Debugger::SetSink(
+            [this](const nova::diag::DebugRecord& r) { maoRecords.push_back(r); });
+    }
+    ~DebugCapture() {
+        nova::diag::Debugger::SetSink(moPrevious);
+        nova::diag::Debugger::SetDebugLevel(mnPreviousLevel);
+    }
+    DebugCapture(const DebugCapture&) = delete;
+    DebugCapture& operator=(const DebugCapture&) = delete;
+
+    std::vector<nova::diag::DebugRecord> maoRecords;
+
+  private:
+    int mnPreviousLevel;
+    nova::diag::Debugger::Sink moPrevious;
 };
 
 }  // namespace support
