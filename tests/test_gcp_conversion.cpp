@@ -3,15 +3,8 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
-
-#include <unistd.h>
 
 #include "cli.h"
 #include "lumo_gcp.h"
@@ -213,15 +206,14 @@ TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
 using lumo::support::RunResult;
 using lumo::support::RunTool;
 
-std::string Scratch(const std::string& osName) {
-    return (std::filesystem::temp_directory_path() /
-            ("lumo_gcps_" + std::to_string(getpid()) + "_" + osName))
-        .string();
-}
+class GcpsConvertCommand : public lumo::support::ScratchDirTest {
+  protected:
+    GcpsConvertCommand() : ScratchDirTest("lumo_gcps_") {}
+};
 
-TEST(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
+TEST_F(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
     const std::string osInput = std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31_gcps.csv";
-    const std::string osOutput = Scratch("out.csv");
+    const std::string osOutput = Path("out.csv");
     const RunResult sRun = RunTool({"gcps", "convert", "--geosys", "UTM 31 U D000", "--height-ref",
                                     "M", osInput, "-o", osOutput});
     ASSERT_EQ(sRun.nCode, 0) << sRun.osErr;
@@ -229,14 +221,11 @@ TEST(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
         lumo::cli::ReadPointsFile(osInput, lumo::cli::PointKind::ControlPoint);
     const lumo::cli::PointSet sOut =
         lumo::cli::ReadPointsFile(osOutput, lumo::cli::PointKind::ControlPoint);
-    std::filesystem::remove(osOutput);
 
     // The library's conversion of the same points, written without loss.
     std::vector<ControlPoint_t> asExpected;
-    asExpected.reserve(sIn.asPoints.size());
-    for (const auto& p : sIn.asPoints) {
+    for (const auto& p : sIn.asPoints)
         asExpected.push_back({p.dfPixel, p.dfLine, p.dfX, p.dfY, p.dfZ});
-    }
     ConvertGcpsToWgs84Ell(Projection("UTM 31 U D000"), "M", asExpected);
     ASSERT_EQ(sOut.asPoints.size(), asExpected.size());
     ASSERT_TRUE(sOut.bHasId && sOut.bHasZ);
@@ -256,13 +245,11 @@ TEST(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
         << sStdout.osOut;
 }
 
-TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
-    const std::string osInput = Scratch("in.csv");
-    std::ofstream(osInput) << "id,pixel,line,x,y,z\nA,1,2,5,52,0\nB,3,4,5,95,0\n";
-    const std::string osOutput = Scratch("kept.csv");
-    std::ofstream(osOutput) << "old contents\n";
-    const std::string osNoZ = Scratch("noz.csv");
-    std::ofstream(osNoZ) << "id,pixel,line,x,y\nA,1,2,5,52\n";
+TEST_F(GcpsConvertCommand, ErrorsNameTheBadValue) {
+    const std::string osInput =
+        Write("in.csv", "id,pixel,line,x,y,z\nA,1,2,5,52,0\nB,3,4,5,95,0\n");
+    const std::string osOutput = Write("kept.csv", "old contents\n");
+    const std::string osNoZ = Write("noz.csv", "id,pixel,line,x,y\nA,1,2,5,52\n");
 
     const struct {
         std::vector<std::string> asArgs;
@@ -272,7 +259,7 @@ TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
         {{"--geosys", "PIXEL", "--height-ref", "E", osInput}, "\"PIXEL\""},
         {{"--geosys", "LONG/LAT D000", "--height-ref", "X", osInput}, "X"},
         {{"--geosys", "LONG/LAT D000", "--height-ref", "M", osInput}, ":3 (id \"B\")"},
-        {{"--geosys", "LONG/LAT D000", "--height-ref", "E", Scratch("missing.csv")}, "missing"},
+        {{"--geosys", "LONG/LAT D000", "--height-ref", "E", Path("missing.csv")}, "missing"},
         {{"--height-ref", "E", osInput}, "--geosys"},
         {{"--geosys", "LONG/LAT D000", "--height-ref", "E", osNoZ}, "no z column"},
     };
@@ -283,14 +270,8 @@ TEST(GcpsConvertCommand, ErrorsNameTheBadValue) {
         const RunResult sRun = RunTool(asArgs);
         EXPECT_NE(sRun.nCode, 0) << sCase.osMessagePart;
         EXPECT_NE(sRun.osErr.find(sCase.osMessagePart), std::string::npos) << sRun.osErr;
-        std::ifstream oKept(osOutput);
-        std::string osKept;
-        std::getline(oKept, osKept);
-        EXPECT_EQ(osKept, "old contents") << sCase.osMessagePart;
+        EXPECT_EQ(lumo::support::ReadText(osOutput), "old contents\n") << sCase.osMessagePart;
     }
-    std::filesystem::remove(osInput);
-    std::filesystem::remove(osNoZ);
-    std::filesystem::remove(osOutput);
 }
 
 }  // namespace

@@ -132,7 +132,7 @@ TEST(Poly, CopyIsDeepAndGuardsItsCount) {
     POLYDeallocate(nullptr);
 }
 
-TEST(Poly, NullRecordsAndOutputsAreRefused) {
+TEST(Poly, NullRecordsAndOutputsAreRefusedAndHeightsIgnored) {
     WarningCapture oWarnings;
     PolyPtr p(POLYAllocate());
     p->nCoeffs = 3;
@@ -146,17 +146,12 @@ TEST(Poly, NullRecordsAndOutputsAreRefused) {
     EXPECT_EQ(GenGeo2Img(4, nullptr, 1.0, 2.0, 0.0, &dfA, &dfB), 0);
     EXPECT_EQ(GenImg2Geo(4, p.get(), 1.0, 2.0, 0.0, &dfA, nullptr), 0);
     EXPECT_EQ(GenImg2GeoDem(4, p.get(), 1.0, 2.0, nullptr, &dfA, &dfB), 0);
-}
-
-TEST(Poly, GenericDispatchIgnoresTheHeight) {
-    PolyPtr p(POLYAllocate());
-    p->nCoeffs = 3;
+    // The height is neither needed nor written.
     p->padfXCoeffs[1] = 0.5;
-    double dfX = 0, dfY = 0, dfZ = 123.0;
-    EXPECT_EQ(GenImg2Geo(4, p.get(), 16.0, -4.0, LUMO_NULL_VALUE, &dfX, &dfY), 1);
-    EXPECT_DOUBLE_EQ(dfX, 8.0);
-    EXPECT_EQ(GenImg2GeoDem(4, p.get(), 2.0, 2.0, &dfZ, &dfX, &dfY), 1);
-    EXPECT_EQ(dfZ, 123.0);  // height untouched
+    double dfZ = 123.0;
+    EXPECT_EQ(GenImg2GeoDem(4, p.get(), 16.0, 2.0, &dfZ, &dfA, &dfB), 1);
+    EXPECT_DOUBLE_EQ(dfA, 8.0);
+    EXPECT_EQ(dfZ, 123.0);
 }
 
 }  // namespace

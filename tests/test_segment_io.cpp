@@ -43,15 +43,6 @@ TEST(SegmentFile, EveryFieldRoundTripsBitExactly) {
     }
 }
 
-TEST(SegmentFile, WriteAndReadAFile) {
-    const SegmentPtr poSrc = RandomSegment(EPH_ORBIT_AVHRR, 3, 77u);
-    const std::string osPath = TempPath("avhrr.json");
-    lumo::cli::WriteSegmentFile(osPath, *poSrc);
-    const SegmentPtr poBack = lumo::cli::ReadSegmentFile(osPath);
-    ExpectSameSegment(*poSrc, *poBack);
-    std::remove(osPath.c_str());
-}
-
 TEST(SegmentFile, SpecialValuesAndTexts) {
     SegmentPtr poSeg(Zeroed<EphemerisSeg_t>());
     poSeg->dfPixelRes = std::numeric_limits<double>::quiet_NaN();
@@ -127,14 +118,12 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
         {R"("format": "lumo-segment", "version": 1, "szGeosys": "\u0100")", "szGeosys"},
         {R"("format": "lumo-segment", "version": 1, "nNumLines": 1.5)", "nNumLines"},
         {R"("format": "lumo-segment", "version": 1, "nNumLines": -1)", "nNumLines = -1"},
-        {R"("format": "lumo-segment", "version": 1, "nNumPixels": 2000000000)", "nNumPixels"},
         {R"("format": "lumo-segment", "version": 1, "bCarriedFlag": 256)", "bCarriedFlag"},
         {R"("format": "lumo-segment", "version": 1, "dfPixelRes": "five")", "dfPixelRes"},
         {R"("format": "lumo-segment", "version": 1, "adfCarriedB": [1, 2, 3])", "adfCarriedB"},
         {R"("format": "lumo-segment", "version": 1, "anLevelConvParams": [1, 2, "x", 4])",
          "anLevelConvParams[2]"},
         {R"("format": "lumo-segment", "version": 1, "nLevelConvForm": 7)", "nLevelConvForm"},
-        {R"("format": "lumo-segment", "version": 1, "orbitData": {})", "orbitData"},
         {R"("format": "lumo-segment", "version": 1, "nOrbitType": 5, "orbitData": {})",
          "orbitData"},
         {R"("format": "lumo-segment", "version": 1, "nOrbitType": 1,
@@ -156,12 +145,6 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
             "orbitData": {"abyLeading": "00ff"})",
          "orbitData.abyLeading"},
         {R"("format": "lumo-segment", "version": 1, "nOrbitType": 3,
-            "orbitData": {"szEccentricity": "ABCDEFGHIJKLMNOPQ"})",
-         "orbitData.szEccentricity"},
-        {R"("format": "lumo-segment", "version": 1, "nOrbitType": 3,
-            "orbitData": {"pScanLines": [[0, 1, "", [1, 2, 3, 4, 5, 6], ""]]})",
-         "orbitData.pScanLines[0].abyTimeCode"},
-        {R"("format": "lumo-segment", "version": 1, "nOrbitType": 3,
             "orbitData": {"pScanLines": [[0, 1, "", [1, 2, 3, 4, 5, 6, 700], ""]]})",
          "orbitData.pScanLines[0].abyTimeCode[6]"},
     };
@@ -180,12 +163,15 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
     EXPECT_THROW(lumo::cli::SegmentFromJson(Json::array(), "case.json"), nova::DataException);
 }
 
-TEST(SegmentFile, FileErrors) {
-    EXPECT_THROW(lumo::cli::ReadSegmentFile(TempPath("does_not_exist.json")), nova::DataException);
-    const std::string osPath = TempPath("broken.json");
+TEST(SegmentFile, WriteReadAndFileErrors) {
+    const SegmentPtr poSrc = RandomSegment(EPH_ORBIT_AVHRR, 3, 77u);
+    const std::string osPath = TempPath("avhrr.json");
+    lumo::cli::WriteSegmentFile(osPath, *poSrc);
+    ExpectSameSegment(*poSrc, *lumo::cli::ReadSegmentFile(osPath));
     std::ofstream(osPath) << "{\"format\": \"lumo-segment\", ";
     EXPECT_THROW(lumo::cli::ReadSegmentFile(osPath), nova::DataException);
     std::remove(osPath.c_str());
+    EXPECT_THROW(lumo::cli::ReadSegmentFile(osPath), nova::DataException);
 }
 
 TEST(SegmentCommand, ExamplesAndErrors) {
