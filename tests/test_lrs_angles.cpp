@@ -8,30 +8,18 @@
 
 #include <cmath>
 #include <cstdio>
-#include <memory>
 #include <random>
 
 #include "avhrr_sim.h"
 #include "lumo.h"
 #include "runtime.h"
+#include "support/avhrr_pass.h"
 
 namespace {
 
 constexpr double kDeg = 3.141592653589793 / 180.0;
 
-struct SegmentDeleter {
-    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
-};
-
-struct Pass {
-    std::unique_ptr<EphemerisSeg_t, SegmentDeleter> pSeg;
-    LRSOrbitModel_t oModel;
-    explicit Pass(const lumo::sim::AvhrrPassSpec& s = lumo::sim::AvhrrPassSpec())
-        : pSeg(lumo::sim::MakeAvhrrSegment(s)) {
-        LRSInitOrbitModel(pSeg.get(), &oModel);
-        LRSSetupCoordinateMapping(&oModel);
-    }
-};
+using Pass = lumo::support::AvhrrPass;
 
 // Unit vector of a direction given by zenith and azimuth (degrees) in the
 // local east-north-up frame.

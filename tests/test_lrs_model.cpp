@@ -13,30 +13,18 @@
 #include "avhrr_sim.h"
 #include "lumo.h"
 #include "runtime.h"
+#include "support/avhrr_pass.h"
 
 namespace {
 
 using lumo::sim::AvhrrPassSpec;
 
-struct SegmentDeleter {
-    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
-};
-using SegmentPtr = std::unique_ptr<EphemerisSeg_t, SegmentDeleter>;
+using lumo::support::SegmentPtr;
+using Pass = lumo::support::AvhrrPass;
 
 AvhrrData_t& Header(EphemerisSeg_t& seg) {
     return *static_cast<AvhrrData_t*>(*seg.ppOrbitData);
 }
-
-// A simulated pass and its model, with the state table unless asked not to.
-struct Pass {
-    SegmentPtr pSeg;
-    LRSOrbitModel_t oModel;
-    explicit Pass(const AvhrrPassSpec& sSpec = AvhrrPassSpec(), bool bTable = true)
-        : pSeg(lumo::sim::MakeAvhrrSegment(sSpec)) {
-        LRSInitOrbitModel(pSeg.get(), &oModel);
-        if (bTable) LRSSetupCoordinateMapping(&oModel);
-    }
-};
 
 // Largest image distance (pixels) between two models over a grid of points
 // at heights of 0 to 2 km: ground from `from`, image from `to`.

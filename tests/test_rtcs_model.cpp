@@ -15,6 +15,7 @@
 #include "radar_sim.h"
 #include "rpc.h"
 #include "runtime.h"
+#include "support/model_records.h"
 #include "support/radar_scene.h"
 
 namespace {
@@ -230,7 +231,7 @@ RTCSCOpt_t* ImageDescription() {
 }
 
 TEST(RtcsModel, ContainerDispatchAndModelObject) {
-    std::unique_ptr<TRNInfo_t, void (*)(TRNInfo_t*)> trn(TRNAllocate(TRN_RTCS), &TRNDeallocate);
+    lumo::support::TrnPtr trn(TRNAllocate(TRN_RTCS));
     const auto& g = Fixture().Gcps();
     std::vector<double> x, y, z, p, l;
     for (const auto& s : g)

@@ -18,6 +18,7 @@
 #include "projection.h"
 #include "regression.h"
 #include "runtime.h"
+#include "support/model_records.h"
 #include "support/numbered_error.h"
 
 namespace {
@@ -347,17 +348,8 @@ TEST(TpsConcurrency, FitsAndEvaluationsOnSeveralThreads) {
     }
 }
 
-namespace {
-
-struct ModelDeleter {
-    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
-};
-using ModelPtr = std::unique_ptr<TPSMInfo_t, ModelDeleter>;
-
-}  // namespace
-
 TEST(TpsModel, AllocateCopyAndRelease) {
-    ModelPtr model(TPSAllocate(nullptr));
+    lumo::support::TpsPtr model(TPSAllocate(nullptr));
     ASSERT_NE(model->psGeoToImage, nullptr);
     ASSERT_NE(model->psProjInfo, nullptr);
     // Before a fit there is no position: the null value, not zeros, and the
@@ -375,7 +367,7 @@ TEST(TpsModel, AllocateCopyAndRelease) {
 
     // A copy into a record that TPSAllocate filled in place.
     auto* psRaw = static_cast<TPSMInfo_t*>(HCalloc(1, sizeof(TPSMInfo_t)));
-    ModelPtr copy(TPSAllocate(psRaw));
+    lumo::support::TpsPtr copy(TPSAllocate(psRaw));
     ASSERT_EQ(copy.get(), psRaw);
     TPSCopy(copy.get(), model.get());
     TPSCopy(copy.get(), nullptr);

@@ -11,15 +11,12 @@
 #include "lumo.h"
 #include "regression.h"
 #include "runtime.h"
+#include "support/model_records.h"
 #include "support/warnings.h"
 
 namespace {
 
-struct TrnDeleter {
-    void operator()(TRNInfo_t* p) const { TRNDeallocate(p); }
-};
-using TrnPtr = std::unique_ptr<TRNInfo_t, TrnDeleter>;
-
+using lumo::support::TrnPtr;
 using WarningRecorder = lumo::support::WarningCapture;
 
 struct Points {

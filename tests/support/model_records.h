@@ -36,6 +36,11 @@ struct SegmentDeleter {
 };
 using SegmentPtr = std::unique_ptr<EphemerisSeg_t, SegmentDeleter>;
 
+struct TrnDeleter {
+    void operator()(TRNInfo_t* p) const { TRNDeallocate(p); }
+};
+using TrnPtr = std::unique_ptr<TRNInfo_t, TrnDeleter>;
+
 struct ApDeleter {
     void operator()(APInfo_t* p) const { APDeallocate(p); }
 };
