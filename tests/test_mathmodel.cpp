@@ -15,7 +15,7 @@
 #include "nova/crs.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
-#include "points_io.h"
+#include "model_io.h"
 #include "support/model_records.h"
 #include "support/model_stubs.h"
 #include "support/warnings.h"
@@ -54,7 +54,6 @@ constexpr const char* kNotThreadSafe =
     "Internal error: math model marked as non-threadsafe, but implementation not defined";
 
 using lumo::support::PolyPtr;
-using lumo::support::TpsPtr;
 
 // An affine UTM model: about 10 m pixels over a 6000 x 5000 image.
 PolyPtr MakePoly(const char* pszGeosys = "UTM 31 U D000") {
@@ -73,40 +72,6 @@ PolyPtr MakePoly(const char* pszGeosys = "UTM 31 U D000") {
     std::strncpy(poly->pszGeosys, pszGeosys, POLY_GEOSYS_SIZE - 1);
     Geosys2ProjInfo(poly->psProjInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0);
     return poly;
-}
-
-// The bundled control points (image and UTM 31 ground positions).
-struct Gcps {
-    std::vector<double> pixel, line, x, y;
-};
-
-Gcps BundledGcps() {
-    Gcps g;
-    for (const auto& p :
-         lumo::cli::ReadPointsFile(std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31_gcps.csv",
-                                   lumo::cli::PointKind::ControlPoint)
-             .asPoints) {
-        g.pixel.push_back(p.dfPixel);
-        g.line.push_back(p.dfLine);
-        g.x.push_back(p.dfX);
-        g.y.push_back(p.dfY);
-    }
-    return g;
-}
-
-TpsPtr MakeTps(const char* pszGeosys = "UTM 31 U D000") {
-    TpsPtr tps(TPSAllocate(nullptr));
-    Gcps g = BundledGcps();
-    const int n = static_cast<int>(g.x.size());
-    TRNCalculate(tps->psGeoToImage, n, g.x.data(), g.y.data(), g.pixel.data(), g.line.data(),
-                 nullptr);
-    TRNCalculate(tps->psImageToGeo, n, g.pixel.data(), g.line.data(), g.x.data(), g.y.data(),
-                 nullptr);
-    tps->nPixels = 6000;
-    tps->nLines = 6000;
-    std::strncpy(tps->pszGeosys, pszGeosys, TPS_GEOSYS_SIZE - 1);
-    Geosys2ProjInfo(tps->psProjInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0);
-    return tps;
 }
 
 // Runs `f`, which must throw E, and checks the exception's message, function
@@ -357,9 +322,10 @@ TEST(LumoMathModel, BlockSlotsForwardToHostFunctions) {
 
 TEST(LumoMathModel, ConcurrentEvaluationOfOneObjectAgrees) {
     PolyPtr poly = MakePoly();
-    TpsPtr tps = MakeTps();
+    const lumo::cli::LoadedModel tps =
+        lumo::cli::ReadModelFile(std::string(LUMO_SOURCE_DIR) + "/examples/tps_utm31.json");
     const nm::LumoMathModel polyModel(4, poly.get());
-    const nm::LumoMathModel splineModel(5, tps.get());
+    const nm::LumoMathModel splineModel(5, tps.poRecord.get());
     for (const nm::LumoMathModel* model : {&polyModel, &splineModel}) {
         constexpr int kPoints = 2000;
         std::vector<double> expected(2 * kPoints);
