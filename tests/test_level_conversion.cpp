@@ -48,9 +48,9 @@ class LevelConversion : public ::testing::Test {
         SetQ(3, 5, 7, 11);
         K(0) = 100.0, K(1) = 2.0, K(2) = 50.0, K(3) = 4.0;
         K(4) = 10.0, K(5) = 3.0, K(6) = 20.0, K(7) = 5.0;
-        K(9) = 1.0;                                              // m = normalised line
-        K(15) = 1.0;                                             // cubic in pixel: identity
-        K(18) = 1.0, K(19) = 0.01, K(20) = 0.001, K(21) = 1e-5;  // denominator
+        K(9) = 1.0;   // m = normalised line
+        K(15) = 1.0;  // cubic in pixel: identity
+        K(18) = 1.0, K(19) = 0.01, K(20) = 0.001, K(21) = 1e-5, K(22) = 1e-7;  // denominator
         K(23) = 0.5, K(24) = 0.02, K(25) = 0.003, K(26) = 1e-4, K(27) = 2e-6, K(28) = 1e-8;
         K(30) = 1.0;  // inverse of the line mapping
         K(36) = 1.0;  // inverse of the pixel cubic
