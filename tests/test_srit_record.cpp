@@ -75,19 +75,6 @@ void ExpectSameRecord(const SRITInfo_t& a, const SRITInfo_t& b) {
     EXPECT_EQ(Bytes(a.psProjInfo, sizeof(ProjInfo_t)), Bytes(b.psProjInfo, sizeof(ProjInfo_t)));
 }
 
-TEST(SRITRecord, AllocateGivesZeroedRecordWithEmptySegmentAndProjection) {
-    SRITInfo_t* psModel = SRITAllocate();
-    EXPECT_EQ(Bytes(psModel, kValueBytes), std::vector<unsigned char>(kValueBytes, 0));
-    EXPECT_EQ(psModel->padfLineShiftA, nullptr);
-    EXPECT_EQ(psModel->padfLineShiftB, nullptr);
-    EXPECT_EQ(Bytes(psModel->psProjInfo, sizeof(ProjInfo_t)),
-              std::vector<unsigned char>(sizeof(ProjInfo_t), 0));
-    EXPECT_EQ(Bytes(psModel->psEphemeris, sizeof(EphemerisSeg_t)),
-              std::vector<unsigned char>(sizeof(EphemerisSeg_t), 0));
-    LumoFreeSRITInfo(psModel);
-    LumoFreeSRITInfo(nullptr);  // ignored
-}
-
 TEST(SRITRecord, CopyIsDeepOutlivesTheSourceAndHandlesMissingParts) {
     SRITInfo_t* psSource = FilledRecord();
     SRITInfo_t* psCopy = SRITAllocate();
