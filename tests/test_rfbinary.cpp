@@ -212,6 +212,9 @@ TEST(RFBinary, AdjustmentFlagLooksAtFirstOrderTermsOnly) {
     RecordPtr psBack = Read(block);
     EXPECT_EQ(psBack->nAdjust, 0);
     EXPECT_NE(psBack->adfPixelAdjust[4], 0.0);  // kept, but not in force
+    psRF->adfPixelAdjust[2] = 1e-9;             // the last first-order term alone
+    block = Write(psRF.get());
+    EXPECT_EQ(Read(block)->nAdjust, 1);
     // A NaN first-order term puts the adjustment in force, and such a model
     // cannot be evaluated.
     QuietWarnings quiet;
