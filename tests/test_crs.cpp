@@ -355,14 +355,15 @@ TEST(CRS, ConcurrentTransforms) {
     };
     MathTransformPtr poOneTransform = Transform(poShared, poWgs84);
     ASSERT_TRUE(poOneTransform);
-    std::vector<Point> asExpected;
-    for (int i = 0; i < kPoints; ++i) asExpected.push_back(Apply(poOneTransform, fnPoint(i)));
+    std::vector<Point> asExpected(kPoints);
+    for (int i = 0; i < kPoints; ++i) asExpected[i] = Apply(poOneTransform, fnPoint(i));
 
     // Even threads make their own transformation from the one shared system,
     // odd ones share one transformation; each starts elsewhere, so that calls
     // interleave.
     std::vector<int> anMismatches(kThreads, -1);
     std::vector<std::thread> aoThreads;
+    aoThreads.reserve(kThreads);
     for (int t = 0; t < kThreads; ++t) {
         aoThreads.emplace_back([&, t] {
             MathTransformPtr poOwn(

@@ -145,6 +145,7 @@ TEST(Runtime, ExceptionsCarryTheirFieldsAndTheMutexExcludes) {
     nova::threading::Mutex oMutex;
     int nCounter = 0;
     std::vector<std::thread> aThreads;
+    aThreads.reserve(4);
     for (int t = 0; t < 4; ++t) {
         aThreads.emplace_back([&] {
             for (int i = 0; i < 1000; ++i) {
