@@ -308,7 +308,6 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
     expectFatal([&] { regress(g.n(), 0, g.x1.data()); }, "order 0");
     expectFatal([&] { regress(g.n(), 6, g.x1.data()); }, "order 6");
     expectFatal([&] { regress(0, 1, g.x1.data()); }, "points 0");
-    expectFatal([&] { regress(-3, 1, g.x1.data()); }, "points -3");
     expectFatal([&] { regress(g.n(), 1, nullptr); }, "null");
     g.x1[2] = std::nan("");
     expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "point 3");

@@ -41,12 +41,6 @@ TEST_F(RtcsCliTest, SimulateFitEvaluateAndRefuseBadInput) {
     r = RunTool({"fit", "--model", "rtcs", "--segment", seg, "--gcps", gcps, "--height-ref", "E",
                  "-o", model});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
-    // The points undeclared, their georeferencing given by EPSG code.
-    std::string plain = ReadText(gcps);
-    plain = Write("plain.csv", plain.erase(0, plain.find('\n') + 1));
-    r = RunTool({"fit", "--model", "rtcs", "--segment", seg, "--gcps", plain, "--height-ref", "E",
-                 "--geosys", "EPSG:4326", "-o", model});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
     r = RunTool({"residuals", model, "--gcps", checks});
     ASSERT_EQ(r.nCode, 0) << r.osErr;
     EXPECT_LT(RmsImage(r.osOut), 0.5) << r.osOut;
