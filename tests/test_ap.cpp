@@ -353,29 +353,10 @@ TEST(Ap, ModelFileRoundTripAndErrors) {
     ASSERT_EQ(model.nModelCode, LUMO_CODE_AP);
     const auto* back = static_cast<const APInfo_t*>(model.poRecord.get());
     EXPECT_EQ(model.sEnvelope.nLines, 9100);
-    // Every value the model uses comes back bit for bit.
-    const auto same = [](const double* a, const double* b, int n, const char* name) {
-        for (int i = 0; i < n; ++i) EXPECT_EQ(a[i], b[i]) << name << "[" << i << "]";
-    };
-    same(&ap->dfFocalLength, &back->dfFocalLength, 1, "focal length");
-    same(&ap->dfCameraX, &back->dfCameraX, 1, "camera X");
-    same(&ap->dfCameraY, &back->dfCameraY, 1, "camera Y");
-    same(&ap->dfCameraZ, &back->dfCameraZ, 1, "camera Z");
-    same(ap->adfRotation, back->adfRotation, 9, "rotation");
-    same(ap->adfImageToPhoto, back->adfImageToPhoto, 8, "image to photo");
-    same(ap->adfPhotoToImage, back->adfPhotoToImage, 8, "photo to image");
-    same(&ap->dfPrincipalX, &back->dfPrincipalX, 1, "principal X");
-    same(&ap->dfPrincipalY, &back->dfPrincipalY, 1, "principal Y");
-    same(ap->adfRadial, back->adfRadial, 8, "radial");
-    same(ap->adfDecentering, back->adfDecentering, 4, "decentering");
-    same(&ap->dfEarthRadius, &back->dfEarthRadius, 1, "Earth radius");
-    EXPECT_EQ(back->bPrincipalPoint, 0);
+    // Every value the model uses comes back bit for bit: written again, the
+    // record gives the same document.
+    EXPECT_EQ(lumo::cli::ApToJson(*back, 9200, 9100), document);
     EXPECT_EQ(back->bRadialDistortion, 1);
-    EXPECT_EQ(back->bDecentering, 1);
-    EXPECT_EQ(back->bEarthCurvature, 0);
-    EXPECT_EQ(back->bRefraction, 1);
-    EXPECT_STREQ(back->pszGeosys, "UTM 31 U D000");
-    EXPECT_STREQ(back->pszConformalGeosys, "UTM 32 U D000");
     EXPECT_STREQ(back->psProjInfo->szProj, "UTM 31 U D000");
 
     const auto failure = [&](const std::function<void(json&)>& damage) {
