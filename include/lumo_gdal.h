@@ -106,7 +106,9 @@ LUMO_GDAL_API ImageInfo ReadImageInfo(const std::string& osPath);
 LUMO_GDAL_API RFInfo_t* ReadImageRPC(const std::string& osPath);
 
 // Stores a model's rational polynomials in an existing GeoTIFF's RPC
-// metadata, so that GDAL-based tools use it. Throws when the file is not a
+// metadata, so that GDAL-based tools use it. The writing happens on a copy
+// beside the image, which replaces it only when all went well: on any
+// failure the image is left as it was. Throws when the file is not a
 // writable GeoTIFF or the model has no RPC equivalent.
 LUMO_GDAL_API void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF);
 

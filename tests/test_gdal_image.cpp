@@ -7,6 +7,7 @@
 
 #include <array>
 #include <cmath>
+#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -141,6 +142,18 @@ TEST_F(ImageFileTest, AttachedPolynomialsAreWhatGdalEvaluates) {
     psTruth->adfPixelAdjust[3] = 0.0;
     EXPECT_LT(LargestGdalDifference(osPath, *psTruth), 1e-6);
     psTruth->nAdjust = 0;
+
+    // Through a link: the image it points at gets the polynomials, the link
+    // stays a link, and no working copy is left beside either.
+    const std::string osLink = Path("link.tif");
+    std::filesystem::create_symlink(WriteImage("linked.tif"), osLink);
+    lumo::gdal::AttachRPC(osLink, *psTruth);
+    EXPECT_TRUE(std::filesystem::is_symlink(osLink));
+    EXPECT_LT(LargestGdalDifference(Path("linked.tif"), *psTruth), 1e-6);
+    for (const auto& oEntry : std::filesystem::directory_iterator(Path(""))) {
+        EXPECT_EQ(oEntry.path().filename().string().find(".tmp"), std::string::npos)
+            << oEntry.path();
+    }
 
     // Files that are not GeoTIFFs.
     RasterSpec sPng;

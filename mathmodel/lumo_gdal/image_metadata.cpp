@@ -3,10 +3,15 @@
 // polynomials written into a GeoTIFF.
 
 #include <cctype>
+#include <filesystem>
 #include <map>
+#include <optional>
 #include <sstream>
 #include <string>
+#include <system_error>
 #include <vector>
+
+#include <unistd.h>
 
 #include <cpl_string.h>
 
@@ -152,6 +157,68 @@ RFInfo_t* ReadImageRPC(const std::string& osPath) {
     return LumoRPCTextToRFInfo(osText.data(), osText.size(), LUMO_RPC_TEXT_TXT, osPath.c_str());
 }
 
+namespace {
+
+// A working copy of an image beside it (with its .aux.xml sidecar, which may
+// hold GDAL's own metadata), removed on every path unless it replaces the
+// image: a failure while GDAL writes leaves the image as it was.
+class WorkingCopy {
+  public:
+    explicit WorkingCopy(const std::string& osImage)
+        : oImage_(ImagePath(osImage)),
+          oCopy_(oImage_.string() + ".lumo-" + std::to_string(getpid()) + ".tmp") {
+        std::error_code oError;
+        std::filesystem::copy_file(oImage_, oCopy_,
+                                   std::filesystem::copy_options::overwrite_existing, oError);
+        if (!oError && std::filesystem::exists(Aux(oImage_), oError)) {
+            std::filesystem::copy_file(Aux(oImage_), Aux(oCopy_),
+                                       std::filesystem::copy_options::overwrite_existing, oError);
+        }
+        if (oError) {
+            Remove();
+            LUMO_GDAL_FAIL(osImage + ": cannot make a working copy beside it (" + oError.message() +
+                           ")");
+        }
+    }
+    WorkingCopy(const WorkingCopy&) = delete;
+    WorkingCopy& operator=(const WorkingCopy&) = delete;
+    ~WorkingCopy() { Remove(); }
+
+    std::string Path() const { return oCopy_.string(); }
+
+    // Puts the copy in the image's place (a rename within one folder
+    // replaces the image at once), then its sidecar when GDAL wrote one.
+    void Replace(const std::string& osImage) {
+        std::error_code oError;
+        std::filesystem::rename(oCopy_, oImage_, oError);
+        if (!oError && std::filesystem::exists(Aux(oCopy_), oError)) {
+            std::filesystem::rename(Aux(oCopy_), Aux(oImage_), oError);
+        }
+        if (oError) LUMO_GDAL_FAIL(osImage + ": cannot replace it (" + oError.message() + ")");
+    }
+
+  private:
+    void Remove() const {
+        std::error_code oError;
+        std::filesystem::remove(oCopy_, oError);
+        std::filesystem::remove(Aux(oCopy_), oError);
+    }
+    // The file itself when the path is a link, so the link keeps pointing at it.
+    static std::filesystem::path ImagePath(const std::string& osImage) {
+        std::error_code oError;
+        std::filesystem::path oPath = std::filesystem::canonical(osImage, oError);
+        return oError ? std::filesystem::path(osImage) : oPath;
+    }
+    static std::filesystem::path Aux(const std::filesystem::path& oPath) {
+        return std::filesystem::path(oPath.string() + ".aux.xml");
+    }
+
+    std::filesystem::path oImage_;
+    std::filesystem::path oCopy_;
+};
+
+}  // namespace
+
 void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF) {
     // Through the text writer: an image-space adjustment is folded in as in
     // the text forms, and models without an RPC equivalent are refused.
@@ -162,13 +229,20 @@ void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF) {
         LUMO_GDAL_FAIL(osGeoTiff + ": " + e.what());
     }
     const std::vector<std::string> aosItems = RpcTextToMetadata(osText);
-    DatasetPtr poDataset = detail::OpenRaster(osGeoTiff, true);
-    const std::string osDriver = GDALGetDriverShortName(GDALGetDatasetDriver(poDataset.get()));
-    if (osDriver != "GTiff") {
-        LUMO_GDAL_FAIL(osGeoTiff +
-                       ": rational polynomials are attached to GeoTIFF files only (this is " +
-                       osDriver + ")");
+    {
+        DatasetPtr poImage = detail::OpenRaster(osGeoTiff);
+        const std::string osDriver = GDALGetDriverShortName(GDALGetDatasetDriver(poImage.get()));
+        if (osDriver != "GTiff") {
+            LUMO_GDAL_FAIL(osGeoTiff +
+                           ": rational polynomials are attached to GeoTIFF files only (this is " +
+                           osDriver + ")");
+        }
     }
+    // GDAL's virtual files (/vsimem/...) are written in place: they are not
+    // files of ours to copy.
+    std::optional<WorkingCopy> oCopy;
+    if (osGeoTiff.rfind("/vsi", 0) != 0) oCopy.emplace(osGeoTiff);
+    DatasetPtr poDataset = detail::OpenRaster(oCopy ? oCopy->Path() : osGeoTiff, true);
     std::vector<char*> apszItems;
     apszItems.reserve(aosItems.size() + 1);
     for (const std::string& osItem : aosItems)
@@ -179,13 +253,14 @@ void AttachRPC(const std::string& osGeoTiff, const RFInfo_t& sRF) {
         LUMO_GDAL_FAIL(osGeoTiff + ": cannot store the rational polynomials" +
                        detail::GdalReason());
     }
-    // Closing writes the file; its failures are only reported as errors.
+    // Closing writes the copy; its failures are only reported as errors.
     CPLErrorReset();
     poDataset.reset();
     if (CPLGetLastErrorType() >= CE_Failure) {
         LUMO_GDAL_FAIL(osGeoTiff + ": writing the rational polynomials failed" +
                        detail::GdalReason());
     }
+    if (oCopy) oCopy->Replace(osGeoTiff);
 }
 
 }  // namespace gdal
