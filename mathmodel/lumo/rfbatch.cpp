@@ -33,11 +33,6 @@ constexpr int kLanes = 4;
 // Four points' values of one quantity, in the compiler's vector extension:
 // one AVX register, or two SSE2 ones on the baseline.
 using Vec = double __attribute__((vector_size(kLanes * sizeof(double))));
-#if defined(__GNUC__) && !defined(__clang__)
-// Vectors are passed differently with and without AVX; every function
-// taking one is internal to this file and inlined, so that is moot.
-#pragma GCC diagnostic ignored "-Wpsabi"
-#endif
 
 // Fewest points per thread: a forward point costs a few nanoseconds, an
 // inverse one a few tens.
