@@ -55,4 +55,24 @@ TEST_F(GeosysCliTest, ForeignFormsFitTheSameModelAndBandsAreChecked) {
     EXPECT_NE(refused.osErr.find("not a geographic or projected"), std::string::npos);
 }
 
+// One system under two texts is no contradiction; two systems are.
+TEST_F(GeosysCliTest, PointFileSystemComparedBySystemNotText) {
+    const std::string model = std::string(LUMO_SOURCE_DIR) + "/examples/rf_scene.json";
+    const auto Transform = [&](const char* declared, const char* x, const char* y,
+                               const char* given) {
+        const std::string points = Write("g.csv", std::string("# geosys: ") + declared +
+                                                      "\nid,x,y,z\nA," + x + "," + y + ",450\n");
+        return RunTool({"transform", model, "--to-image", points, "--geosys", given});
+    };
+    const auto byText = Transform("LONG/LAT D000", "7.3412", "46.8752", "LONG/LAT D000");
+    const auto byCode = Transform("LONG/LAT D000", "7.3412", "46.8752", "EPSG:4326");
+    EXPECT_EQ(byCode.nCode, 0) << byCode.osErr;
+    EXPECT_EQ(byCode.osOut.substr(byCode.osOut.find('\n')),
+              byText.osOut.substr(byText.osOut.find('\n')));
+    EXPECT_EQ(Transform("UTM 32 D000", "380000", "5190000", "EPSG:32632").nCode, 0);
+    const auto other = Transform("UTM 32 D000", "380000", "5190000", "EPSG:32633");
+    EXPECT_EQ(other.nCode, 1);
+    EXPECT_NE(other.osErr.find("contradicts"), std::string::npos) << other.osErr;
+}
+
 }  // namespace

@@ -38,6 +38,30 @@ bool SameSystem(const Georef& a, const Georef& b) {
                       std::begin(b.sProj.adfProjParms));
 }
 
+// Whether the file's points mean the same places in both systems: one
+// system has several texts ("EPSG:4326" and "LONG/LAT D000"), so texts that
+// differ are compared by converting an even sample of the points, which must
+// not move by more than a hundredth of a millimetre.
+bool SameForPoints(const Georef& a, const Georef& b, const PointSet& points) {
+    if (SameSystem(a, b)) return true;
+    constexpr std::size_t kSamples = 64;
+    const double dfTolerance = b.sProj.nProjKind == NOVA_PROJ_GEOGRAPHIC ? 1e-10 : 1e-5;
+    const std::size_t n = points.asPoints.size();
+    const std::size_t nStep = std::max<std::size_t>(1, n / kSamples);
+    bool bCompared = false;
+    for (std::size_t i = 0; i < n; i += nStep) {
+        const PointRecord& p = points.asPoints[i];
+        if (!IsPosition(p.dfX, p.dfY)) continue;
+        double x = 0.0, y = 0.0;
+        if (GCTPTransform(&a.sProj, p.dfX, p.dfY, &b.sProj, &x, &y) != 0 ||
+            !(std::fabs(x - p.dfX) <= dfTolerance && std::fabs(y - p.dfY) <= dfTolerance)) {
+            return false;
+        }
+        bCompared = true;
+    }
+    return bCompared;
+}
+
 bool IsProjected(const Georef& g) {
     const int kind = g.sProj.nProjKind;
     return kind != NOVA_PROJ_GEOGRAPHIC && kind != NOVA_PROJ_PIXEL && kind != NOVA_PROJ_METRE &&
@@ -150,7 +174,7 @@ Georef DeclaredGeoref(const PointSet& points, const PointFileOptions& options) {
     }
     if (options.osGeosys.empty()) return fromFile;
     Georef given = MakeGeoref(options.osGeosys, points.osProjParms, "--geosys");
-    if (fromFile.Known() && !SameSystem(fromFile, given)) {
+    if (fromFile.Known() && !SameForPoints(fromFile, given, points)) {
         LUMO_CLI_FAIL("--geosys " + Quoted(options.osGeosys) + " contradicts " + points.osSource +
                       ", which declares " + Quoted(points.osGeosys));
     }
