@@ -12,33 +12,27 @@
 #include "lumo.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
+#include "support/model_records.h"
 #include "support/warnings.h"
 
 namespace {
 
-using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
+using RecordPtr = lumo::support::RfPtr;
 using BlockPtr = std::unique_ptr<unsigned char, nova::FreeDeleter>;
 
 // Warnings are collected, not printed.
 using QuietWarnings = lumo::support::WarningCapture;
 
-RecordPtr Own(RFInfo_t* psRF) {
-    return RecordPtr(psRF, &RFDeallocate);
-}
-
 // A record with every field set to a distinct value, still a model that can
 // be evaluated: each denominator is dominated by its constant term.
 RecordPtr FullRecord(int nTerms) {
-    RecordPtr psRF = Own(RFAllocate(nullptr, nTerms));
+    RecordPtr psRF(RFAllocate(nullptr, nTerms));
     psRF->nHalfPixelShift = 0;
     psRF->nDownsample = 4;
     psRF->nExtra1 = -123456789;
     psRF->nExtra2 = 2147483647;
-    double* apdfDoubles[] = {&psRF->dfXOffset,     &psRF->dfXScale,     &psRF->dfYOffset,
-                             &psRF->dfYScale,      &psRF->dfZOffset,    &psRF->dfZScale,
-                             &psRF->dfPixelOffset, &psRF->dfPixelScale, &psRF->dfLineOffset,
-                             &psRF->dfLineScale};
-    for (int k = 0; k < 10; ++k) *apdfDoubles[k] = (k % 2 ? 1.0 : -1.0) * (k + 1) * 12.345678901;
+    double* padfFrame = &psRF->dfXOffset;  // the ten offsets and scales
+    for (int k = 0; k < 10; ++k) padfFrame[k] = (k % 2 ? 1.0 : -1.0) * (k + 1) * 12.345678901;
     for (int k = 0; k < 6; ++k) {
         psRF->adfPixelAdjust[k] = 1e-3 * (k + 1);
         psRF->adfLineAdjust[k] = -2e-7 * (k + 1);
@@ -64,11 +58,12 @@ std::vector<unsigned char> Write(RFInfo_t* psRF) {
 }
 
 RecordPtr Read(std::vector<unsigned char>& block, int nLength = RF_BINARY_SIZE) {
-    return Own(LumoBinaryToRFInfo(nLength, block.data()));
+    return RecordPtr(LumoBinaryToRFInfo(nLength, block.data()));
 }
 
 // Doubles survive to the 15 significant digits of "%22.14e".
 void ExpectSameRecord(const RFInfo_t& a, const RFInfo_t& b) {
+    EXPECT_EQ(lumo::support::RfDifference(a, b, 1e-14), "");
     EXPECT_EQ(a.nTerms, b.nTerms);
     EXPECT_EQ(a.nDownsample, b.nDownsample);
     EXPECT_EQ(a.nExtra1, b.nExtra1);
@@ -76,21 +71,10 @@ void ExpectSameRecord(const RFInfo_t& a, const RFInfo_t& b) {
     EXPECT_EQ(a.nAdjust, b.nAdjust);
     EXPECT_STREQ(a.pszSensor, b.pszSensor);
     EXPECT_STREQ(a.pszGeosys, b.pszGeosys);
-    const auto near = [](double x, double y) {
-        return x == y || std::fabs(x - y) <= 1e-14 * std::fabs(x);
-    };
-    const double* pa = &a.dfXOffset;
-    const double* pb = &b.dfXOffset;
-    for (int k = 0; k < 10; ++k) EXPECT_TRUE(near(pa[k], pb[k])) << k;
     for (int k = 0; k < 6; ++k) {
-        EXPECT_TRUE(near(a.adfPixelAdjust[k], b.adfPixelAdjust[k])) << k;
-        EXPECT_TRUE(near(a.adfLineAdjust[k], b.adfLineAdjust[k])) << k;
-    }
-    for (int i = 0; i < a.nTerms; ++i) {
-        EXPECT_TRUE(near(a.padfPixelNum[i], b.padfPixelNum[i])) << i;
-        EXPECT_TRUE(near(a.padfPixelDen[i], b.padfPixelDen[i])) << i;
-        EXPECT_TRUE(near(a.padfLineNum[i], b.padfLineNum[i])) << i;
-        EXPECT_TRUE(near(a.padfLineDen[i], b.padfLineDen[i])) << i;
+        EXPECT_NEAR(a.adfPixelAdjust[k], b.adfPixelAdjust[k],
+                    1e-14 * std::fabs(a.adfPixelAdjust[k]));
+        EXPECT_NEAR(a.adfLineAdjust[k], b.adfLineAdjust[k], 1e-14 * std::fabs(a.adfLineAdjust[k]));
     }
 }
 
@@ -299,7 +283,7 @@ TEST(RFBinary, ReaderRefusesBlocksItWouldReadPastTheEndOf) {
 
 TEST(RFBinary, WriterRefusesFieldsItCannotHold) {
     QuietWarnings quiet;
-    RecordPtr psRF = Own(RFAllocate(nullptr, 25));
+    RecordPtr psRF(RFAllocate(nullptr, 25));
     int nLength = -1;
     EXPECT_EQ(LumoRFInfoToBinary(psRF.get(), &nLength), nullptr);
     EXPECT_EQ(nLength, 0);

@@ -15,18 +15,19 @@
 #include "model_io.h"
 #include "nova/runtime.h"
 #include "support/cli_runner.h"
+#include "support/model_records.h"
 
 namespace {
 
-using RecordPtr = std::unique_ptr<RFInfo_t, void (*)(RFInfo_t*)>;
+using RecordPtr = lumo::support::RfPtr;
 
 const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 
 using lumo::support::ReadText;
 
-RecordPtr Parse(const std::string& text, int nForm = LUMO_RPC_TEXT_AUTO) {
-    return RecordPtr(LumoRPCTextToRFInfo(text.data(), text.size(), nForm, "sample.txt"),
-                     &RFDeallocate);
+RecordPtr Parse(const std::string& text, int nForm = LUMO_RPC_TEXT_AUTO,
+                std::vector<LumoRPCField>* paoFields = nullptr) {
+    return RecordPtr(LumoRPCTextToRFInfo(text.data(), text.size(), nForm, "sample.txt", paoFields));
 }
 
 // The message of the exception a text raises ("" when it reads).
@@ -57,15 +58,7 @@ std::string Replace(std::string text, const std::string& from, const std::string
 }
 
 void ExpectSameModel(const RFInfo_t& a, const RFInfo_t& b) {
-    const double* pa = &a.dfXOffset;
-    const double* pb = &b.dfXOffset;
-    for (int k = 0; k < 10; ++k) EXPECT_EQ(pa[k], pb[k]) << k;
-    for (int i = 0; i < 20; ++i) {
-        EXPECT_EQ(a.padfPixelNum[i], b.padfPixelNum[i]) << i;
-        EXPECT_EQ(a.padfPixelDen[i], b.padfPixelDen[i]) << i;
-        EXPECT_EQ(a.padfLineNum[i], b.padfLineNum[i]) << i;
-        EXPECT_EQ(a.padfLineDen[i], b.padfLineDen[i]) << i;
-    }
+    EXPECT_EQ(lumo::support::RfDifference(a, b), "");
 }
 
 // Control points of the sample file: id,pixel,line,x,y,z after the comments.
@@ -228,10 +221,7 @@ TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
     std::string bare = rpb;
     bare.erase(std::remove(bare.begin(), bare.end(), ';'), bare.end());
     std::vector<LumoRPCField> aoFields;
-    RecordPtr psBare(
-        LumoRPCTextToRFInfo(bare.data(), bare.size(), LUMO_RPC_TEXT_AUTO, "x.RPB", &aoFields),
-        &RFDeallocate);
-    ExpectSameModel(*psSample, *psBare);
+    ExpectSameModel(*psSample, *Parse(bare, LUMO_RPC_TEXT_AUTO, &aoFields));
     ASSERT_EQ(aoFields.size(), 3u);  // bandId, SpecId, errBias
     EXPECT_EQ(aoFields[2].osKey, "errBias");
     EXPECT_EQ(aoFields[2].osValue, "2.5");
@@ -278,10 +268,7 @@ TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
     for (const std::string& record : {fixed, wrapped + "\n"}) {
         EXPECT_EQ(LumoDetectRPCTextForm(record.data(), record.size()), LUMO_RPC_TEXT_FIXED);
         std::vector<LumoRPCField> aoFixedFields;
-        RecordPtr psFixed(LumoRPCTextToRFInfo(record.data(), record.size(), LUMO_RPC_TEXT_AUTO,
-                                              "RPC-x.txt", &aoFixedFields),
-                          &RFDeallocate);
-        ExpectSameModel(*psExpected, *psFixed);
+        ExpectSameModel(*psExpected, *Parse(record, LUMO_RPC_TEXT_AUTO, &aoFixedFields));
         EXPECT_EQ(aoFixedFields.size(), record == fixed ? 0u : 2u);
     }
     EXPECT_NE(ParseError("0" + wrapped.substr(1)).find("not usable"), std::string::npos);
@@ -295,16 +282,12 @@ TEST(RPCText, FieldsSurviveConversionsBetweenForms) {
     const std::string text = "ERR_BIAS: 1.5 meters\nERR_RAND: 0.25 meters\nPRODUCT: ortho ready\n" +
                              ReadText(kExamples + "/rf_scene_RPC.TXT");
     std::vector<LumoRPCField> aoFields;
-    RecordPtr psRF(
-        LumoRPCTextToRFInfo(text.data(), text.size(), LUMO_RPC_TEXT_TXT, "a.TXT", &aoFields),
-        &RFDeallocate);
+    RecordPtr psRF = Parse(text, LUMO_RPC_TEXT_TXT, &aoFields);
     const std::string rpb = LumoRFInfoToRPCText(psRF.get(), LUMO_RPC_TEXT_RPB, aoFields);
     EXPECT_NE(rpb.find("errBias = 1.5;"), std::string::npos);
     EXPECT_NE(rpb.find("PRODUCT = \"ortho ready\";"), std::string::npos);
     std::vector<LumoRPCField> aoBack;
-    RecordPtr psBack(
-        LumoRPCTextToRFInfo(rpb.data(), rpb.size(), LUMO_RPC_TEXT_RPB, "a.RPB", &aoBack),
-        &RFDeallocate);
+    RecordPtr psBack = Parse(rpb, LUMO_RPC_TEXT_RPB, &aoBack);
     ExpectSameModel(*psRF, *psBack);
     const std::string txt = LumoRFInfoToRPCText(psBack.get(), LUMO_RPC_TEXT_TXT, aoBack);
     for (const char* line : {"ERR_BIAS: 1.5 meters\n", "ERR_RAND: 0.25 meters\n",
@@ -344,11 +327,7 @@ TEST(RPCText, ToolConvertsBetweenAllForms) {
     EXPECT_EQ(model.sEnvelope.nPixels, 10000);
     ExpectSameModel(*psSample, *static_cast<RFInfo_t*>(model.poRecord.get()));
     // The block keeps 15 significant digits.
-    RecordPtr psFromBlock = Parse(ReadText(txt));
-    for (int i = 0; i < 20; ++i) {
-        EXPECT_NEAR(psFromBlock->padfPixelNum[i], psSample->padfPixelNum[i],
-                    1e-14 * std::fabs(psSample->padfPixelNum[i]));
-    }
+    EXPECT_EQ(lumo::support::RfDifference(*psSample, *Parse(ReadText(txt)), 1e-14), "");
     // The error estimates of a text go through JSON into the other text form;
     // the binary block says it cannot keep them.
     const std::string withErrors = dir + "/e_RPC.TXT", errJson = dir + "/e.json";

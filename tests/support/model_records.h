@@ -3,8 +3,10 @@
 #pragma once
 
 #include <array>
+#include <cmath>
 #include <cstring>
 #include <memory>
+#include <string>
 
 #include "lumo.h"
 
@@ -86,6 +88,29 @@ inline RfPtr RfSceneModel() {
     psRF->padfPixelDen[2] = psRF->padfLineDen[2] = -0.02;
     psRF->padfPixelDen[3] = psRF->padfLineDen[3] = 0.001;
     return psRF;
+}
+
+// The first difference between the rational functions of two records, ""
+// when none: the ten offsets and scales and the 20 coefficients of each
+// polynomial, equal within a relative dfRel (0: bit for bit).
+inline std::string RfDifference(const RFInfo_t& a, const RFInfo_t& b, double dfRel = 0.0) {
+    const auto differ = [dfRel](double x, double y) {
+        return x != y && !(std::fabs(x - y) <= dfRel * std::fabs(x));
+    };
+    for (int k = 0; k < 10; ++k) {
+        if (differ((&a.dfXOffset)[k], (&b.dfXOffset)[k]))
+            return "offset/scale " + std::to_string(k);
+    }
+    const double* apdfA[] = {a.padfPixelNum, a.padfPixelDen, a.padfLineNum, a.padfLineDen};
+    const double* apdfB[] = {b.padfPixelNum, b.padfPixelDen, b.padfLineNum, b.padfLineDen};
+    for (int j = 0; j < 4; ++j) {
+        for (int i = 0; i < RF_MAX_TERMS; ++i) {
+            if (differ(apdfA[j][i], apdfB[j][i])) {
+                return "polynomial " + std::to_string(j) + " term " + std::to_string(i);
+            }
+        }
+    }
+    return "";
 }
 
 // Fiducial transforms of an aerial photo: photo -> image (d) and
