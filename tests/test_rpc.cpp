@@ -80,27 +80,41 @@ double CheckError(const RpcMathModel& m, double lon0, double lat0, double dLon, 
     return worst;
 }
 
-TEST(Rpc, FitsASmoothModelAndRoundTrips) {
-    const Samples s = Grid(10.0, 45.0, 0.6, 0.45, 8);
-    std::unique_ptr<RpcMathModel> m = Fit(s);
-    ASSERT_TRUE(m);
-    EXPECT_LT(m->GetFitReport().dfMaxPixel, 0.01);
-    EXPECT_LT(m->GetFitReport().dfMaxLine, 0.01);
-    EXPECT_LT(CheckError(*m, 10.0, 45.0, 0.6, 0.45), 0.01);
-
-    // Image positions of random ground points of the box, back to the ground.
-    std::mt19937 rng(5);
-    std::uniform_real_distribution<double> u(-1.0, 1.0), hh(0.0, 3000.0);
-    for (int i = 0; i < 500; ++i) {
-        const double lon0 = 10.0 + 0.6 * u(rng), lat0 = 45.0 + 0.45 * u(rng), h = hh(rng);
-        double p, l, lon, lat, p2, l2;
-        ASSERT_EQ(m->GroundToImage(lon0, lat0, h, p, l, false), 0);
-        ASSERT_EQ(m->ImageToGround(p, l, h, lon, lat, false), 0) << p << " " << l;
-        EXPECT_NEAR(lon, lon0, 1e-9);
-        EXPECT_NEAR(lat, lat0, 1e-9);
-        ASSERT_EQ(m->GroundToImage(lon, lat, h, p2, l2, false), 0);
-        EXPECT_NEAR(p2, p, 1e-6);
-        EXPECT_NEAR(l2, l, 1e-6);
+// Scenes with relief, across the 180th meridian and on one plane (a model
+// free of height): each fits its image function to a hundredth of a pixel,
+// and ground -> image -> ground -> image closes over the scene's box, with
+// longitudes coming back in [-180, 180].
+TEST(Rpc, FitsSmoothScenesAndRoundTrips) {
+    const struct {
+        double lon0, lat0, dLon, dLat;
+        int nHeights;
+    } aScenes[] = {
+        {10.0, 45.0, 0.6, 0.45, 8}, {179.8, 60.0, 0.6, 0.3, 8}, {10.0, 45.0, 0.6, 0.45, 1}};
+    for (const auto& sc : aScenes) {
+        SCOPED_TRACE(testing::Message() << sc.lon0 << " " << sc.lat0 << " " << sc.nHeights);
+        std::unique_ptr<RpcMathModel> m =
+            Fit(Grid(sc.lon0, sc.lat0, sc.dLon, sc.dLat, sc.nHeights));
+        ASSERT_TRUE(m);
+        EXPECT_LT(m->GetFitReport().dfMaxPixel, 0.01);
+        EXPECT_LT(m->GetFitReport().dfMaxLine, 0.01);
+        if (sc.nHeights > 1) {
+            EXPECT_LT(CheckError(*m, sc.lon0, sc.lat0, sc.dLon, sc.dLat), 0.01);
+        }
+        std::mt19937 rng(5);
+        std::uniform_real_distribution<double> u(-1.0, 1.0), hh(0.0, 3000.0);
+        for (int i = 0; i < 500; ++i) {
+            const double lon0 = sc.lon0 + sc.dLon * u(rng), lat0 = sc.lat0 + sc.dLat * u(rng);
+            const double h = sc.nHeights > 1 ? hh(rng) : 300.0;
+            double p, l, lon, lat, p2, l2;
+            ASSERT_EQ(m->GroundToImage(lon0, lat0, h, p, l, false), 0);
+            ASSERT_EQ(m->ImageToGround(p, l, h, lon, lat, false), 0) << p << " " << l;
+            EXPECT_NEAR(std::remainder(lon - lon0, 360.0), 0.0, 1e-9);
+            EXPECT_LE(std::fabs(lon), 180.0);
+            EXPECT_NEAR(lat, lat0, 1e-9);
+            ASSERT_EQ(m->GroundToImage(lon, lat, h, p2, l2, false), 0);
+            EXPECT_NEAR(p2, p, 1e-6);
+            EXPECT_NEAR(l2, l, 1e-6);
+        }
     }
 }
 
@@ -120,21 +134,6 @@ TEST(Rpc, RecoversARationalModelExactly) {
     EXPECT_LT(second->GetFitReport().dfMaxLine, 1e-4);
 }
 
-TEST(Rpc, SceneAcrossTheAntimeridianFitsLikeAnyOther) {
-    std::unique_ptr<RpcMathModel> across = Fit(Grid(179.8, 60.0, 0.6, 0.3, 8));
-    std::unique_ptr<RpcMathModel> elsewhere = Fit(Grid(20.0, 60.0, 0.6, 0.3, 8));
-    EXPECT_LT(across->GetFitReport().dfMaxPixel, 0.01);
-    EXPECT_NEAR(across->GetFitReport().dfRmsPixel, elsewhere->GetFitReport().dfRmsPixel, 1e-4);
-    double p1, l1, p2, l2;
-    ASSERT_EQ(across->GroundToImage(180.2, 60.1, 500.0, p1, l1, false), 0);
-    ASSERT_EQ(across->GroundToImage(-179.8, 60.1, 500.0, p2, l2, false), 0);
-    EXPECT_NEAR(p1, p2, 1e-9);
-    EXPECT_NEAR(l1, l2, 1e-9);
-    double lon, lat;
-    ASSERT_EQ(across->ImageToGround(p1, l1, 500.0, lon, lat, false), 0);
-    EXPECT_NEAR(lon, -179.8, 1e-9);  // longitudes come back in [-180, 180]
-}
-
 TEST(Rpc, OutsideTheDomainBothDirectionsFail) {
     std::unique_ptr<RpcMathModel> m = Fit(Grid(10.0, 45.0, 0.6, 0.45, 8));
     double p = 0, l = 0, x = 0, y = 0;
@@ -149,14 +148,6 @@ TEST(Rpc, OutsideTheDomainBothDirectionsFail) {
     EXPECT_EQ(m->GetMaxValidHeight(hmax), 0);
     EXPECT_LT(hmin, -500.0);
     EXPECT_GT(hmax, 8000.0);
-}
-
-TEST(Rpc, PlaneOfPointsGivesAHeightFreeModel) {
-    const Samples s = Grid(10.0, 45.0, 0.6, 0.45, 1);
-    std::unique_ptr<RpcMathModel> m = Fit(s);
-    ASSERT_TRUE(m);
-    EXPECT_LT(m->GetFitReport().dfMaxPixel, 0.01);
-    EXPECT_TRUE(std::isfinite(m->GetCoefficients().adfPixelNum[3]));
 }
 
 TEST(Rpc, BadInputIsRefused) {
