@@ -203,13 +203,6 @@ TEST_F(GcpsConvertCommand, ConvertsTheBundledControlPoints) {
         EXPECT_EQ(sOut.asPoints[i].dfY, asExpected[i].dfGroundY);
         EXPECT_EQ(sOut.asPoints[i].dfZ, asExpected[i].dfGroundZ);
     }
-
-    // Without -o the result goes to standard output, header first.
-    const RunResult sStdout =
-        RunTool({"gcps", "convert", "--geosys", "UTM 31 U D000", "--height-ref", "E", osInput});
-    ASSERT_EQ(sStdout.nCode, 0) << sStdout.osErr;
-    EXPECT_EQ(sStdout.osOut.rfind("# geosys: LONG/LAT D000\nid,pixel,line,x,y,z\n", 0), 0u)
-        << sStdout.osOut;
 }
 
 TEST_F(GcpsConvertCommand, ErrorsNameTheBadValue) {

@@ -32,12 +32,12 @@ TEST(Runtime, AllocationNeverReturnsNullAndFreeAcceptsIt) {
 
     // Impossible requests throw instead of returning null, and the count
     // times size product cannot wrap around.
-    EXPECT_THROW(HMalloc(std::numeric_limits<std::uint64_t>::max()), nova::OutOfMemoryException);
     EXPECT_THROW(HCalloc(std::uint64_t(1) << 40, std::uint64_t(1) << 40),
                  nova::OutOfMemoryException);
     try {
         HMalloc(std::numeric_limits<std::uint64_t>::max());
-    } catch (const nova::Exception& e) {
+        ADD_FAILURE() << "no exception";
+    } catch (const nova::OutOfMemoryException& e) {
         EXPECT_NE(std::string(e.what()).find("18446744073709551615"), std::string::npos);
     }
 }
@@ -89,7 +89,6 @@ TEST(Runtime, FormattingAndNames) {
     EXPECT_EQ(nova::FormatString("%d-%s-%.2f", 7, "x", 1.5), "7-x-1.50");
     const std::string osLong(1000, 'a');
     EXPECT_EQ(nova::FormatString("%s!", osLong.c_str()), osLong + "!");
-    EXPECT_STREQ(_("text"), "text");
 
     // Names stay valid while the thread makes fewer than 16 more.
     const char* pszFirst = MkName("Illegal nType (%d) passed to TRNAllocate().", -7);
