@@ -1,4 +1,4 @@
-// The math model object over polynomial and thin plate spline records.
+// The math model object over polynomial records.
 
 #include <gtest/gtest.h>
 
@@ -8,12 +8,11 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <thread>
 #include <type_traits>
+#include <utility>
 #include <vector>
 
 #include "lumo.h"
-#include "model_io.h"
 #include "nova/crs.h"
 #include "nova/projection.h"
 #include "nova/runtime.h"
@@ -300,38 +299,6 @@ TEST(LumoMathModel, BlockSlotsForwardToHostFunctions) {
     EXPECT_EQ(m.GroundToImage(cols, rows, 0, nullptr, nullptr, nullptr, pa.data(), la.data(),
                               nullptr, 0.0, 0.0, 1.0, 1.0, 0.0, false),
               -1);
-}
-
-// The object takes no lock: one spline object on several threads gives the
-// single-threaded results.
-TEST(LumoMathModel, ConcurrentEvaluationOfOneObjectAgrees) {
-    const lumo::cli::LoadedModel tps =
-        lumo::cli::ReadModelFile(std::string(LUMO_SOURCE_DIR) + "/examples/tps_utm31.json");
-    const nm::LumoMathModel model(5, tps.poRecord.get());
-    constexpr int kPoints = 2000;
-    auto ground = [](int i) { return std::make_pair(441000.0 + 27.5 * i, 5662000.0 + 28.25 * i); };
-    std::vector<double> expected(2 * kPoints);
-    for (int i = 0; i < kPoints; ++i) {
-        const auto [x, y] = ground(i);
-        ASSERT_EQ(model.GroundToImage(x, y, 0.0, expected[2 * i], expected[2 * i + 1], false), 0);
-    }
-    std::vector<int> mismatches(4, 0);
-    std::vector<std::thread> threads;
-    for (int t = 0; t < 4; ++t) {
-        threads.emplace_back([&, t] {
-            for (int i = 0; i < 3 * kPoints; ++i) {
-                const auto [x, y] = ground(i % kPoints);
-                double p = 0, l = 0, gx = 0, gy = 0;
-                if (model.GroundToImage(x, y, 0.0, p, l, false) != 0 ||
-                    p != expected[2 * (i % kPoints)] || l != expected[2 * (i % kPoints) + 1] ||
-                    model.ImageToGround(p, l, 0.0, gx, gy, false) != 0) {
-                    ++mismatches[t];
-                }
-            }
-        });
-    }
-    for (std::thread& th : threads) th.join();
-    EXPECT_EQ(mismatches, std::vector<int>(4, 0));
 }
 
 }  // namespace
