@@ -345,49 +345,44 @@ TEST(MathModelCore, BadArgumentsAreRejectedWithoutWriting) {
 // failing points; a model's exception reaches the caller from any thread.
 TEST(MathModelCore, ConcurrentCallsAndThreadCountDoNotChangeResults) {
     SmoothModel oModel;
-    oModel.mdfFailFromPixel = 1703.5;
-    const int nCols = 1800;
-    const int nRows = 700;
+    oModel.mdfFailFromPixel = 803.5;
+    const int nCols = 900;
+    const int nRows = 350;
     std::vector<float> afZ = Terrain(nCols, nRows);
-    afZ[400 * nCols + 33] = kNullF;
+    afZ[200 * nCols + 33] = kNullF;
     std::vector<double> adfIn(100000);
     for (std::size_t i = 0; i < adfIn.size(); ++i) adfIn[i] = 0.021 * static_cast<double>(i);
-    struct Run {
-        std::vector<Block> aoBlocks;
-        std::vector<double> adfOut1, adfOut2;
-        std::vector<int> anValid, anResult;
-    };
+    // The statuses of three calls (two block forms, one array form), and every
+    // output and flag they wrote, in order.
+    using Run = std::pair<std::vector<int>, std::vector<double>>;
     auto Evaluate = [&] {
         Run o;
         for (const auto& [nStep, dfTol] : {std::pair{1, 0.0}, std::pair{32, 0.01}}) {
-            o.aoBlocks.emplace_back(nCols, nRows);
-            o.anResult.push_back(ImageToGroundBlock(&oModel, o.aoBlocks.back(), nStep, afZ.data(),
-                                                    -50.0, -30.0, 1.0, 1.0, dfTol));
+            Block b(nCols, nRows);
+            o.first.push_back(
+                ImageToGroundBlock(&oModel, b, nStep, afZ.data(), -50.0, -30.0, 1.0, 1.0, dfTol));
+            o.second.insert(o.second.end(), b.afOut1.begin(), b.afOut1.end());
+            o.second.insert(o.second.end(), b.afOut2.begin(), b.afOut2.end());
+            o.second.insert(o.second.end(), b.abyValid.begin(), b.abyValid.end());
         }
-        o.adfOut1.resize(adfIn.size());
-        o.adfOut2.resize(adfIn.size());
-        o.anValid.resize(adfIn.size());
-        o.anResult.push_back(nm::ImageToGround(&oModel, 12.5, 40.0, static_cast<int>(adfIn.size()),
-                                               adfIn.data(), o.adfOut1.data(), o.adfOut2.data(),
-                                               o.anValid.data(), false));
+        std::vector<double> adfX(adfIn.size()), adfY(adfIn.size());
+        std::vector<int> anValid(adfIn.size());
+        o.first.push_back(nm::ImageToGround(&oModel, 12.5, 40.0, static_cast<int>(adfIn.size()),
+                                            adfIn.data(), adfX.data(), adfY.data(), anValid.data(),
+                                            false));
+        for (const auto* padf : {&adfX, &adfY})
+            o.second.insert(o.second.end(), padf->begin(), padf->end());
+        o.second.insert(o.second.end(), anValid.begin(), anValid.end());
         return o;
     };
     auto ExpectSame = [](const Run& a, const Run& b) {
-        EXPECT_EQ(a.anResult, b.anResult);
-        for (std::size_t k = 0; k < a.aoBlocks.size(); ++k) {
-            EXPECT_EQ(0, std::memcmp(a.aoBlocks[k].afOut1.data(), b.aoBlocks[k].afOut1.data(),
-                                     a.aoBlocks[k].Size() * sizeof(float)));
-            EXPECT_EQ(0, std::memcmp(a.aoBlocks[k].afOut2.data(), b.aoBlocks[k].afOut2.data(),
-                                     a.aoBlocks[k].Size() * sizeof(float)));
-            EXPECT_EQ(a.aoBlocks[k].abyValid, b.aoBlocks[k].abyValid);
-        }
-        EXPECT_EQ(0, std::memcmp(a.adfOut1.data(), b.adfOut1.data(), a.adfOut1.size() * 8));
-        EXPECT_EQ(0, std::memcmp(a.adfOut2.data(), b.adfOut2.data(), a.adfOut2.size() * 8));
-        EXPECT_EQ(a.anValid, b.anValid);
+        EXPECT_EQ(a.first, b.first);
+        ASSERT_EQ(a.second.size(), b.second.size());
+        EXPECT_EQ(0, std::memcmp(a.second.data(), b.second.data(), a.second.size() * 8));
     };
     nova::SetEvaluationThreads(1);
     const Run oOne = Evaluate();
-    EXPECT_EQ(std::vector<int>(3, -1), oOne.anResult);
+    EXPECT_EQ(std::vector<int>(3, -1), oOne.first);
     nova::SetEvaluationThreads(3);
     ExpectSame(oOne, Evaluate());
     std::vector<Run> aoRuns(3);
