@@ -6,8 +6,6 @@
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
-#include <fstream>
 #include <functional>
 #include <limits>
 #include <sstream>
@@ -22,7 +20,6 @@
 #include "points_io.h"
 #include "support/cli_runner.h"
 
-namespace fs = std::filesystem;
 using lumo::cli::PointKind;
 using nlohmann::json;
 
@@ -33,13 +30,11 @@ const std::string kModel = kExamples + "/poly_utm31.json";
 const std::string kGcps = kExamples + "/poly_utm31_gcps.csv";
 
 using lumo::support::ReadText;
+using lumo::support::RunOk;
 using lumo::support::RunResult;
 using lumo::support::RunTool;
 
-class CliTest : public lumo::support::ScratchDirTest {
-  protected:
-    CliTest() : ScratchDirTest("lumo_cli_") {}
-};
+using CliTest = lumo::support::ScratchDirTest;
 
 // The message of the nova::DataException that `action` throws.
 std::string FailureOf(const std::function<void()>& action) {
@@ -67,11 +62,17 @@ lumo::cli::PointSet ParsePoints(const std::string& text, PointKind kind) {
 
 }  // namespace
 
-TEST_F(CliTest, PolyModelWriteReadIsBitExact) {
+TEST_F(CliTest, PolyModelFileRoundTripIsBitExact) {
+    // A transverse Mercator needs its projection parameters in the file.
     lumo::cli::PolyPtr poly(POLYAllocate());
     poly->nCoeffs = 21;
     poly->nPixels = 6000;
     poly->nLines = 4321;
+    std::strcpy(poly->pszGeosys, "TM E008");
+    ASSERT_EQ(Geosys2ProjInfo(poly->psProjInfo, poly->pszGeosys, 0.0, 0.0, 1.0, 1.0), 0);
+    poly->psProjInfo->adfProjParms[2] = 0.9996;
+    poly->psProjInfo->adfProjParms[4] = 9.0;
+    poly->psProjInfo->adfProjParms[6] = 500000.0;
     const double awkward[] = {
         1.0 / 3.0,           -0.1,  5e-324, 1.7976931348623157e308, -0.0, 2.2250738585072014e-308,
         123456789.123456789, -7e-19};
@@ -81,111 +82,40 @@ TEST_F(CliTest, PolyModelWriteReadIsBitExact) {
         poly->padfXCoeffs[k] = std::sin(k + 0.5) * std::pow(10.0, k - 10);
         poly->padfYCoeffs[k] = -std::cos(k * 1.7) / 3.0;
     }
-    std::strcpy(poly->pszGeosys, "UTM 31 U D000");
-    ASSERT_EQ(Geosys2ProjInfo(poly->psProjInfo, poly->pszGeosys, 0.0, 0.0, 1.0, 1.0), 0);
-
+    // The writer's numbers read back to the same bits (its text is the
+    // shortest that does), so the document written again is the same text;
+    // the generic reader gives the same record behind model code 4.
+    const json document = lumo::cli::PolyToJson(*poly);
+    ASSERT_TRUE(document.contains("projParms"));
     const std::string path = (mDir / "model.json").string();
-    lumo::cli::WriteModelFile(path, lumo::cli::PolyToJson(*poly));
-    const lumo::cli::PolyPtr back = lumo::cli::ReadPolyModelFile(path);
-    EXPECT_EQ(back->nCoeffs, 21);
-    EXPECT_EQ(back->nPixels, 6000);
-    EXPECT_EQ(back->nLines, 4321);
-    EXPECT_STREQ(back->pszGeosys, "UTM 31 U D000");
-    EXPECT_EQ(back->psProjInfo->nZone, poly->psProjInfo->nZone);
-    for (int k = 0; k < 21; ++k) {
-        EXPECT_TRUE(SameBits(back->padfPixelCoeffs[k], poly->padfPixelCoeffs[k])) << k;
-        EXPECT_TRUE(SameBits(back->padfLineCoeffs[k], poly->padfLineCoeffs[k])) << k;
-        EXPECT_TRUE(SameBits(back->padfXCoeffs[k], poly->padfXCoeffs[k])) << k;
-        EXPECT_TRUE(SameBits(back->padfYCoeffs[k], poly->padfYCoeffs[k])) << k;
-    }
-    // The generic reader gives the same record behind model code 4.
+    lumo::cli::WriteModelFile(path, document);
+    EXPECT_EQ(lumo::cli::PolyToJson(*lumo::cli::ReadPolyModelFile(path)).dump(), document.dump());
     const lumo::cli::LoadedModel loaded = lumo::cli::ReadModelFile(path);
     EXPECT_EQ(loaded.nModelCode, LUMO_CODE_POLY);
     ASSERT_NE(loaded.AsPoly(), nullptr);
-    EXPECT_TRUE(SameBits(loaded.AsPoly()->padfYCoeffs[20], poly->padfYCoeffs[20]));
-    EXPECT_FALSE(lumo::cli::PolyToJson(*poly).contains("projParms"));  // UTM needs none
+    EXPECT_EQ(lumo::cli::PolyToJson(*loaded.AsPoly()).dump(), document.dump());
 
     // A coefficient that JSON cannot hold is refused rather than written as null.
     poly->padfXCoeffs[4] = std::numeric_limits<double>::quiet_NaN();
     EXPECT_NE(FailureOf([&] { lumo::cli::PolyToJson(*poly); }).find("xCoeffs"), std::string::npos);
 }
 
-TEST_F(CliTest, ProjectionParametersTravelWithTheModel) {
-    lumo::cli::PolyPtr poly(POLYAllocate());
-    poly->nCoeffs = 3;
-    std::strcpy(poly->pszGeosys, "TM E008");
-    ASSERT_EQ(Geosys2ProjInfo(poly->psProjInfo, poly->pszGeosys, 0.0, 0.0, 1.0, 1.0), 0);
-    ASSERT_TRUE(RequiresProjInfo(DecodeGeosys(poly->pszGeosys, nullptr)));
-    poly->psProjInfo->adfProjParms[2] = 0.9996;
-    poly->psProjInfo->adfProjParms[4] = 9.0;
-    poly->psProjInfo->adfProjParms[6] = 500000.0;
-    const json document = lumo::cli::PolyToJson(*poly);
-    ASSERT_TRUE(document.contains("projParms"));
-    const std::string path = Write("tm.json", document.dump());
-    const lumo::cli::PolyPtr back = lumo::cli::ReadPolyModelFile(path);
-    for (int i = 0; i < NOVA_PROJ_PARMS; ++i) {
-        EXPECT_EQ(back->psProjInfo->adfProjParms[i], poly->psProjInfo->adfProjParms[i]) << i;
-    }
-}
-
-TEST_F(CliTest, ModelFileErrorsNameFileAndField) {
-    const json good = lumo::cli::ParseJsonFile(kModel);
-    struct Case {
-        std::function<void(json&)> mutate;
-        std::string expected;  // part of the message besides the file name
-    };
-    // One case per kind of fault; the field helpers' wordings are tested
-    // with the helpers.
-    const std::vector<Case> cases = {
-        {[](json& d) { d.erase("geosys"); }, "\"geosys\" is missing"},
-        {[](json& d) { d["version"] = 2; }, "\"version\" must lie in 1..1"},
-        {[](json& d) { d["family"] = "nope"; }, "unknown model family \"nope\""},
-        {[](json& d) { d["poly"]["nCoeffs"] = 22; }, "\"poly.nCoeffs\" must lie in 1..21"},
-        {[](json& d) { d["poly"]["pixelCoeffs"].erase(0); },
-         "\"poly.pixelCoeffs\" must hold 10 numbers (nCoeffs), found 9"},
-        {[](json& d) { d["poly"]["yCoeffs"][3] = "x"; }, "\"poly.yCoeffs\" item 3 must be"},
-        {[](json& d) { d["geosys"] = "UTM 31 U D000 EXTRA"; }, "longer than 16"},
-        {[](json& d) { d["geosys"] = "NOWHERE 99"; }, "\"NOWHERE 99\" cannot be used"},
-    };
-    for (std::size_t i = 0; i < cases.size(); ++i) {
-        json document = good;
-        cases[i].mutate(document);
-        const std::string path = Write("case" + std::to_string(i) + ".json", document.dump());
-        const std::string message = FailureOf([&] { lumo::cli::ReadModelFile(path); });
-        EXPECT_NE(message.find(path), std::string::npos) << message;
-        EXPECT_NE(message.find(cases[i].expected), std::string::npos) << i << ": " << message;
-    }
-    const std::string badJson = Write("bad.json", "{\"format\": \"lumo-model\",");
-    EXPECT_NE(FailureOf([&] { lumo::cli::ReadModelFile(badJson); }).find("not valid JSON"),
-              std::string::npos);
-    const std::string missing = (mDir / "absent.json").string();
-    EXPECT_NE(FailureOf([&] { lumo::cli::ReadModelFile(missing); }).find(missing),
-              std::string::npos);
-    const std::string array = Write("array.json", "[1, 2]");
-    EXPECT_NE(FailureOf([&] { lumo::cli::ReadModelFile(array); }).find("JSON object"),
-              std::string::npos);
-}
-
 TEST_F(CliTest, PointFilesParse) {
+    // Names in any case with blanks around, extra columns, comments, blank
+    // lines and CR LF line ends; a sign before a number.
     const auto set = ParsePoints(
         "# sample\r\n ID , Pixel,LINE,extra, Z \r\n\r\nA1, 10.5,-2e3,text,7\n  # "
         "note\nB2,+1,0.1,,0\n",
         PointKind::Image);
-    ASSERT_EQ(set.asPoints.size(), 2u);
-    EXPECT_TRUE(set.bHasId);
-    EXPECT_TRUE(set.bHasZ);
-    EXPECT_EQ(set.asPoints[0].osId, "A1");
-    EXPECT_EQ(set.asPoints[0].dfPixel, 10.5);
-    EXPECT_EQ(set.asPoints[0].dfLine, -2000.0);
-    EXPECT_EQ(set.asPoints[0].dfZ, 7.0);
-    EXPECT_EQ(set.asPoints[0].nSourceLine, 4);
-    EXPECT_EQ(set.asPoints[1].dfPixel, 1.0);
-    EXPECT_EQ(set.asPoints[1].dfLine, 0.1);
-    EXPECT_EQ(set.asPoints[1].nSourceLine, 6);
-
+    using C = lumo::cli::PointColumn;
+    std::ostringstream written;
+    lumo::cli::WritePoints(written, set, {C::Id, C::Pixel, C::Line, C::Z});
+    EXPECT_EQ(written.str(), "id,pixel,line,z\nA1,10.5,-2000,7\nB2,1,0.1,0\n");
+    EXPECT_TRUE(set.bHasId && set.bHasZ);
+    EXPECT_EQ(set.asPoints.at(0).nSourceLine, 4);
+    EXPECT_EQ(set.asPoints.at(1).nSourceLine, 6);
     const auto ground = ParsePoints("x,y\n1,2\n", PointKind::Ground);
-    EXPECT_FALSE(ground.bHasId);
-    EXPECT_FALSE(ground.bHasZ);
+    EXPECT_FALSE(ground.bHasId || ground.bHasZ);
     EXPECT_EQ(ground.asPoints.at(0).dfZ, 0.0);
     EXPECT_TRUE(ParsePoints("x,y\n", PointKind::Ground).asPoints.empty());
 
@@ -203,7 +133,6 @@ TEST_F(CliTest, PointFilesParse) {
     }
     many.bHasId = many.bHasZ = true;
     std::ostringstream text;
-    using C = lumo::cli::PointColumn;
     lumo::cli::WritePoints(text, many, {C::Id, C::Pixel, C::Line, C::X, C::Y, C::Z});
     const auto back = ParsePoints(text.str(), PointKind::ControlPoint);
     ASSERT_EQ(back.asPoints.size(), many.asPoints.size());
@@ -237,11 +166,6 @@ TEST_F(CliTest, PointFileErrorsNamePlace) {
         const std::string message = FailureOf([&] { ParsePoints(c.text, c.kind); });
         EXPECT_NE(message.find(c.expected), std::string::npos) << c.text << " -> " << message;
     }
-    const std::string missing = (mDir / "absent.csv").string();
-    EXPECT_NE(FailureOf([&] {
-                  lumo::cli::ReadPointsFile(missing, PointKind::Ground);
-              }).find(missing + ": cannot open"),
-              std::string::npos);
 }
 
 TEST_F(CliTest, DemoRoundTripsAreSmall) {
@@ -263,9 +187,7 @@ TEST_F(CliTest, DemoRoundTripsAreSmall) {
         EXPECT_LE(r.sImageRoundTrip.Rms(), r.sImageRoundTrip.dfMax);
         EXPECT_GT(r.sGroundResidual.dfMax, 0.0);  // the statistics saw real values
     }
-    const RunResult run = RunTool({"demo"});
-    EXPECT_EQ(run.nCode, 0) << run.osErr;
-    EXPECT_NE(run.osOut.find("poly_utm31.json"), std::string::npos);
+    EXPECT_NE(RunOk({"demo"}).osOut.find("poly_utm31.json"), std::string::npos);
 
     // The examples directory is found through the environment first.
     ASSERT_EQ(setenv("LUMO_EXAMPLES_DIR", mDir.c_str(), 1), 0);
@@ -281,9 +203,7 @@ TEST_F(CliTest, DemoRoundTripsAreSmall) {
 TEST_F(CliTest, PolyCommandMapsSampleControlPoints) {
     const auto gcps = lumo::cli::ReadPointsFile(kGcps, PointKind::ControlPoint);
     const std::string imageOut = (mDir / "image.csv").string();
-    const RunResult toImage = RunTool({"poly", kModel, "--to-image", kGcps, "-o", imageOut});
-    ASSERT_EQ(toImage.nCode, 0) << toImage.osErr;
-    EXPECT_TRUE(toImage.osOut.empty());
+    EXPECT_EQ(RunOk({"poly", kModel, "--to-image", kGcps, "-o", imageOut}).osOut, "");
     EXPECT_EQ(ReadText(imageOut).rfind("# geosys: UTM 31 U D000\nid,x,y,z,pixel,line,status\nG", 0),
               0u);
     const auto image = lumo::cli::ReadPointsFile(imageOut, PointKind::ControlPoint);
@@ -295,46 +215,34 @@ TEST_F(CliTest, PolyCommandMapsSampleControlPoints) {
         EXPECT_NEAR(image.asPoints[i].dfLine, gcps.asPoints[i].dfLine, 1e-3);
     }
 
-    const RunResult toGround = RunTool({"poly", kModel, "--to-ground", kGcps});
-    ASSERT_EQ(toGround.nCode, 0) << toGround.osErr;
+    const RunResult toGround = RunOk({"poly", kModel, "--to-ground", kGcps});
     EXPECT_EQ(ParsePoints(toGround.osOut, PointKind::ControlPoint).asPoints.size(),
               gcps.asPoints.size());
     // The generic command dispatches the same model to the same numbers.
-    const RunResult generic = RunTool({"transform", kModel, "--to-ground", kGcps});
-    EXPECT_EQ(generic.nCode, 0);
-    EXPECT_EQ(generic.osOut, toGround.osOut);
+    EXPECT_EQ(RunOk({"transform", kModel, "--to-ground", kGcps}).osOut, toGround.osOut);
 
-    const RunResult version = RunTool({"--version"});
-    EXPECT_EQ(version.nCode, 0);
-    EXPECT_EQ(version.osOut.rfind(std::string("lumo ") + LumoVersion(), 0), 0u) << version.osOut;
+    const std::string version = RunOk({"--version"}).osOut;
+    EXPECT_EQ(version.rfind(std::string("lumo ") + LumoVersion(), 0), 0u) << version;
 }
 
-TEST_F(CliTest, CommandFailuresAreReportedAndKeepOutput) {
-    const std::string out = Write("out.csv", "precious\n");
-    const std::string badPoints = Write("bad.csv", "id,x,y\nA,1,2\nB,3,oops\n");
-    const std::string farPoints = Write("far.csv", "id,x,y\nFar,1e300,1e300\n");
-    const std::string tps = Write("tps.json", R"({"format":"lumo-model","version":1,
-        "family":"tps","geosys":"UTM 31 U D000","pixels":1,"lines":1,"tps":{}})");
-    const struct {
-        std::vector<std::string> args;
-        std::string expected;
-    } cases[] = {
-        {{"poly", kModel, "--to-image", badPoints, "-o", out}, badPoints + ":3: column 3"},
-        {{"poly", kModel, "--to-image", farPoints, "-o", out},
-         "(id \"Far\"): (1e+300, 1e+300) has"},
-        {{"poly", (mDir / "none.json").string(), "--to-image", kGcps, "-o", out}, "none.json"},
-        {{"poly", tps, "--to-image", kGcps, "-o", out}, "not a polynomial model"},
-        {{"transform", tps, "--to-image", kGcps, "-o", out}, "field \"tps.geoToImage\" is missing"},
-        {{"poly", kModel, "--to-image", kGcps, "--to-ground", kGcps}, "excludes"},
-        {{"poly", kModel}, "--to-image POINTS or --to-ground POINTS"},
-        {{"transform"}, "model is required"},
-        {{"bogus"}, "bogus"},
+// Progress of long work: nothing when standard error is not a terminal (as
+// under the test runner), shown when asked for with LUMO_PROGRESS=always.
+TEST_F(CliTest, ProgressIsQuietUnlessATerminalOrAskedFor) {
+    const auto stderrOfFitAndTransform = [this] {
+        testing::internal::CaptureStderr();
+        RunOk({"fit", "--model", "tps", "--gcps", kGcps, "--geosys", "UTM 31 U D000", "-o",
+               Path("t.json")});
+        RunOk({"transform", Path("t.json"), "--to-image", kGcps});
+        return testing::internal::GetCapturedStderr();
     };
-    for (const auto& c : cases) {
-        const RunResult r = RunTool(c.args);
-        EXPECT_NE(r.nCode, 0) << c.args[0];
-        EXPECT_NE(r.osErr.find(c.expected), std::string::npos) << r.osErr;
-        EXPECT_EQ(ReadText(out), "precious\n");
-        EXPECT_FALSE(fs::exists(out + ".tmp"));
-    }
+    EXPECT_EQ(stderrOfFitAndTransform(), "");
+    setenv("LUMO_PROGRESS", "always", 1);
+    const std::string shown = stderrOfFitAndTransform();
+    setenv("LUMO_PROGRESS", "never", 1);
+    EXPECT_EQ(stderrOfFitAndTransform(), "");
+    unsetenv("LUMO_PROGRESS");
+    EXPECT_NE(shown.find("\rlumo fit: fitting the thin plate spline to 15 control points... 0 s"),
+              std::string::npos)
+        << shown;
+    EXPECT_NE(shown.find("\rtransforming 100%"), std::string::npos) << shown;
 }

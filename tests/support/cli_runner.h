@@ -37,6 +37,14 @@ inline RunResult RunTool(std::vector<std::string> args) {
     return {code, out.str(), err.str()};
 }
 
+// Runs `lumo <args...>` and expects success; the run's messages tell why not.
+inline RunResult RunOk(std::vector<std::string> args) {
+    const std::string command = args.empty() ? std::string() : args[0];
+    RunResult r = RunTool(std::move(args));
+    EXPECT_EQ(r.nCode, 0) << command << ": " << r.osErr;
+    return r;
+}
+
 // The whole content of a text file ("" when it cannot be read).
 inline std::string ReadText(const std::string& path) {
     std::ifstream in(path);
@@ -51,6 +59,7 @@ inline std::string ReadText(const std::string& path) {
 class ScratchDirTest : public ::testing::Test {
   protected:
     explicit ScratchDirTest(std::string osPrefix) : mosPrefix(std::move(osPrefix)) {}
+    ScratchDirTest() : ScratchDirTest("lumo_") {}
 
     void SetUp() override {
         const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
