@@ -73,7 +73,8 @@ TEST_F(FitTest, PolyFitTransformResidualsEndToEnd) {
     std::getline(tableText, row);
     EXPECT_EQ(row, "id,pixel,line,x,y,z,dpixel,dline,dx,dy,status");
     double sumPixel2 = 0, sumX2 = 0;
-    for (std::size_t i = 0; i < 15 && std::getline(tableText, row); ++i) {
+    for (std::size_t i = 0; i < 15; ++i) {
+        std::getline(tableText, row);
         std::vector<std::string> f;
         std::stringstream fields(row);
         for (std::string item; std::getline(fields, item, ',');) f.push_back(item);

@@ -75,6 +75,7 @@ TEST(SimScene, SegmentMatchesTheGeometry) {
     std::unique_ptr<EphemerisSeg_t, SegmentDeleter> psSeg(sScene.MakeSegment());
     EXPECT_STREQ(psSeg->szGeosys, "UTM 32 T D000");  // 20 degrees east of nadir at 3 E
     EXPECT_DOUBLE_EQ(psSeg->dfViewAngle, 20.0 * kDeg);
+    EXPECT_EQ(psSeg->nNumLines, sParams.nLines);
     // Circular orbit: no radial velocity; 822 km orbit has a period near
     // 101 minutes.
     EXPECT_EQ(psSeg->dfSatVelocity, 0.0);
