@@ -176,17 +176,14 @@ TEST_F(CliChecks, FailedPointsAreNeverPositions) {
     EXPECT_NE(rf.osOut.find("\nB,100,100,1e+09,,,failed-to-ground\n"), std::string::npos);
 }
 
-TEST_F(CliChecks, HeightsAreGivenNotAssumed) {
+TEST_F(CliChecks, HeightsAreGivenAndGroundCoordinatesConverted) {
+    const std::string poly = kExamples + "poly_utm31.json";
     const std::string pts = Write("i.csv", "pixel,line\n5000,5000\n");
     const RunResult r = Expect(
         {"transform", kExamples + "rf_scene.json", "--to-ground", pts, "--height", "100"}, 0, "");
     EXPECT_NE(r.osOut.find("pixel,line,z,x,y,status\n5000,5000,100,"), std::string::npos);
     // Polynomials do not depend on the height: no z is needed there.
-    Expect({"transform", kExamples + "poly_utm31.json", "--to-ground", pts}, 0, "");
-}
-
-TEST_F(CliChecks, GroundCoordinatesAreConvertedOrRefused) {
-    const std::string poly = kExamples + "poly_utm31.json";
+    Expect({"transform", poly, "--to-ground", pts}, 0, "");
     // The bundled points in WGS 84 degrees (converted by the control point
     // conversion) map to the same image positions once declared.
     Expect({"gcps", "convert", "--geosys", kUtm, "--height-ref", "E", kGcps, "-o", Path("ll.csv")},
