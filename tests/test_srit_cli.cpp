@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cmath>
 #include <filesystem>
 #include <fstream>
@@ -12,6 +13,7 @@
 
 #include "cli.h"
 #include "demo.h"
+#include "elevation_separation.h"
 #include "model_io.h"
 #include "points_io.h"
 #include "runtime.h"
@@ -110,6 +112,53 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     r = RunTool({"residuals", Path("broken.json"), "--gcps", checks});
     EXPECT_NE(r.nCode, 0);
     EXPECT_NE(r.osErr.find("adfCoef[0] = 0"), std::string::npos) << r.osErr;
+}
+
+// `lumo block` on the bundled stereo project: without options only images
+// whose control points cannot separate the elevation terms are constrained,
+// and the report says why; --constrain sets every segment's constraint flag
+// (the report and the written models say so) and the pair still checks
+// well; a project error names the bad value.
+TEST_F(SritCliTest, BlockOnTheBundledStereoProject) {
+    const std::string examples = std::string(LUMO_SOURCE_DIR) + "/examples/";
+    const std::string project = examples + "block_stereo.json";
+    RunResult r = RunTool({"block", project, "-o", mDir.string()});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    nlohmann::json report = nlohmann::json::parse(lumo::support::ReadText(Path("report.json")));
+    ASSERT_EQ(report["images"].size(), 2u);
+    EXPECT_EQ(report["tiePoints"].size(), 12u);
+    EXPECT_EQ(report["controlPoints"].size(), 12u);
+    for (const auto& image : report["images"]) {
+        const auto& separation = image["elevationSeparation"];
+        const bool bWeak = std::min(separation["across"].get<double>(),
+                                    separation["along"].get<double>()) < lumo::cli::kWeakSeparation;
+        EXPECT_EQ(image["constrained"].get<bool>(), bWeak);
+        if (bWeak) {
+            EXPECT_EQ(image["constrainedBy"], "weak control points");
+        }
+    }
+    r = RunTool({"block", project, "-o", mDir.string(), "--constrain"});
+    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    report = nlohmann::json::parse(lumo::support::ReadText(Path("report.json")));
+    for (const auto& image : report["images"]) {
+        EXPECT_TRUE(image["constrained"].get<bool>());
+        EXPECT_EQ(image["constrainedBy"], "--constrain");
+        EXPECT_LT(image["checkResiduals"]["rmsPixel"].get<double>(), 0.5);
+        EXPECT_LT(image["checkResiduals"]["rmsLine"].get<double>(), 0.5);
+        const lumo::cli::LoadedModel model =
+            lumo::cli::ReadModelFile(image["model"].get<std::string>());
+        const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
+        EXPECT_EQ(psModel->psEphemeris->nSupplementFlag, 1);
+    }
+    // A tie naming an image the project does not list.
+    nlohmann::json doc = nlohmann::json::parse(lumo::support::ReadText(project));
+    doc["ties"][3]["image"] = "middle";
+    for (auto& image : doc["images"]) {
+        image["segment"] = examples + image["segment"].get<std::string>();
+    }
+    r = RunTool({"block", Write("bad.json", doc.dump()), "-o", mDir.string()});
+    EXPECT_NE(r.nCode, 0);
+    EXPECT_NE(r.osErr.find("ties[3] names image \"middle\""), std::string::npos) << r.osErr;
 }
 
 TEST(SritDemo, SampleModelMeetsItsCheckPoints) {

@@ -79,6 +79,21 @@ struct Block {
         adfTieZ.push_back(dfZ);
         adfTieZGiven.push_back(dfZ);
     }
+    // Calls fn(index, observation in each image, ground point) for each of
+    // the ground points that every image sees; returns how many it called.
+    template <typename Fn>
+    int ForEachSeenByAll(const std::vector<lumo::sim::SimPoint>& asGround, Fn fn) const {
+        int n = 0;
+        for (const lumo::sim::SimPoint& sGround : asGround) {
+            std::vector<lumo::sim::SimPoint> asObs(asScenes.size());
+            bool bSeen = true;
+            for (std::size_t k = 0; k < asScenes.size() && bSeen; ++k) {
+                bSeen = lumo::sim::ProjectInto(asScenes[k], sGround, &asObs[k]);
+            }
+            if (bSeen) fn(n++, asObs, sGround);
+        }
+        return n;
+    }
     int Run(int nImages = -1) {
         if (nImages < 0) nImages = static_cast<int>(asScenes.size());
         const int nGcp = static_cast<int>(adfX.size());
@@ -116,7 +131,7 @@ struct GridBlock {
     std::vector<std::vector<lumo::sim::SimPoint>> aasCheck;
 
     GridBlock(int nRows, int nCols, int nTiePoints, bool bKnownElevation,
-              const std::vector<char>& abConstrained = {}) {
+              const std::vector<char>& abConstrained = {}, std::uint32_t nControlSeed = 1000) {
         for (int r = 0; r < nRows; ++r) {
             for (int c = 0; c < nCols; ++c) {
                 lumo::sim::SceneParams s;
@@ -133,7 +148,7 @@ struct GridBlock {
             const auto nSeed = static_cast<std::uint32_t>(k);
             const std::string osPrefix = std::to_string(k) + "_";
             aasControl.push_back(
-                sBlock.asScenes[k].SamplePoints(4, 1000 + nSeed, 0.0, 1200.0, 0.05));
+                sBlock.asScenes[k].SamplePoints(4, nControlSeed + nSeed, 0.0, 1200.0, 0.05));
             aasCheck.push_back(
                 sBlock.asScenes[k].SamplePoints(25, 2000 + nSeed, 0.0, 1200.0, 0.05));
             for (std::size_t i = 0; i < aasControl[k].size(); ++i) {
