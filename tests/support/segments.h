@@ -108,18 +108,25 @@ inline void Attach(EphemerisSeg_t* psSeg, int nKind, void* pvSub) {
     *psSeg->ppOrbitData = pvSub;
 }
 
+// Attaches an attitude record with a zero-filled per-line table of nLines
+// lines to a segment that holds no sub-record; returns the record.
+inline AttitudeData_t* AttachLineTable(EphemerisSeg_t* psSeg, int nLines) {
+    auto* psAtt = Zeroed<AttitudeData_t>();
+    psAtt->nNumAttitudeLines = nLines;
+    psAtt->pAttitudeLines = Zeroed<AttitudeLine_t>(static_cast<std::size_t>(nLines));
+    Attach(psSeg, EPH_ORBIT_ATTITUDE, psAtt);
+    return psAtt;
+}
+
 inline lumo::cli::SegmentPtr RandomSegment(int nKind, int nLines, unsigned nSeed) {
     Filler r(nSeed);
     lumo::cli::SegmentPtr poSeg = RandomMainRecord(r);
     if (nKind == EPH_ORBIT_ATTITUDE) {
-        auto* psAtt = Zeroed<AttitudeData_t>();
+        AttitudeData_t* psAtt = AttachLineTable(poSeg.get(), nLines);
         psAtt->dfAttitude1 = r.Double();
         psAtt->dfAttitude2 = r.Double();
         psAtt->dfAttitude3 = r.Double();
-        psAtt->nNumAttitudeLines = nLines;
-        psAtt->pAttitudeLines = Zeroed<AttitudeLine_t>(nLines);
         for (int i = 0; i < nLines; ++i) psAtt->pAttitudeLines[i] = {r.Double(), r.Double()};
-        Attach(poSeg.get(), nKind, psAtt);
     } else if (nKind == EPH_ORBIT_RADAR) {
         auto* psRadar = Zeroed<RadarData_t>();
         r.Bytes(psRadar->abyLeading, sizeof(psRadar->abyLeading));
