@@ -39,20 +39,29 @@ TEST(EphemerisRecord, LayoutOfFixedBlocks) {
     EXPECT_EQ(sizeof(EphemerisSeg_t{}.adfLevelConvCoefs), 39 * sizeof(double));
 }
 
-// Every kind: the copy equals its source byte for byte and stands alone once
-// the source is released.
-TEST(EphemerisDuplicate, CopiesOfEveryKindOutliveTheirSource) {
+// Every kind: the duplicate and the copies into another segment (a new one,
+// and a radar segment whose sub-record is released) equal their source byte
+// for byte, in blocks of their own, and stand alone once it is released.
+TEST(EphemerisCopies, EveryKindCopiesAndOutlivesItsSource) {
     for (int nKind : {EPH_ORBIT_NONE, EPH_ORBIT_ATTITUDE, EPH_ORBIT_RADAR, EPH_ORBIT_AVHRR}) {
         SCOPED_TRACE("kind " + std::to_string(nKind));
         SegmentPtr poSrc = RandomSegment(nKind, 5, 40u + nKind);
-        SegmentPtr poCopy(EphemerisSegDuplicate(poSrc.get()));
-        ASSERT_NE(poCopy, nullptr);
-        if (nKind != EPH_ORBIT_NONE) {
-            EXPECT_NE(poCopy->ppOrbitData, poSrc->ppOrbitData);
-            EXPECT_NE(*poCopy->ppOrbitData, *poSrc->ppOrbitData);
+        EphemerisSeg_t* psSrc = poSrc.get();
+        EphemerisSeg_t* psNew = nullptr;
+        EphemerisSeg_t* psReplaced = RandomSegment(EPH_ORBIT_RADAR, 6, 7u).release();
+        EphemerisSegCopyInto(&psNew, &psSrc);
+        EphemerisSegCopyInto(&psReplaced, &psSrc);
+        const SegmentPtr apoCopies[] = {SegmentPtr(EphemerisSegDuplicate(psSrc)), SegmentPtr(psNew),
+                                        SegmentPtr(psReplaced)};
+        for (const SegmentPtr& poCopy : apoCopies) {
+            ASSERT_NE(poCopy, nullptr);
+            if (nKind == EPH_ORBIT_NONE) continue;
+            EXPECT_NE(poCopy->ppOrbitData, psSrc->ppOrbitData);
+            EXPECT_NE(*poCopy->ppOrbitData, *psSrc->ppOrbitData);
         }
         poSrc.reset();
-        ExpectSameSegment(*poCopy, *RandomSegment(nKind, 5, 40u + nKind));
+        const SegmentPtr poExpected = RandomSegment(nKind, 5, 40u + nKind);
+        for (const SegmentPtr& poCopy : apoCopies) ExpectSameSegment(*poCopy, *poExpected);
     }
     EXPECT_EQ(EphemerisSegDuplicate(nullptr), nullptr);
 }
@@ -79,16 +88,28 @@ TEST(EphemerisDuplicate, UnknownKindAndEmptyHolder) {
     LumoSatEphemerisFree(nullptr);
 }
 
-// A count that disagrees with its array is never followed: the copy holds no
-// line array and keeps the count as it is (EphemerisSegValidate refuses it).
-TEST(EphemerisDuplicate, CountDisagreeingWithArray) {
+// A count that disagrees with its line array is never followed. The
+// duplicate keeps the sub-record without lines and the count as it is
+// (EphemerisSegValidate refuses it); a copy into another segment copies a
+// sub-record whose count is negative without lines, and leaves out one
+// whose line array is missing.
+TEST(EphemerisCopies, CountsThatDisagreeWithTheirArray) {
     SegmentPtr poNegative = RandomSegment(EPH_ORBIT_RADAR, 2, 3u);
     SubRecord<RadarData_t>(poNegative.get())->nNumLinePositions = -4;
-    SegmentPtr poCopy(EphemerisSegDuplicate(poNegative.get()));
-    const RadarData_t* psRadar = SubRecord<RadarData_t>(poCopy.get());
-    ASSERT_NE(psRadar, nullptr);
-    EXPECT_EQ(psRadar->pLinePositions, nullptr);
-    EXPECT_EQ(psRadar->nNumLinePositions, -4);
+    EphemerisSeg_t* psNegative = poNegative.get();
+    SegmentPtr poInto = RandomSegment(EPH_ORBIT_AVHRR, 2, 9u);
+    EphemerisSeg_t* psInto = poInto.get();
+    EphemerisSegCopyInto(&psInto, &psNegative);
+    const SegmentPtr poDuplicate(EphemerisSegDuplicate(psNegative));
+    for (const EphemerisSeg_t* psCopy : {psInto, poDuplicate.get()}) {
+        const RadarData_t* psRadar = SubRecord<RadarData_t>(psCopy);
+        ASSERT_NE(psRadar, nullptr);
+        EXPECT_EQ(psRadar->pLinePositions, nullptr);
+        EXPECT_EQ(psRadar->nNumLinePositions, -4);
+        EXPECT_EQ(std::memcmp(psRadar->abyLeading, SubRecord<RadarData_t>(psNegative)->abyLeading,
+                              RADAR_LEADING_SIZE),
+                  0);
+    }
 
     // Line arrays gone, counts left.
     SegmentPtr poAtt = RandomSegment(EPH_ORBIT_ATTITUDE, 7, 4u);
@@ -99,12 +120,18 @@ TEST(EphemerisDuplicate, CountDisagreeingWithArray) {
     EXPECT_EQ(psAtt->pAttitudeLines, nullptr);
     EXPECT_EQ(psAtt->nNumAttitudeLines, 7);
     EXPECT_EQ(psAtt->dfAttitude3, SubRecord<AttitudeData_t>(poAtt.get())->dfAttitude3);
-
     SegmentPtr poAvhrr = RandomSegment(EPH_ORBIT_AVHRR, 7, 4u);
     DropLines(poAvhrr.get(), &AvhrrData_t::pScanLines);
     SegmentPtr poAvhrrCopy(EphemerisSegDuplicate(poAvhrr.get()));
     EXPECT_EQ(SubRecord<AvhrrData_t>(poAvhrrCopy.get())->pScanLines, nullptr);
     EXPECT_EQ(SubRecord<AvhrrData_t>(poAvhrrCopy.get())->nNumScanLines, 7);
+    for (int32_t nCount : {7, 0}) {
+        SubRecord<AttitudeData_t>(poAtt.get())->nNumAttitudeLines = nCount;
+        EphemerisSeg_t* psAttSrc = poAtt.get();
+        EphemerisSegCopyInto(&psInto, &psAttSrc);
+        EXPECT_EQ(psInto->nOrbitType, EPH_ORBIT_ATTITUDE);
+        EXPECT_EQ(psInto->ppOrbitData, nullptr) << nCount;
+    }
 }
 
 TEST(EphemerisFreeOrbit, KeepsTheMainRecord) {
@@ -121,67 +148,6 @@ TEST(EphemerisFreeOrbit, KeepsTheMainRecord) {
     EphemerisSegFreeOrbit(nullptr);
 }
 
-TEST(EphemerisCopyInto, CreatesReplacesAndReleases) {
-    EphemerisSeg_t* psDst = nullptr;
-    EphemerisSeg_t* psSrc = nullptr;
-    EphemerisSegCopyInto(&psDst, &psSrc);  // neither has a segment
-    EXPECT_EQ(psDst, nullptr);
-
-    SegmentPtr poSrc = RandomSegment(EPH_ORBIT_ATTITUDE, 4, 6u);
-    psSrc = poSrc.get();
-    EphemerisSegCopyInto(&psDst, &psSrc);  // destination created
-    SegmentPtr poDst(psDst);
-    ASSERT_NE(psDst, nullptr);
-    EXPECT_NE(SubRecord<AttitudeData_t>(psDst), SubRecord<AttitudeData_t>(psSrc));
-    ExpectSameSegment(*psDst, *psSrc);
-
-    // Replace an existing radar segment: the old sub-record is released.
-    SegmentPtr poRadar = RandomSegment(EPH_ORBIT_RADAR, 6, 7u);
-    EphemerisSeg_t* psRadar = poRadar.release();
-    EphemerisSegCopyInto(&psRadar, &psSrc);
-    poRadar.reset(psRadar);
-    poSrc.reset();  // the copies stand alone
-    psSrc = nullptr;
-    const SegmentPtr poExpected = RandomSegment(EPH_ORBIT_ATTITUDE, 4, 6u);
-    ExpectSameSegment(*psRadar, *poExpected);
-    ExpectSameSegment(*psDst, *poExpected);
-
-    // A source without a segment releases the destination's.
-    psDst = poDst.release();
-    EphemerisSegCopyInto(&psDst, &psSrc);
-    EXPECT_EQ(psDst, nullptr);
-}
-
-TEST(EphemerisCopyInto, SubRecordWithoutLinesIsNotCopied) {
-    SegmentPtr poSrc = RandomSegment(EPH_ORBIT_ATTITUDE, 2, 8u);
-    DropLines(poSrc.get(), &AttitudeData_t::pAttitudeLines);
-    SubRecord<AttitudeData_t>(poSrc.get())->nNumAttitudeLines = 0;
-    EphemerisSeg_t* psSrc = poSrc.get();
-    SegmentPtr poDst = RandomSegment(EPH_ORBIT_AVHRR, 2, 9u);
-    EphemerisSeg_t* psDst = poDst.release();
-    EphemerisSegCopyInto(&psDst, &psSrc);
-    poDst.reset(psDst);
-    EXPECT_EQ(psDst->nOrbitType, EPH_ORBIT_ATTITUDE);
-    EXPECT_EQ(psDst->ppOrbitData, nullptr);
-
-    // Null array with a positive count: the same, nothing read.
-    SubRecord<AttitudeData_t>(psSrc)->nNumAttitudeLines = 12;
-    EphemerisSegCopyInto(&psDst, &psSrc);
-    EXPECT_EQ(psDst->ppOrbitData, nullptr);
-
-    // An array with a negative count: the sub-record is copied, no lines.
-    SegmentPtr poNeg = RandomSegment(EPH_ORBIT_RADAR, 3, 10u);
-    RadarData_t* psNegRadar = SubRecord<RadarData_t>(poNeg.get());
-    psNegRadar->nNumLinePositions = -1;
-    EphemerisSeg_t* psNeg = poNeg.get();
-    EphemerisSegCopyInto(&psDst, &psNeg);
-    const RadarData_t* psRadar = SubRecord<RadarData_t>(psDst);
-    ASSERT_NE(psRadar, nullptr);
-    EXPECT_EQ(psRadar->pLinePositions, nullptr);
-    EXPECT_EQ(psRadar->nNumLinePositions, -1);
-    EXPECT_EQ(std::memcmp(psRadar->abyLeading, psNegRadar->abyLeading, RADAR_LEADING_SIZE), 0);
-}
-
 TEST(EphemerisCopyInto, SameRecordOrSharedSegmentChangesNothing) {
     SegmentPtr poSeg = RandomSegment(EPH_ORBIT_RADAR, 2, 11u);
     EphemerisSeg_t* psSeg = poSeg.get();
@@ -194,6 +160,16 @@ TEST(EphemerisCopyInto, SameRecordOrSharedSegmentChangesNothing) {
     EphemerisSegCopyInto(nullptr, &psSeg);
     EphemerisSegCopyInto(&psAlias, nullptr);
     EXPECT_EQ(psAlias, psSeg);
+
+    // Neither has a segment; a source without a segment releases the
+    // destination's.
+    EphemerisSeg_t* psNone = nullptr;
+    EphemerisSeg_t* psDst = nullptr;
+    EphemerisSegCopyInto(&psDst, &psNone);
+    EXPECT_EQ(psDst, nullptr);
+    psDst = RandomSegment(EPH_ORBIT_ATTITUDE, 4, 6u).release();
+    EphemerisSegCopyInto(&psDst, &psNone);
+    EXPECT_EQ(psDst, nullptr);
 }
 
 }  // namespace

@@ -37,6 +37,7 @@ TEST(SensorCatalogue, MatchingRules) {
         {"TM", 30.0, 30},  // pixel size decides between rows of one name
         {"TM", 15.0, 31},
         {"TM", 15.000000001, 30},
+        {"TM", 14.999999999, 30},
         {"IKO", 4.0, 33},
         {"IKO", std::nextafter(4.0, 5.0), 32},
         {"RADARSAT_2X", 10, -999},

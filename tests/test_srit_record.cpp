@@ -13,6 +13,7 @@
 #include "projection.h"
 #include "runtime.h"
 #include "support/numbered_error.h"
+#include "support/segments.h"
 
 namespace {
 
@@ -44,13 +45,8 @@ SRITInfo_t* FilledRecord() {
     psModel->nSensor = 54;
     psModel->nModelClass = 5;
     std::strcpy(psModel->psEphemeris->szSensorName, "PLA");
-    auto* psAttitude = static_cast<AttitudeData_t*>(HCalloc(1, sizeof(AttitudeData_t)));
-    psAttitude->nNumAttitudeLines = 5;
-    psAttitude->pAttitudeLines = static_cast<AttitudeLine_t*>(HCalloc(5, sizeof(AttitudeLine_t)));
+    AttitudeData_t* psAttitude = lumo::support::AttachLineTable(psModel->psEphemeris, 5);
     for (int i = 0; i < 5; ++i) psAttitude->pAttitudeLines[i] = {1.0 * i, -1.0 * i};
-    psModel->psEphemeris->ppOrbitData = static_cast<void**>(HMalloc(sizeof(void*)));
-    *psModel->psEphemeris->ppOrbitData = psAttitude;
-    psModel->psEphemeris->nOrbitType = EPH_ORBIT_ATTITUDE;
     psModel->padfLineShiftA = LineArray(5, 1.0);
     psModel->padfLineShiftB = LineArray(5, -1.0);
     EXPECT_EQ(Geosys2ProjInfo(psModel->psProjInfo, "UTM 31 D000", 0.0, 0.0, 1.0, 1.0), 0);
