@@ -26,22 +26,10 @@ using lumo::sim::Scene;
 using lumo::sim::SceneParams;
 using lumo::sim::SimPoint;
 using lumo::support::Block;
+using lumo::support::CheckRms;
 using lumo::support::FatalOf;
 using lumo::support::GridBlock;
 using lumo::support::Id;
-
-// RMS distance in pixels between the model's image position of the points
-// and their true one.
-double CheckRms(const SRITInfo_t* psModel, const std::vector<SimPoint>& asPoints) {
-    double dfSum = 0.0;
-    for (const SimPoint& s : asPoints) {
-        double dfPixel = 0.0, dfLine = 0.0;
-        SRITGeo2Img(psModel, s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine);
-        dfSum += (dfPixel - s.dfPixel) * (dfPixel - s.dfPixel) +
-                 (dfLine - s.dfLine) * (dfLine - s.dfLine);
-    }
-    return std::sqrt(dfSum / static_cast<double>(asPoints.size()));
-}
 
 SceneParams BaseParams() {
     SceneParams s;
@@ -70,33 +58,29 @@ StereoResult RunStereo(Block& sBlock, bool bCheckObservations, int nGcp = 6) {
     sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, -20.0, 0.0));
     sBlock.AddImage(sRight);
     using Obs = std::vector<SimPoint>;
-    EXPECT_EQ(sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, nGcp, 7),
-                                      [&](int i, const Obs& as, const SimPoint&) {
-                                          for (int k = 0; k < 2; ++k)
-                                              sBlock.AddGcp(k, "pt" + std::to_string(i), as[k]);
-                                      }),
-              nGcp);
+    const auto fnSeen = [&](int nPoints, std::uint32_t nSeed, auto fnAdd) {
+        return sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, nPoints, nSeed), fnAdd);
+    };
+    const int nSeenGcp = fnSeen(nGcp, 7, [&](int i, const Obs& as, const SimPoint&) {
+        for (int k = 0; k < 2; ++k) sBlock.AddGcp(k, "pt" + std::to_string(i), as[k]);
+    });
+    EXPECT_EQ(nSeenGcp, nGcp);
     std::vector<double> adfTrueTieZ;
-    sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, 30, 8),
-                            [&](int i, const Obs& as, const SimPoint& sGround) {
-                                for (int k = 0; k < 2; ++k)
-                                    sBlock.AddTie(k, "TIE" + std::to_string(i), as[k]);
-                                adfTrueTieZ.push_back(sGround.dfZ);
-                            });
+    fnSeen(30, 8, [&](int i, const Obs& as, const SimPoint& sGround) {
+        for (int k = 0; k < 2; ++k) sBlock.AddTie(k, "TIE" + std::to_string(i), as[k]);
+        adfTrueTieZ.push_back(sGround.dfZ);
+    });
     EXPECT_EQ(adfTrueTieZ.size(), 30u);
     std::vector<SimPoint> asCheck[2];
-    EXPECT_EQ(sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, 50, 9),
-                                      [&](int i, const Obs& as, const SimPoint&) {
-                                          for (int k = 0; k < 2; ++k) {
-                                              asCheck[k].push_back(as[k]);
-                                              SimPoint sWrong = as[k];
-                                              sWrong.dfPixel += 50.0;
-                                              if (!bCheckObservations) continue;
-                                              sBlock.AddGcp(k, "chk" + std::to_string(i), sWrong,
-                                                            'C');
-                                          }
-                                      }),
-              50);
+    const int nChecks = fnSeen(50, 9, [&](int i, const Obs& as, const SimPoint&) {
+        for (int k = 0; k < 2; ++k) {
+            asCheck[k].push_back(as[k]);
+            SimPoint sWrong = as[k];
+            sWrong.dfPixel += 50.0;
+            if (bCheckObservations) sBlock.AddGcp(k, "chk" + std::to_string(i), sWrong, 'C');
+        }
+    });
+    EXPECT_EQ(nChecks, 50);
     StereoResult sOut;
     EXPECT_EQ(sBlock.Run(), 1);
     for (int k = 0; k < 2; ++k) sOut.adfCheckRms[k] = CheckRms(sBlock.apsModels[k], asCheck[k]);
@@ -204,12 +188,10 @@ TEST(SRITBlock, StripOfTenImages) {
 void FillTwoImages(Block& sBlock) {
     sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, -15.0, 0.0));
     sBlock.AddImage(AimAt(BaseParams(), 45.0, 3.0, 15.0, 0.0));
-    EXPECT_EQ(sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, 4, 11),
-                                      [&](int i, const std::vector<SimPoint>& as, const SimPoint&) {
-                                          for (int k = 0; k < 2; ++k)
-                                              sBlock.AddGcp(k, "P" + std::to_string(i), as[k]);
-                                      }),
-              4);
+    const auto fnAdd = [&](int i, const std::vector<SimPoint>& as, const SimPoint&) {
+        for (int k = 0; k < 2; ++k) sBlock.AddGcp(k, "P" + std::to_string(i), as[k]);
+    };
+    EXPECT_EQ(sBlock.ForEachSeenByAll(GroundPoints(45.0, 3.0, 4, 11), fnAdd), 4);
 }
 
 // Two images with four points each work and the debug log names each

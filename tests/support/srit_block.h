@@ -15,6 +15,24 @@
 namespace lumo {
 namespace support {
 
+// RMS distance in pixels between a model's image positions of the points and
+// their true ones, through the closed ground-to-image form or the exact one;
+// HUGE_VAL when the exact form fails on a point.
+inline double CheckRms(const SRITInfo_t* psModel, const std::vector<lumo::sim::SimPoint>& asPoints,
+                       bool bExact = false) {
+    double dfSum = 0.0;
+    for (const lumo::sim::SimPoint& s : asPoints) {
+        double dfPixel = 0.0, dfLine = 0.0;
+        if (!bExact) {
+            SRITGeo2Img(psModel, s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine);
+        } else if (SRITGeo2ImgExact(psModel, s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine) != 1) {
+            return HUGE_VAL;
+        }
+        dfSum += std::pow(dfPixel - s.dfPixel, 2) + std::pow(dfLine - s.dfLine, 2);
+    }
+    return std::sqrt(dfSum / static_cast<double>(asPoints.size()));
+}
+
 // Identifier of SRIT_ID_SIZE characters, blank padded.
 inline std::string Id(const std::string& osText) {
     std::string os = osText;
@@ -181,17 +199,7 @@ struct GridBlock {
     double WorstCheckRms() const {
         double dfWorst = 0.0;
         for (std::size_t k = 0; k < aasCheck.size(); ++k) {
-            double dfSum = 0.0;
-            for (const lumo::sim::SimPoint& s : aasCheck[k]) {
-                double dfPixel = 0.0, dfLine = 0.0;
-                if (SRITGeo2ImgExact(sBlock.apsModels[k], s.dfX, s.dfY, s.dfZ, &dfPixel, &dfLine) !=
-                    1) {
-                    return HUGE_VAL;
-                }
-                dfSum += (dfPixel - s.dfPixel) * (dfPixel - s.dfPixel) +
-                         (dfLine - s.dfLine) * (dfLine - s.dfLine);
-            }
-            dfWorst = std::max(dfWorst, std::sqrt(dfSum / static_cast<double>(aasCheck[k].size())));
+            dfWorst = std::max(dfWorst, CheckRms(sBlock.apsModels[k], aasCheck[k], true));
         }
         return dfWorst;
     }
