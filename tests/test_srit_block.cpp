@@ -206,16 +206,11 @@ TEST(SRITBlock, ImageWithoutEnoughPoints) {
     Block sShort;
     FillTwoImages(sShort);
     sShort.osGcpImage.replace(7 * SRIT_ID_SIZE, SRIT_ID_SIZE, Id("IMG0"));
-    const auto fnBytes = [&] {
-        const auto* pby = reinterpret_cast<const unsigned char*>(sShort.apsModels[0]);
-        std::vector<unsigned char> aby(pby, pby + sizeof(SRITInfo_t));
-        pby = reinterpret_cast<const unsigned char*>(sShort.apsModels[1]);
-        aby.insert(aby.end(), pby, pby + sizeof(SRITInfo_t));
-        return aby;
-    };
-    const std::vector<unsigned char> abyBefore = fnBytes();
+    const SRITInfo_t asBefore[] = {*sShort.apsModels[0], *sShort.apsModels[1]};
     EXPECT_EQ(sShort.Run(), 0);
-    EXPECT_EQ(fnBytes(), abyBefore);
+    for (int k = 0; k < 2; ++k) {
+        EXPECT_EQ(std::memcmp(&asBefore[k], sShort.apsModels[k], sizeof(SRITInfo_t)), 0) << k;
+    }
     std::vector<std::string> asMessages;
     for (const auto& r : oLog.maoRecords) {
         if (r.nLine != 1268 && r.nLine != 1100) continue;
