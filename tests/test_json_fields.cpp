@@ -57,8 +57,6 @@ TEST(JsonFields, ContextsMembersTextsAndFlags) {
     const json object = {{"name", "UTM 31"}, {"flag", true}, {"sub", {{"a", 1}}}, {"n", 2}};
     EXPECT_EQ(cli::FindField(object, "absent"), nullptr);
     EXPECT_EQ(*cli::FindField(object, "n"), 2);
-    EXPECT_EQ(MessageOf([&] { cli::RequireField(object, "absent", kAp); }),
-              "m.json: field \"ap.absent\" is missing");
     EXPECT_EQ(cli::RequireField(ordered_json{{"version", 1}}, "version", kTop), 1);
     EXPECT_EQ(cli::RequireObjectField(object, "sub", kTop).at("a"), 1);
     ExpectFailureNaming([&] { cli::RequireObjectField(object, "n", kTop); }, {"\"n\"", "object"});
@@ -89,8 +87,7 @@ TEST(JsonFields, NumbersAndIntegersInRange) {
                       "\" must be a finite number, found null");
     }
     EXPECT_EQ(cli::GetInt(object, "hi", -3, 21, kTop), 21);
-    EXPECT_EQ(MessageOf([&] { cli::GetInt(object, "hi", 1, 20, kAp); }),
-              "m.json: field \"ap.hi\" must lie in 1..20, found 21");
+    ExpectFailureNaming([&] { cli::GetInt(object, "hi", 1, 20, kAp); }, {"\"ap.hi\"", "21"});
     ExpectFailureNaming([&] { cli::GetInt(object, "real", 0, 9, kAp); }, {"integer", "1.5"});
     // Beyond the signed 64-bit range, and at its bottom: refused, not wrapped.
     ExpectFailureNaming(
@@ -125,8 +122,6 @@ TEST(JsonFields, ArraysOfFiniteNumbersInEachWording) {
                                 {"m.json", pszName});
         }
     }
-    EXPECT_EQ(MessageOf([&] { cli::GetFiniteArray(object, "short", 3, out, kAp, aFormats[1]); }),
-              "m.json: field \"ap.short\" must hold 3 numbers (nCoeffs), found 2");
     EXPECT_EQ(MessageOf([&] { cli::GetFiniteArray(object, "bad", 3, out, kAp, aFormats[2]); }),
               "m.json: field \"ap.bad[1]\" must be a finite number, found \"x\"");
 }

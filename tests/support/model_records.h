@@ -13,40 +13,19 @@
 namespace lumo {
 namespace support {
 
-struct PolyDeleter {
-    void operator()(POLYInfo_t* p) const { POLYDeallocate(p); }
+// Releases a record with its family's release function.
+template <typename T, void (*Release)(T*)>
+struct Releaser {
+    void operator()(T* p) const { Release(p); }
 };
-using PolyPtr = std::unique_ptr<POLYInfo_t, PolyDeleter>;
 
-struct TpsDeleter {
-    void operator()(TPSMInfo_t* p) const { TPSDeallocate(p); }
-};
-using TpsPtr = std::unique_ptr<TPSMInfo_t, TpsDeleter>;
-
-struct RfDeleter {
-    void operator()(RFInfo_t* p) const { RFDeallocate(p); }
-};
-using RfPtr = std::unique_ptr<RFInfo_t, RfDeleter>;
-
-struct SritDeleter {
-    void operator()(SRITInfo_t* p) const { LumoFreeSRITInfo(p); }
-};
-using SritPtr = std::unique_ptr<SRITInfo_t, SritDeleter>;
-
-struct SegmentDeleter {
-    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
-};
-using SegmentPtr = std::unique_ptr<EphemerisSeg_t, SegmentDeleter>;
-
-struct TrnDeleter {
-    void operator()(TRNInfo_t* p) const { TRNDeallocate(p); }
-};
-using TrnPtr = std::unique_ptr<TRNInfo_t, TrnDeleter>;
-
-struct ApDeleter {
-    void operator()(APInfo_t* p) const { APDeallocate(p); }
-};
-using ApPtr = std::unique_ptr<APInfo_t, ApDeleter>;
+using PolyPtr = std::unique_ptr<POLYInfo_t, Releaser<POLYInfo_t, POLYDeallocate>>;
+using TpsPtr = std::unique_ptr<TPSMInfo_t, Releaser<TPSMInfo_t, TPSDeallocate>>;
+using RfPtr = std::unique_ptr<RFInfo_t, Releaser<RFInfo_t, RFDeallocate>>;
+using SritPtr = std::unique_ptr<SRITInfo_t, Releaser<SRITInfo_t, LumoFreeSRITInfo>>;
+using SegmentPtr = std::unique_ptr<EphemerisSeg_t, Releaser<EphemerisSeg_t, LumoSatEphemerisFree>>;
+using TrnPtr = std::unique_ptr<TRNInfo_t, Releaser<TRNInfo_t, TRNDeallocate>>;
+using ApPtr = std::unique_ptr<APInfo_t, Releaser<APInfo_t, APDeallocate>>;
 
 // A new rational function record of nTerms terms, all coefficients zero.
 inline RfPtr AllocateRf(int nTerms) {
