@@ -297,10 +297,15 @@ TEST(RPCText, LongSatelliteNameIsCutToTheSensorBuffer) {
     EXPECT_STREQ(Parse(rpb)->pszSensor, "A-VERY-LONG-SATE");
 }
 
+class RPCTextTool : public lumo::support::ScratchDirTest {
+  protected:
+    RPCTextTool() : ScratchDirTest("lumo_rpctext_") {}
+};
+
 // The tool converts through every form and the JSON model evaluates like
 // the text it came from.
-TEST(RPCText, ToolConvertsBetweenAllForms) {
-    const std::string dir = ::testing::TempDir();
+TEST_F(RPCTextTool, ConvertsBetweenAllForms) {
+    const std::string dir = mDir.string();
     const std::string rpb = dir + "/h_scene.RPB", json = dir + "/h_scene.json";
     const std::string bin = dir + "/h_scene.bin", txt = dir + "/h_scene_RPC.TXT";
     const auto run = [](std::vector<std::string> args) {
@@ -334,6 +339,42 @@ TEST(RPCText, ToolConvertsBetweenAllForms) {
     EXPECT_NE(failed.second.find("give --to"), std::string::npos);
     const auto poly = run({"rpc", kExamples + "/poly_utm31.json", txt});
     EXPECT_NE(poly.second.find("not a rational function model"), std::string::npos);
+}
+
+// Rational polynomials fitted by the tool to a model are written in the
+// form the output's name asks for, over the heights given; bad requests
+// are named.
+TEST_F(RPCTextTool, FitsAModelAndNamesBadRequests) {
+    const std::string dir = mDir.string();
+    const std::string osModel = kExamples + "/srit_spot5_roll20.json";
+    const lumo::support::RunResult sRun = lumo::support::RunTool(
+        {"rpc", "--fit", osModel, dir + "/scene_RPC.TXT", "--heights", "0", "1000"});
+    ASSERT_EQ(sRun.nCode, 0) << sRun.osErr;
+    EXPECT_NE(sRun.osOut.find("independent check grid: max"), std::string::npos) << sRun.osOut;
+    RecordPtr psRF = Parse(ReadText(dir + "/scene_RPC.TXT"), LUMO_RPC_TEXT_TXT);
+    EXPECT_NEAR(psRF->dfZOffset, 500.0, 1e-9);
+    EXPECT_NEAR(psRF->dfZScale, 500.0, 1e-9);
+    const lumo::support::RunResult sRadar = lumo::support::RunTool(
+        {"rpc", "--fit", kExamples + "/rtcs_scene.json", dir + "/radar.RPB"});
+    ASSERT_EQ(sRadar.nCode, 0) << sRadar.osErr;
+    EXPECT_NE(sRadar.osOut.find("(rtcs), 1000 x 1000 pixels"), std::string::npos) << sRadar.osOut;
+    EXPECT_NEAR(Parse(ReadText(dir + "/radar.RPB"), LUMO_RPC_TEXT_RPB)->dfZOffset, 1000.0, 1e-9);
+
+    const std::string osOut = dir + "/o_RPC.TXT";
+    const std::pair<std::vector<std::string>, std::string> aBad[] = {
+        {{"--fit", kExamples + "/rf_scene_RPC.TXT", osOut}, "rf_scene_RPC.TXT"},
+        {{"--fit", osModel, osOut, "--heights", "900", "100"}, "invalid height range"},
+        {{"--fit", osModel, osOut, "--pixels", "0"}, "image size 0 x 12000"},
+    };
+    for (const auto& [asArgs, osNamed] : aBad) {
+        std::vector<std::string> asRun = {"rpc"};
+        asRun.insert(asRun.end(), asArgs.begin(), asArgs.end());
+        const lumo::support::RunResult sBad = lumo::support::RunTool(asRun);
+        EXPECT_EQ(sBad.nCode, 1) << osNamed;
+        EXPECT_NE(sBad.osErr.find(osNamed), std::string::npos) << sBad.osErr;
+    }
+    EXPECT_NE(lumo::support::RunTool({"rpc", osModel, dir + "/o.RPB", "--heights", "0", "1"}).nCode,
+              0);
 }
 
 }  // namespace
