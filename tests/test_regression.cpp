@@ -13,6 +13,7 @@
 
 #include "regression.h"
 #include "runtime.h"
+#include "support/grid_points.h"
 #include "support/numbered_error.h"
 #include "support/poly_terms.h"
 #include "support/warnings.h"
@@ -27,36 +28,19 @@ int Terms(int order) {
     return (order + 1) * (order + 2) / 2;
 }
 
-struct Gcps {
-    std::vector<double> x1, y1, x2, y2;
-    int n() const { return static_cast<int>(x1.size()); }
-};
+using Gcps = lumo::support::PointPairs;
 
-// Points on a jittered grid over [x0, x0 + w] x [y0, y0 + w], mapped by f.
+// side x side points over [x0, x0 + w] x [y0, y0 + w], mapped by f.
 Gcps MakeGcps(int side, double x0, double y0, double w,
               const std::function<void(double, double, double&, double&)>& f) {
-    Gcps g;
-    std::mt19937 rng(7);
-    std::uniform_real_distribution<double> jitter(-0.3, 0.3);
-    for (int i = 0; i < side; ++i)
-        for (int j = 0; j < side; ++j) {
-            const double x = x0 + w * (i + 0.5 + jitter(rng)) / side;
-            const double y = y0 + w * (j + 0.5 + jitter(rng)) / side;
-            double X = 0.0, Y = 0.0;
-            f(x, y, X, Y);
-            g.x1.push_back(x);
-            g.y1.push_back(y);
-            g.x2.push_back(X);
-            g.y2.push_back(Y);
-        }
-    return g;
+    return lumo::support::JitteredGrid(side * side, x0, y0, w, 7, f);
 }
 
 GEOInfo_t Fit(Gcps& g, int order) {
     GEOInfo_t info;
     std::memset(&info, 0x5a, sizeof info);  // callers hand over uninitialised blocks
     int options[1] = {order};
-    EXPECT_EQ(GCPRegression(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+    EXPECT_EQ(GCPRegression(&info, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), g.Size(),
                             options, nullptr, nullptr),
               0);
     return info;
@@ -160,30 +144,25 @@ TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
     Gcps line;
     for (int i = 0; i < 6; ++i) {
         const double t = 1000.0 * i;
-        line.x1.push_back(500000.0 + 0.6 * t);
-        line.y1.push_back(4000000.0 + 0.8 * t);
-        line.x2.push_back(10.0 + t / 30.0);
-        line.y2.push_back(20.0);
+        line.Add(500000.0 + 0.6 * t, 4000000.0 + 0.8 * t, 10.0 + t / 30.0, 20.0);
     }
     info = Fit(line, 2);
     EXPECT_EQ(info.nFitKind, GCP_FIT_SIMILARITY);
     double rmsX = -1.0, rmsY = -1.0;
-    GCPRootMeanSq(&info, line.x1.data(), line.y1.data(), line.x2.data(), line.y2.data(), line.n(),
+    GCPRootMeanSq(&info, line.x.data(), line.y.data(), line.X.data(), line.Y.data(), line.Size(),
                   &rmsX, &rmsY);
     EXPECT_LT(std::max(rmsX, rmsY), 1e-8);
     // Fewer points than the order needs: 8 points determine order 2, not 3;
     // 4 points determine only the affine map.
-    for (const auto& [side, order, expected] : {std::tuple{3, 3, 2}, std::tuple{2, 2, 1}}) {
-        Gcps g = MakeGcps(side, 0.0, 0.0, 100.0, [](double x, double y, double& X, double& Y) {
-            X = 1.0 + 2.0 * x - y;
-            Y = 3.0 - x + 0.5 * y;
-        });
-        if (side == 3) {  // drop one of the nine points
-            for (auto* v : {&g.x1, &g.y1, &g.x2, &g.y2}) v->pop_back();
-        }
+    for (const auto& [n, order, expected] : {std::tuple{8, 3, 2}, std::tuple{4, 2, 1}}) {
+        Gcps g = lumo::support::JitteredGrid(n, 0.0, 0.0, 100.0, 7,
+                                             [](double x, double y, double& X, double& Y) {
+                                                 X = 1.0 + 2.0 * x - y;
+                                                 Y = 3.0 - x + 0.5 * y;
+                                             });
         int fitted = order;
-        GCPRegression2(&info, "PIXEL", g.x1.data(), g.y1.data(), "METRE", g.x2.data(), g.y2.data(),
-                       g.n(), &fitted, 0, nullptr, nullptr);
+        GCPRegression2(&info, "PIXEL", g.x.data(), g.y.data(), "METRE", g.X.data(), g.Y.data(),
+                       g.Size(), &fitted, 0, nullptr, nullptr);
         EXPECT_EQ(fitted, expected);
         EXPECT_EQ(info.nOrder, expected);
         expectAt(info, 10.0, 20.0, 1.0, 3.0);
@@ -192,10 +171,7 @@ TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
     Gcps circle;
     for (int i = 0; i < 12; ++i) {
         const double a = 2.0 * M_PI * i / 12;
-        circle.x1.push_back(std::cos(a));
-        circle.y1.push_back(std::sin(a));
-        circle.x2.push_back(3.0 * std::cos(a) + 1.0);
-        circle.y2.push_back(std::sin(a) - 2.0);
+        circle.Add(std::cos(a), std::sin(a), 3.0 * std::cos(a) + 1.0, std::sin(a) - 2.0);
     }
     info = Fit(circle, 2);
     EXPECT_EQ(info.nOrder, 1);
@@ -209,12 +185,12 @@ TEST(GCPRegression, ManyPointsLeaveTheWorkArraysAlone) {
         X = 0.5 * x + 1e-5 * x * y;
         Y = -0.25 * y + 2e-5 * x * x;
     });
-    ASSERT_GT(g.n(), 1024);
+    ASSERT_GT(g.Size(), 1024);
     const double canary = -12345.678;
     std::vector<double> work1(1024 + 8, canary), work2(1024 + 8, canary);
     GEOInfo_t info;
     int options[1] = {2};
-    ASSERT_EQ(GCPRegression(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+    ASSERT_EQ(GCPRegression(&info, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), g.Size(),
                             options, work1.data(), work2.data()),
               0);
     for (int i = 1024; i < 1024 + 8; ++i) {
@@ -237,19 +213,19 @@ TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
     int order = 2;
     double outRmsX = 0.0, outRmsY = 0.0;
     GEOInfo_t info;
-    GCPRegression2(&info, "LON", g.x1.data(), g.y1.data(), "PIXEL", g.x2.data(), g.y2.data(), g.n(),
+    GCPRegression2(&info, "LON", g.x.data(), g.y.data(), "PIXEL", g.X.data(), g.Y.data(), g.Size(),
                    &order, 0, &outRmsX, &outRmsY);
     EXPECT_STREQ(info.szFromUnit, "LON");
     EXPECT_STREQ(info.szToUnit, "PIXEL");
     EXPECT_EQ(order, 2);
 
-    Eigen::MatrixXd design(g.n(), 6);
-    Eigen::VectorXd bx(g.n()), by(g.n());
-    for (int i = 0; i < g.n(); ++i) {
-        const double x = g.x1[i], y = g.y1[i];
+    Eigen::MatrixXd design(g.Size(), 6);
+    Eigen::VectorXd bx(g.Size()), by(g.Size());
+    for (int i = 0; i < g.Size(); ++i) {
+        const double x = g.x[i], y = g.y[i];
         design.row(i) << 1.0, x, y, x * y, x * x, y * y;
-        bx[i] = g.x2[i];
-        by[i] = g.y2[i];
+        bx[i] = g.X[i];
+        by[i] = g.Y[i];
     }
     const Eigen::MatrixXd normal = design.transpose() * design;
     const Eigen::VectorXd ax = normal.ldlt().solve(design.transpose() * bx);
@@ -258,10 +234,10 @@ TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
         EXPECT_NEAR(info.adfXCoeffs[k], ax[k], 1e-9 * (1.0 + std::abs(ax[k])));
         EXPECT_NEAR(info.adfYCoeffs[k], ay[k], 1e-9 * (1.0 + std::abs(ay[k])));
     }
-    const double expectX = std::sqrt((design * ax - bx).squaredNorm() / g.n());
-    const double expectY = std::sqrt((design * ay - by).squaredNorm() / g.n());
+    const double expectX = std::sqrt((design * ax - bx).squaredNorm() / g.Size());
+    const double expectY = std::sqrt((design * ay - by).squaredNorm() / g.Size());
     double rmsX = 0.0, rmsY = 0.0;
-    ASSERT_EQ(GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(), &rmsX,
+    ASSERT_EQ(GCPRootMeanSq(&info, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), g.Size(), &rmsX,
                             &rmsY),
               0);
     EXPECT_NEAR(rmsX, expectX, 1e-9);
@@ -269,9 +245,8 @@ TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
     EXPECT_GT(rmsX, 0.1);
     EXPECT_DOUBLE_EQ(outRmsX, rmsX);
     EXPECT_DOUBLE_EQ(outRmsY, rmsY);
-    ASSERT_EQ(
-        GCPRootMeanSq(&info, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), 0, &rmsX, &rmsY),
-        0);
+    ASSERT_EQ(GCPRootMeanSq(&info, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), 0, &rmsX, &rmsY),
+              0);
     EXPECT_EQ(rmsX, 0.0);
     EXPECT_EQ(rmsY, 0.0);
 }
@@ -285,8 +260,7 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
     const GEOInfo_t before = info;
     auto regress = [&](int n, int order, double* x1) {
         int options[1] = {order};
-        GCPRegression(&info, x1, g.y1.data(), g.x2.data(), g.y2.data(), n, options, nullptr,
-                      nullptr);
+        GCPRegression(&info, x1, g.y.data(), g.X.data(), g.Y.data(), n, options, nullptr, nullptr);
     };
     auto expectFatal = [&](const std::function<void()>& f, const std::string& fragment) {
         const auto [code, text] = FatalOf(f);
@@ -296,35 +270,35 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
         // NOLINTNEXTLINE(bugprone-suspicious-memory-comparison)
         EXPECT_EQ(std::memcmp(&info, &before, sizeof info), 0) << fragment;
     };
-    expectFatal([&] { regress(g.n(), 0, g.x1.data()); }, "order 0");
-    expectFatal([&] { regress(g.n(), 6, g.x1.data()); }, "order 6");
-    expectFatal([&] { regress(0, 1, g.x1.data()); }, "points 0");
-    expectFatal([&] { regress(g.n(), 1, nullptr); }, "null");
-    g.x1[2] = std::nan("");
-    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "point 3");
-    g.x1[2] = 1.0;
-    g.y2[1] = INFINITY;
-    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "y2 = inf");
-    g.y2[1] = 0.0;
+    expectFatal([&] { regress(g.Size(), 0, g.x.data()); }, "order 0");
+    expectFatal([&] { regress(g.Size(), 6, g.x.data()); }, "order 6");
+    expectFatal([&] { regress(0, 1, g.x.data()); }, "points 0");
+    expectFatal([&] { regress(g.Size(), 1, nullptr); }, "null");
+    g.x[2] = std::nan("");
+    expectFatal([&] { regress(g.Size(), 1, g.x.data()); }, "point 3");
+    g.x[2] = 1.0;
+    g.Y[1] = INFINITY;
+    expectFatal([&] { regress(g.Size(), 1, g.x.data()); }, "y2 = inf");
+    g.Y[1] = 0.0;
     // Outputs near the largest double over a small input range: the raw
     // coefficients overflow.
     const Gcps saved = g;
-    for (int i = 0; i < g.n(); ++i) {
-        g.x2[i] = g.x1[i] * 1e307;
-        g.x1[i] *= 1e-10;
+    for (int i = 0; i < g.Size(); ++i) {
+        g.X[i] = g.x[i] * 1e307;
+        g.x[i] *= 1e-10;
     }
-    expectFatal([&] { regress(g.n(), 1, g.x1.data()); }, "non-finite coefficients");
+    expectFatal([&] { regress(g.Size(), 1, g.x.data()); }, "non-finite coefficients");
     g = saved;
     expectFatal(
         [&] {
             int order = 7;
-            GCPRegression2(&info, "A", g.x1.data(), g.y1.data(), "B", g.x2.data(), g.y2.data(),
-                           g.n(), &order, 0, nullptr, nullptr);
+            GCPRegression2(&info, "A", g.x.data(), g.y.data(), "B", g.X.data(), g.Y.data(),
+                           g.Size(), &order, 0, nullptr, nullptr);
         },
         "order 7");
     expectFatal(
         [&] {
-            GCPRegression(nullptr, g.x1.data(), g.y1.data(), g.x2.data(), g.y2.data(), g.n(),
+            GCPRegression(nullptr, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), g.Size(),
                           nullptr, nullptr, nullptr);
         },
         "null");
@@ -339,7 +313,7 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
     EXPECT_EQ(X, 0.0);
     EXPECT_EQ(GCPTransform(nullptr, 1.0, 2.0, &X, &Y), -1);
     double rx = 0.0, ry = 0.0;
-    double* x1 = g.x1.data();
+    double* x1 = g.x.data();
     const struct {
         GEOInfo_t* psInfo;
         double* pdfX1;
@@ -351,7 +325,7 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
                 {&info, nullptr, 4, &rx}};
     for (const auto& c : aRms) {
         EXPECT_EQ(FatalOf([&] {
-                      GCPRootMeanSq(c.psInfo, c.pdfX1, g.y1.data(), g.x2.data(), g.y2.data(), c.n,
+                      GCPRootMeanSq(c.psInfo, c.pdfX1, g.y.data(), g.X.data(), g.Y.data(), c.n,
                                     c.pdfRmsX, &ry);
                   }).first,
                   100);
