@@ -160,6 +160,13 @@ TEST(RFTransforms, AntimeridianWrapsLongitudesIntoTheModelsSide) {
         double x = LUMO_NULL_VALUE, y = LUMO_NULL_VALUE, z = 800.0;
         ASSERT_EQ(RFImg2Geo(psRF.get(), p1, l1, &x, &y, &z), 1);
         EXPECT_NEAR(x, 180.95 * dfSide, 1e-9);  // the model's side
+        // The batch forms wrap alike.
+        const double xw = -179.05 * dfSide, yw = 46.95, zw = 800.0;
+        double pb = 0.0, lb = 0.0, xb = 0.0, yb = 0.0;
+        RFGeo2ImgBatch(psRF.get(), 1, &xw, &yw, &zw, &pb, &lb, nullptr);
+        EXPECT_NEAR(pb, p1, 1e-9);
+        RFImg2GeoBatch(psRF.get(), 1, &p1, &l1, &zw, &xb, &yb, nullptr);
+        EXPECT_NEAR(xb, 180.95 * dfSide, 1e-9);
     }
     // A model away from the antimeridian does not wrap.
     psRF->dfXOffset = 7.45;
