@@ -94,9 +94,7 @@ TEST(Poly, CopyIsDeepAndGuardsItsCount) {
     ASSERT_EQ(Geosys2ProjInfo(src->psProjInfo, "UTM 31 U D000", 0.0, 0.0, 1.0, 1.0), 0);
     for (int k = 0; k < 21; ++k) {
         src->padfPixelCoeffs[k] = k + 1.0;
-        src->padfLineCoeffs[k] = -k - 1.0;
         src->padfXCoeffs[k] = 100.0 + k;
-        src->padfYCoeffs[k] = 200.0 + k;
         dst->padfXCoeffs[k] = -9.0;
     }
     ProjInfo_t* psDstProj = dst->psProjInfo;

@@ -291,13 +291,6 @@ TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
     g = saved;
     expectFatal(
         [&] {
-            int order = 7;
-            GCPRegression2(&info, "A", g.x.data(), g.y.data(), "B", g.X.data(), g.Y.data(),
-                           g.Size(), &order, 0, nullptr, nullptr);
-        },
-        "order 7");
-    expectFatal(
-        [&] {
             GCPRegression(nullptr, g.x.data(), g.y.data(), g.X.data(), g.Y.data(), g.Size(),
                           nullptr, nullptr, nullptr);
         },

@@ -290,8 +290,7 @@ TEST(RFBinary, WriterRefusesFieldsItCannotHold) {
     EXPECT_EQ(LumoRFInfoToBinary(psRF.get(), &nLength), nullptr);
     psRF->nExtra2 = 0;
     EXPECT_EQ(LumoRFInfoToBinary(nullptr, &nLength), nullptr);
-    std::vector<unsigned char> block = Write(psRF.get());
-    EXPECT_FALSE(block.empty());
+    EXPECT_FALSE(Write(psRF.get()).empty());
 }
 
 }  // namespace
