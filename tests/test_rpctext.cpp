@@ -203,8 +203,8 @@ TEST(RPCText, WriterRefusesModelsWithoutAnRpcEquivalent) {
 
 // Producers' variants: statements without ';', and the fixed-width record
 // with or without its validity flag and error estimates, line ends anywhere.
-// Each reads into the model its "KEY: value" equivalent gives.
-TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
+// Each reads into the model its values give.
+TEST(RPCText, ProducerVariantsReadTheValuesTheyHold) {
     RecordPtr psSample = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
     std::string rpb = LumoRFInfoToRPCText(psSample.get(), LUMO_RPC_TEXT_RPB);
     rpb = "bandId = \"P\"\n" +
@@ -217,38 +217,32 @@ TEST(RPCText, VariantsReadLikeTheirKeyValueEquivalent) {
     EXPECT_EQ(aoFields[2].osKey, "errBias");
     EXPECT_EQ(aoFields[2].osValue, "2.5");
 
-    // The fixed-width fields: integer pixel offsets, degrees with four
-    // decimals, coefficients with seven digits and a one-digit exponent.
-    const double* pdf = &psSample->dfXOffset;
-    const double adfScalar[] = {4961,   5074,   pdf[2], pdf[0], pdf[4],
-                                pdf[9], pdf[7], pdf[3], pdf[1], pdf[5]};
-    const char* apszFormat[] = {"%06.0f", "%05.0f", "%+08.4f", "%+09.4f", "%+05.0f",
-                                "%06.0f", "%05.0f", "%+08.4f", "%+09.4f", "%+05.0f"};
-    const char* apszKeys[] = {"LINE_OFF",   "SAMP_OFF",    "LAT_OFF",    "LONG_OFF",
-                              "HEIGHT_OFF", "LINE_SCALE",  "SAMP_SCALE", "LAT_SCALE",
-                              "LONG_SCALE", "HEIGHT_SCALE"};
-    std::string fixed, txt;
+    // The fixed-width fields: pixel offsets and scales as integers, degrees
+    // with four decimals, coefficients with seven digits and a one-digit
+    // exponent. The expected model holds each value as written.
+    RecordPtr psExpected = Parse(ReadText(kExamples + "/rf_scene_RPC.TXT"));
+    double* pdf = &psExpected->dfXOffset;  // indices of the ten offsets and scales
+    const std::pair<int, const char*> aScalars[] = {
+        {8, "%06.0f"}, {6, "%05.0f"}, {2, "%+08.4f"}, {0, "%+09.4f"}, {4, "%+05.0f"},
+        {9, "%06.0f"}, {7, "%05.0f"}, {3, "%+08.4f"}, {1, "%+09.4f"}, {5, "%+05.0f"}};
+    std::string fixed;
     char field[32];
-    for (int k = 0; k < 10; ++k) {
-        std::snprintf(field, sizeof field, apszFormat[k], adfScalar[k]);
+    for (const auto& [k, pszFormat] : aScalars) {
+        std::snprintf(field, sizeof field, pszFormat, pdf[k]);
         fixed += field;
-        txt += std::string(apszKeys[k]) + ": " + field + "\n";
+        pdf[k] = std::stod(field);
     }
-    const double* apadfLists[] = {psSample->padfLineNum, psSample->padfLineDen,
-                                  psSample->padfPixelNum, psSample->padfPixelDen};
-    const char* apszLists[] = {"LINE_NUM_COEFF_", "LINE_DEN_COEFF_", "SAMP_NUM_COEFF_",
-                               "SAMP_DEN_COEFF_"};
-    for (int l = 0; l < 4; ++l) {
+    for (double* padf : {psExpected->padfLineNum, psExpected->padfLineDen, psExpected->padfPixelNum,
+                         psExpected->padfPixelDen}) {
         for (int i = 0; i < 20; ++i) {
-            std::snprintf(field, sizeof field, "%+.6E", apadfLists[l][i]);
+            std::snprintf(field, sizeof field, "%+.6E", padf[i]);
             std::string value = field;
             value.erase(value.size() - 2, 1);  // E-05 -> E-5
             ASSERT_EQ(value.size(), 12u) << value;
             fixed += value;
-            txt += apszLists[l] + std::to_string(i + 1) + ": " + value + "\n";
+            padf[i] = std::stod(value);
         }
     }
-    RecordPtr psExpected = Parse(txt);
     // Led by the validity flag, ERR_BIAS and ERR_RAND (seven characters each).
     std::string wrapped =
         "1"
