@@ -104,12 +104,6 @@ TEST(RFImg2Geo, StartingGuessAndHeightRules) {
     EXPECT_EQ(z, 800.0);
     EXPECT_NEAR(x, 7.5, 1e-9);
     EXPECT_NEAR(y, 46.9, 1e-9);
-    // A height of 0 is used as given.
-    RFGeo2Img(psRF.get(), 7.5, 46.9, 0.0, &p, &l);
-    x = y = z = 0.0;
-    ASSERT_EQ(RFImg2Geo(psRF.get(), p, l, &x, &y, &z), 1);
-    EXPECT_EQ(z, 0.0);
-    EXPECT_NEAR(x, 7.5, 1e-9);
     // A caller's good guess converges to the same point.
     x = 7.49;
     y = 46.91;
