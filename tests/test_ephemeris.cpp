@@ -27,17 +27,15 @@ void DropLines(EphemerisSeg_t* psSeg, Line* Sub::*ppLines) {
     psSub->*ppLines = nullptr;
 }
 
-TEST(EphemerisRecord, LayoutOfFixedBlocks) {
-    EXPECT_EQ(sizeof(AvhrrLine_t), 80u);
-    EXPECT_EQ(offsetof(AvhrrLine_t, nTimeMs), 4u);
-    EXPECT_EQ(offsetof(AvhrrLine_t, abyTimeCode), 28u);
-    EXPECT_EQ(offsetof(RadarData_t, nNumLinePositions), 108u);
-    EXPECT_EQ(offsetof(AvhrrData_t, nTimeDirection), 64u);
-    EXPECT_EQ(offsetof(AvhrrData_t, szEpochYearDay), 68u + 2 * 17u);
-    EXPECT_EQ(offsetof(AvhrrData_t, szField26), 68u + 25 * 17u);
-    EXPECT_EQ(sizeof(EphemerisSeg_t{}.szAcquisitionDate), 28u);
-    EXPECT_EQ(sizeof(EphemerisSeg_t{}.adfLevelConvCoefs), 39 * sizeof(double));
-}
+// The fixed blocks' layout, which stored segments and hosts rely on.
+static_assert(offsetof(AvhrrLine_t, nTimeMs) == 4u, "AVHRR line layout");
+static_assert(offsetof(AvhrrLine_t, abyTimeCode) == 28u, "AVHRR line layout");
+static_assert(offsetof(RadarData_t, nNumLinePositions) == 108u, "radar record layout");
+static_assert(offsetof(AvhrrData_t, nTimeDirection) == 64u, "AVHRR record layout");
+static_assert(offsetof(AvhrrData_t, szEpochYearDay) == 68u + 2 * 17u, "AVHRR record layout");
+static_assert(offsetof(AvhrrData_t, szField26) == 68u + 25 * 17u, "AVHRR record layout");
+static_assert(sizeof(EphemerisSeg_t{}.szAcquisitionDate) == 28u, "segment layout");
+static_assert(sizeof(EphemerisSeg_t{}.adfLevelConvCoefs) == 39 * sizeof(double), "segment layout");
 
 // Every kind: the duplicate and the copies into another segment (a new one,
 // and a radar segment whose sub-record is released) equal their source byte
