@@ -164,18 +164,17 @@ struct GridBlock {
         }
         for (std::size_t k = 0; k < sBlock.asScenes.size(); ++k) {
             const auto nSeed = static_cast<std::uint32_t>(k);
-            const std::string osPrefix = std::to_string(k) + "_";
             aasControl.push_back(
                 sBlock.asScenes[k].SamplePoints(4, nControlSeed + nSeed, 0.0, 1200.0, 0.05));
             aasCheck.push_back(
                 sBlock.asScenes[k].SamplePoints(25, 2000 + nSeed, 0.0, 1200.0, 0.05));
-            for (std::size_t i = 0; i < aasControl[k].size(); ++i) {
-                sBlock.AddGcp(static_cast<int>(k), "G" + osPrefix + std::to_string(i),
-                              aasControl[k][i], 'A');
-            }
-            for (std::size_t i = 0; i < aasCheck[k].size(); ++i) {
-                sBlock.AddGcp(static_cast<int>(k), "C" + osPrefix + std::to_string(i),
-                              aasCheck[k][i], 'C');
+            for (const char cUsage : {'A', 'C'}) {
+                const auto& asPoints = cUsage == 'A' ? aasControl[k] : aasCheck[k];
+                const std::string osPrefix = (cUsage == 'A' ? "G" : "C") + std::to_string(k) + "_";
+                for (std::size_t i = 0; i < asPoints.size(); ++i) {
+                    sBlock.AddGcp(static_cast<int>(k), osPrefix + std::to_string(i), asPoints[i],
+                                  cUsage);
+                }
             }
         }
         // Ties with the right and the lower neighbour, spread over the pairs.
