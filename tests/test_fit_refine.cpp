@@ -25,6 +25,13 @@ const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples/";
 using lumo::support::ReadText;
 using lumo::support::RunOk;
 
+// The points a --refine run dropped, as the tool lists them.
+std::string DroppedList(const std::string& out) {
+    std::smatch dropped;
+    EXPECT_TRUE(std::regex_search(out, dropped, std::regex("dropped by --refine.*"))) << out;
+    return dropped.str();
+}
+
 class FitRefine : public lumo::support::ScratchDirTest {
   protected:
     // 30 control points of the scene: an affine image of a 60 km UTM square
@@ -95,14 +102,11 @@ TEST_F(FitRefine, BlundersAreDroppedAndTheRefitEqualsTheCleanFit) {
         WritePoints(bRf);
         const auto refined = Fit(bRf, "all.csv", "refined.json", {"--refine", "3"});
         EXPECT_EQ(refined.osOut.find("residuals before") != std::string::npos, bRf);
-        std::smatch dropped;
-        const std::string out = refined.osOut;
-        ASSERT_TRUE(std::regex_search(out, dropped, std::regex("dropped by --refine.*")));
-        const std::string list = dropped.str();
+        const std::string list = DroppedList(refined.osOut);
         for (const char* id : {"P4 ", "P17 ", "P25 "}) {
-            EXPECT_NE(list.find(id), std::string::npos) << id << " in " << out;
+            EXPECT_NE(list.find(id), std::string::npos) << id << " in " << list;
         }
-        EXPECT_EQ(std::count(list.begin(), list.end(), '('), 3) << out;
+        EXPECT_EQ(std::count(list.begin(), list.end(), '('), 3) << list;
         Fit(bRf, "clean.csv", "clean.json");
         const auto a = nlohmann::json::parse(ReadText(Path("refined.json")));
         const auto b = nlohmann::json::parse(ReadText(Path("clean.json")));
@@ -143,10 +147,7 @@ TEST_F(FitRefine, BlockDropsTheBlunderedObservation) {
     }
     const std::string path = Write("block.json", project.dump());
     const auto run = RunOk({"block", path, "-o", Path("out"), "--refine", "2"});
-    std::smatch dropped;
-    ASSERT_TRUE(std::regex_search(run.osOut, dropped, std::regex("dropped by --refine.*")))
-        << run.osOut;
-    const std::string list = dropped.str();
+    const std::string list = DroppedList(run.osOut);
     EXPECT_NE(list.find("left/G3 "), std::string::npos) << list;
     EXPECT_EQ(std::count(list.begin(), list.end(), '('), 1) << list;
     const auto report = nlohmann::json::parse(ReadText(Path("out/report.json")));

@@ -4,13 +4,13 @@
 
 #include <cmath>
 #include <functional>
-#include <memory>
 #include <stdexcept>
 #include <string>
 #include <vector>
 
 #include "lumo_ephemeris.h"
 #include "lumo_sim.h"
+#include "support/model_records.h"
 
 namespace {
 
@@ -19,10 +19,6 @@ using lumo::sim::Scene;
 using lumo::sim::SceneParams;
 
 constexpr double kDeg = 3.14159265358979323846 / 180.0;
-
-struct SegmentDeleter {
-    void operator()(EphemerisSeg_t* p) const { LumoSatEphemerisFree(p); }
-};
 
 TEST(SimGeodesy, GeodeticRoundTripAndKnownValues) {
     // The equator at Greenwich and the pole have known Earth-fixed positions.
@@ -72,7 +68,7 @@ TEST(SimScene, SegmentMatchesTheGeometry) {
     SceneParams sParams;
     sParams.dfRollDeg = 20.0;
     const Scene sScene(sParams);
-    std::unique_ptr<EphemerisSeg_t, SegmentDeleter> psSeg(sScene.MakeSegment());
+    const lumo::support::SegmentPtr psSeg(sScene.MakeSegment());
     EXPECT_STREQ(psSeg->szGeosys, "UTM 32 T D000");  // 20 degrees east of nadir at 3 E
     EXPECT_DOUBLE_EQ(psSeg->dfViewAngle, 20.0 * kDeg);
     EXPECT_EQ(psSeg->nNumLines, sParams.nLines);
