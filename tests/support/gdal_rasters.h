@@ -4,12 +4,19 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <array>
+#include <cmath>
 #include <functional>
+#include <initializer_list>
 #include <string>
 #include <vector>
 
 #include <gdal.h>
+#include <gdal_alg.h>
 #include <ogr_srs_api.h>
+
+#include "runtime.h"
 
 namespace lumo {
 namespace support {
@@ -26,6 +33,32 @@ struct RasterSpec {
     double dfNoData = 0.0;
     std::string osDriver = "GTiff";
 };
+
+// An image of the given size, bands and type without georeferencing.
+inline RasterSpec PlainImage(int nCols, int nRows, int nBands = 1,
+                             GDALDataType eType = GDT_Float32) {
+    RasterSpec s;
+    s.nCols = nCols;
+    s.nRows = nRows;
+    s.nBands = nBands;
+    s.eType = eType;
+    s.bGeoreferenced = false;
+    s.osSRS.clear();
+    return s;
+}
+
+// A north-up grid of square cells of dfCell whose top left corner is at
+// (dfX0, dfY0) in osSRS.
+inline RasterSpec NorthUpGrid(int nCols, int nRows, const std::string& osSRS, double dfX0,
+                              double dfY0, double dfCell) {
+    RasterSpec s;
+    s.nCols = nCols;
+    s.nRows = nRows;
+    s.osSRS = osSRS;
+    const double adfGT[6] = {dfX0, dfCell, 0.0, dfY0, 0.0, -dfCell};
+    std::copy(adfGT, adfGT + 6, s.adfGeoTransform);
+    return s;
+}
 
 // Writes a raster whose value at (band, col, row) is fnValue(band, col, row).
 inline void WriteRaster(const std::string& osPath, const RasterSpec& sSpec,
@@ -71,6 +104,51 @@ inline std::vector<double> ReadBand(const std::string& osPath, int nBand, int* p
               CE_None);
     GDALClose(hDs);
     return adf;
+}
+
+// A ground point and its image position: X, Y, Z, pixel, line.
+using ImagePoint = std::array<double, 5>;
+
+// Largest distance, in pixels, between the given image positions and those
+// GDAL's own RPC transformer computes from the raster's RPC metadata.
+inline double GdalRpcDisagreement(const std::string& osRaster,
+                                  const std::vector<ImagePoint>& aPoints) {
+    GDALDatasetH hDs = GDALOpen(osRaster.c_str(), GA_ReadOnly);
+    if (hDs == nullptr) return HUGE_VAL;
+    GDALRPCInfoV2 sInfo{};
+    const bool bRead = GDALExtractRPCInfoV2(GDALGetMetadata(hDs, "RPC"), &sInfo);
+    GDALClose(hDs);
+    void* pTransformer = bRead ? GDALCreateRPCTransformerV2(&sInfo, FALSE, 0.0, nullptr) : nullptr;
+    if (pTransformer == nullptr) return HUGE_VAL;
+    double dfWorst = 0.0;
+    for (const ImagePoint& a : aPoints) {
+        double dfX = a[0], dfY = a[1], dfZ = a[2];
+        int bOk = FALSE;
+        // Ground to image is the transformer's inverse direction.
+        GDALRPCTransform(pTransformer, TRUE, 1, &dfX, &dfY, &dfZ, &bOk);
+        dfWorst = bOk ? std::max(dfWorst, std::hypot(dfX - a[3], dfY - a[4])) : HUGE_VAL;
+    }
+    GDALDestroyRPCTransformer(pTransformer);
+    return dfWorst;
+}
+
+// The text of the exception of type E that fn throws; "" when it throws none,
+// so that a test looking for a name in it fails when nothing was refused.
+template <typename E = nova::Exception, typename F>
+std::string ThrownText(F fn) {
+    try {
+        fn();
+    } catch (const E& e) {
+        return e.what();
+    }
+    return std::string();
+}
+
+// Whether `text` contains every one of `parts`.
+inline bool Names(const std::string& text, std::initializer_list<std::string> parts) {
+    for (const std::string& part : parts)
+        if (text.find(part) == std::string::npos) return false;
+    return true;
 }
 
 }  // namespace support
