@@ -18,7 +18,6 @@
 #include "marked_scene.h"
 #include "model_object.h"
 #include "rf_io.h"
-#include "rpc_fit.h"
 #include "runtime.h"
 #include "srit_io.h"
 #include "support/cli_runner.h"
