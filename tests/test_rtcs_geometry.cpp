@@ -104,32 +104,26 @@ struct LineTable {
 
 TEST(RtcsGeometry, LinePositionInterpolationStaysInsideTheTable) {
     LineTable t(4);  // vectors of exactly 4 elements: ASan sees any overread
+    const double dfNaN = std::nan("");
+    // Line coordinate; then whether outside, the first range (-7: left
+    // alone), the first latitude and the last longitude (0: cleared). The
+    // last line and every coordinate up to one past it read element 3 only.
+    const double aCases[][5] = {
+        {1.0, 0, 0.0, 50.0, 40.0}, {1.5, 0, 0.5, 50.5, 40.5}, {0.25, 0, 0.0, 50.0, 40.0},
+        {4.0, 0, 3.0, 53.0, 43.0}, {4.0 + 1e-9, 1, -7, 0, 0}, {4.5, 1, -7, 0, 0},
+        {4.999, 1, -7, 0, 0},      {-0.25, 1, -7, 0, 0},      {dfNaN, 1, -7, 0, 0},
+        {1e300, 1, -7, 0, 0},      {-1e300, 1, -7, 0, 0}};
+    for (const auto& c : aCases) {
+        double rf = -7, rl = -7, lat[3] = {9, 9, 9}, lon[3] = {9, 9, 9};
+        int outside = -1;
+        RTCSGetPositionInfo(&t.s, 4, c[0], &rf, &rl, lat, lon, &outside);
+        EXPECT_EQ(outside, c[1]) << c[0];
+        EXPECT_EQ(rf, c[2]) << c[0];
+        EXPECT_EQ(lat[0], c[3]) << c[0];
+        EXPECT_EQ(lon[2], c[4]) << c[0];
+    }
     double rf = -1, rl = -1, lat[3], lon[3];
     int outside = -1;
-    RTCSGetPositionInfo(&t.s, 4, 1.0, &rf, &rl, lat, lon, &outside);
-    EXPECT_EQ(outside, 0);
-    EXPECT_EQ(rf, 0.0);
-    EXPECT_EQ(lat[1], 60.0);  // padfLatMid, element 0
-    RTCSGetPositionInfo(&t.s, 4, 1.5, &rf, &rl, lat, lon, &outside);
-    EXPECT_DOUBLE_EQ(rf, 0.5);
-    RTCSGetPositionInfo(&t.s, 4, 0.25, &rf, &rl, lat, lon, &outside);
-    EXPECT_EQ(outside, 0);
-    EXPECT_EQ(rf, 0.0);
-    // The last line and every coordinate up to one past it read element 3 only.
-    for (double line : {4.0, 4.0 + 1e-9, 4.5, 4.999}) {
-        rf = rl = -1;
-        RTCSGetPositionInfo(&t.s, 4, line, &rf, &rl, lat, lon, &outside);
-        EXPECT_EQ(outside, line > 4.0 ? 1 : 0) << line;
-        EXPECT_EQ(rf, line > 4.0 ? -1.0 : 3.0) << line;  // outside: ranges left alone
-        EXPECT_EQ(lat[0], line > 4.0 ? 0.0 : 53.0) << line;
-    }
-    for (double line : {-0.25, std::nan(""), 1e300, -1e300}) {
-        rf = -7;
-        RTCSGetPositionInfo(&t.s, 4, line, &rf, &rl, lat, lon, &outside);
-        EXPECT_EQ(outside, 1);
-        EXPECT_EQ(rf, -7.0);
-        EXPECT_EQ(lon[2], 0.0);
-    }
     RTCSGetPositionInfo(&t.s, 0, 0.0, &rf, &rl, lat, lon, &outside);  // empty table
     EXPECT_EQ(outside, 1);
 }
@@ -151,16 +145,13 @@ TEST(RtcsGeometry, SolverMatchesEigenAndRefusesSingularSystems) {
     std::mt19937 rng(7);
     std::uniform_real_distribution<double> u(-1.0, 1.0);
     for (int trial = 0; trial < 200; ++trial) {
-        Eigen::Matrix3d m =
-            Eigen::Matrix3d::NullaryExpr([&](Eigen::Index, Eigen::Index) { return u(rng); });
+        using RowMajor3d = Eigen::Matrix<double, 3, 3, Eigen::RowMajor>;
+        RowMajor3d m = RowMajor3d::NullaryExpr([&](Eigen::Index, Eigen::Index) { return u(rng); });
         if (trial % 10 == 0) m(0, 0) = 0.0;  // needs pivoting
         const Eigen::Vector3d rhs(u(rng), u(rng), u(rng));
-        const double r0[3] = {m(0, 0), m(0, 1), m(0, 2)};
-        const double r1[3] = {m(1, 0), m(1, 1), m(1, 2)};
-        const double r2[3] = {m(2, 0), m(2, 1), m(2, 2)};
         double x[3];
         int status = -5;
-        RTCSSolveEqn(r0, r1, r2, rhs.data(), x, &status);
+        RTCSSolveEqn(m.data(), m.data() + 3, m.data() + 6, rhs.data(), x, &status);
         ASSERT_EQ(status, 0);
         const Eigen::Vector3d ref = m.fullPivLu().solve(rhs);
         const double scale = 1e-12 * (1.0 + ref.norm()) / std::fabs(m.determinant());

@@ -296,15 +296,15 @@ TEST(RtcsModel, NominalControlPointsMoveAlongConstantRange) {
     }
     lat[6] = std::nan("");
     const RadarLine_t first = Lines(CopySegment().get())[0];
-    int count = 1;
-    RTCSAddElevationsToNominalGCPs(1000.0, 1, 1, first.nRangeFirst, first.nRangeLast, 6378137.0,
-                                   6356752.314245179, &count, ids.data(), a.data(), b.data(),
-                                   c.data(), lon.data(), lat.data(), h.data());
-    EXPECT_EQ(count, 0);  // one column makes no row
-    count = 10;
-    RTCSAddElevationsToNominalGCPs(1000.0, 2, 5, first.nRangeFirst, first.nRangeLast, 6378137.0,
-                                   6356752.314245179, &count, ids.data(), a.data(), b.data(),
-                                   c.data(), lon.data(), lat.data(), h.data());
+    // Raises nCount points in nRows rows of nCols to 1000 m; the count kept.
+    auto Raise = [&](int nRows, int nCols, int nCount) {
+        RTCSAddElevationsToNominalGCPs(1000.0, nRows, nCols, first.nRangeFirst, first.nRangeLast,
+                                       6378137.0, 6356752.314245179, &nCount, ids.data(), a.data(),
+                                       b.data(), c.data(), lon.data(), lat.data(), h.data());
+        return nCount;
+    };
+    EXPECT_EQ(Raise(1, 1, 1), 0);  // one column makes no row
+    const int count = Raise(2, 5, 10);
     ASSERT_EQ(count, 9);
     EXPECT_EQ(ids[5], 105);  // untouched before the dropped point
     EXPECT_EQ(ids[6], 7);    // then numbered by place
