@@ -173,11 +173,7 @@ TEST(RPCText, ReaderErrorsNameTheKeyAndLine) {
         {Replace(rpb, "\tlatScale = +0.11;\n", ""), "\"latScale\" is missing"},
         {Replace(rpb, "sampNumCoef = (", "sampNumCoef = ["), "expected a list"},
         // A NUL inside a value is not part of a number.
-        {Replace(text, "+800",
-                 std::string("+8\0"
-                             "0",
-                             4)),
-         "HEIGHT_OFF"},
+        {Replace(text, "+800", std::string("+8\0000", 4)), "HEIGHT_OFF"},
     };
     for (const auto& [osText, pszFragment] : aCases) {
         EXPECT_NE(ParseError(osText).find(pszFragment), std::string::npos) << pszFragment;
@@ -244,11 +240,7 @@ TEST(RPCText, ProducerVariantsReadTheValuesTheyHold) {
         }
     }
     // Led by the validity flag, ERR_BIAS and ERR_RAND (seven characters each).
-    std::string wrapped =
-        "1"
-        "0000.50"
-        "0002.25" +
-        fixed;
+    std::string wrapped = "1" + std::string("0000.50") + "0002.25" + fixed;
     for (std::size_t at = 80; at < wrapped.size(); at += 81) wrapped.insert(at, "\r\n");
     for (const std::string& record : {fixed, wrapped + "\n"}) {
         EXPECT_EQ(LumoDetectRPCTextForm(record.data(), record.size()), LUMO_RPC_TEXT_FIXED);

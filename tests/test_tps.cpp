@@ -8,6 +8,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <random>
 #include <string>
@@ -167,26 +168,24 @@ TEST(TpsFit, FailuresRaiseErrorHundredAndKeepTheSpline) {
     double X0 = 0.0, Y0 = 0.0;
     TPSTransform(&t, 33.0, 44.0, &X0, &Y0);
 
-    Points sameIn;
+    // Error 100 with a message naming the fault: inputs all at one place, a
+    // coordinate that is not a number, a null array, a null spline.
+    Points sameIn, bad = p;
     for (int i = 0; i < 5; ++i) sameIn.Add(1.0, 2.0, i, 2.0 * i);
-    auto e = FatalOf([&] { Fit(t, sameIn); });
-    EXPECT_EQ(e.first, 100);
-    EXPECT_NE(e.second.find("All GCP coordinates are equal. Please check your GCPs."),
-              std::string::npos);
-
-    Points bad = p;
     bad.Y[4] = std::nan("");
-    e = FatalOf([&] { Fit(t, bad); });
-    EXPECT_EQ(e.first, 100);
-    EXPECT_NE(e.second.find("Control point 5"), std::string::npos);
-    EXPECT_NE(e.second.find("nan"), std::string::npos);
-    EXPECT_EQ(
-        FatalOf([&] { TPSCalculate(&t, 4, nullptr, p.y.data(), p.X.data(), p.Y.data()); }).first,
-        100);
-    EXPECT_EQ(FatalOf([&] {
-                  TPSCalculate(nullptr, p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data());
-              }).first,
-              100);
+    const auto calc = [&](TPSInfo_t* ps, Points& q, double* x) {
+        TPSCalculate(ps, q.Size(), x, q.y.data(), q.X.data(), q.Y.data());
+    };
+    const std::pair<std::function<void()>, const char*> aFailures[] = {
+        {[&] { calc(&t, sameIn, sameIn.x.data()); }, "All GCP coordinates are equal."},
+        {[&] { calc(&t, bad, bad.x.data()); }, "Control point 5 has a non-finite coordinate"},
+        {[&] { calc(&t, p, nullptr); }, "a coordinate array"},
+        {[&] { calc(nullptr, p, p.x.data()); }, "the spline is null"}};
+    for (const auto& [fail, pszNamed] : aFailures) {
+        const auto [nCode, osText] = FatalOf(fail);
+        EXPECT_EQ(nCode, 100) << pszNamed;
+        EXPECT_NE(osText.find(pszNamed), std::string::npos) << osText;
+    }
 
     // The spline of the last good fit is intact.
     double X = 0.0, Y = 0.0;
