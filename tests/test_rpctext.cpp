@@ -265,7 +265,6 @@ TEST(RPCText, FieldsSurviveConversionsBetweenForms) {
     EXPECT_NE(rpb.find("PRODUCT = \"ortho ready\";"), std::string::npos);
     std::vector<LumoRPCField> aoBack;
     RecordPtr psBack = Parse(rpb, LUMO_RPC_TEXT_RPB, &aoBack);
-    ExpectSameModel(*psRF, *psBack);
     const std::string txt = LumoRFInfoToRPCText(psBack.get(), LUMO_RPC_TEXT_TXT, aoBack);
     for (const char* line : {"ERR_BIAS: 1.5 meters\n", "ERR_RAND: 0.25 meters\n",
                              "PRODUCT: ortho ready\n", "SpecId: RPC00B\n"}) {
