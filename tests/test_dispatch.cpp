@@ -1,7 +1,6 @@
 // Generic dispatch by model code.
 #include <gtest/gtest.h>
 
-#include <memory>
 
 #include "lumo.h"
 #include "mathmodel_core.h"

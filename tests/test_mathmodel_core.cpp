@@ -38,16 +38,16 @@ class SmoothModel : public lumo::support::PointDrivenModel {
     int ImageToGround(double dfPixel, double dfLine, double dfZ, double& dfX, double& dfY,
                       bool) const override {
         ++mnCalls;
-        if (Fails(dfPixel, dfLine)) return -1;
+        if (dfPixel >= mdfFailFromPixel) return -1;
         Forward(dfPixel, dfLine, dfZ, dfX, dfY);
-        if (ReturnsNaN(dfPixel)) dfX = std::nan("");
+        if (dfPixel >= mdfNaNFromPixel) dfX = std::nan("");
         return 0;
     }
     int GroundToImage(double dfX, double dfY, double dfZ, double& dfPixel, double& dfLine,
                       bool) const override {
         ++mnCalls;
         if (!Inverse(dfX, dfY, dfZ, dfPixel, dfLine)) return -1;
-        return Fails(dfPixel, dfLine) ? -1 : 0;
+        return dfPixel >= mdfFailFromPixel ? -1 : 0;
     }
     IMathModel* Clone() const override { return new SmoothModel(*this); }
 
@@ -88,10 +88,6 @@ class SmoothModel : public lumo::support::PointDrivenModel {
         : PointDrivenModel(o),
           mdfFailFromPixel(o.mdfFailFromPixel),
           mdfNaNFromPixel(o.mdfNaNFromPixel) {}
-
-  private:
-    bool Fails(double dfPixel, double) const { return dfPixel >= mdfFailFromPixel; }
-    bool ReturnsNaN(double dfPixel) const { return dfPixel >= mdfNaNFromPixel; }
 };
 
 class ThrowingModel : public SmoothModel {

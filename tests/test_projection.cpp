@@ -503,16 +503,17 @@ TEST(ProjectionTransform, FailuresAreReportedNotCrashed) {
     EXPECT_EQ(GCTPTransform(&sMetre, 5, 6, &sMetre, &x, &y), 0);
     EXPECT_EQ(y, 6.0);
 
-    // Projections without usable parameters, texts written over the record.
+    // Projections without usable parameters: scale factor 0, an origin beyond
+    // the pole, a polar projection true at the equator, standard parallels
+    // symmetric about the equator, 70 minutes in a packed angle.
     x = y = 7.0;
-    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(Make("TM D000")), &x, &y), 0);  // scale factor 0
-    EXPECT_NE(
-        GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("TM", {{2, 1.0}, {5, 91000000.0}})), &x, &y), 0);
-    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("PS", {{5, 0.0}})), &x, &y), 0);
-    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("LCC", {{2, 30e6}, {3, -30e6}})), &x, &y),
-              0);
-    EXPECT_NE(GCTPTransform(&sGeo, 3, 50, Ptr(WithParms("TM", {{2, 1.0}, {4, 3070000.0}})), &x, &y),
-              0);  // 70 minutes
+    for (const ProjInfo_t& sBad :
+         {Make("TM D000"), WithParms("TM", {{2, 1.0}, {5, 91000000.0}}),
+          WithParms("PS", {{5, 0.0}}), WithParms("LCC", {{2, 30e6}, {3, -30e6}}),
+          WithParms("TM", {{2, 1.0}, {4, 3070000.0}})}) {
+        EXPECT_NE(GCTPTransform(&sGeo, 3, 50, &sBad, &x, &y), 0) << sBad.szProj;
+    }
+    // Texts written over the record.
     ProjInfo_t sGarbage = sUtm;
     std::memset(sGarbage.szProj, 'A', sizeof(sGarbage.szProj));  // not terminated
     EXPECT_NE(GCTPTransform(&sGarbage, 500000, 5e6, &sGeo, &x, &y), 0);

@@ -2,7 +2,6 @@
 // exceptions and 3-D helpers.
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <cstdlib>
 #include <cstring>
 #include <limits>
