@@ -205,8 +205,8 @@ TEST(ProjectionRecord, FillsFieldsFromText) {
 }
 
 TEST(ProjectionEllipsoids, CodesBothWaysAndDatumTable) {
-    // Published axes of three of the GCTP spheroids; every code's axes
-    // name the code again, within 1 mm and not beyond.
+    // Published axes of GCTP spheroids named by code, datum, projection text
+    // or EPSG code; every code's axes name the code again, within 1 mm and not beyond.
     const struct {
         const char* pszCode;
         int nIndex;
@@ -214,7 +214,8 @@ TEST(ProjectionEllipsoids, CodesBothWaysAndDatumTable) {
     } aKnown[] = {{"E000", 0, 6378206.4, 6356583.8},
                   {"E019", 19, 6370997.0, 6370997.0},
                   {"D000", 12, 6378137.0, 6356752.314245},
-                  {"UTM 31 U D001", 0, 6378206.4, 6356583.8}};
+                  {"UTM 31 U D001", 0, 6378206.4, 6356583.8},
+                  {"EPSG:2056", 2, 6377397.155, 6356078.962818}};  // Bessel
     for (const auto& k : aKnown) {
         int nIndex = -5;
         double a = 0, b = 0;
@@ -241,21 +242,22 @@ TEST(ProjectionEllipsoids, CodesBothWaysAndDatumTable) {
     EXPECT_FALSE(GetEllipsoidData(nullptr, &nIndex, &a, &b));
     EXPECT_EQ(nova::detail::ProjInfoToProjDefinition(Make("LONG D007")), "EPSG:4284");
 
-    // Earth-model codes of descriptions, usable behind "LONG %s".
-    char szModel[16];
-    EXPECT_EQ(GetEarthModel(Ptr(Make("UTM 31 U D003")), szModel), 0);
-    EXPECT_STREQ(szModel, "D003");
-    EXPECT_EQ(GetEarthModel(Ptr(Make("METRE")), szModel), 0);
-    EXPECT_STREQ(szModel, "D000");
+    // Earth-model codes of descriptions, usable behind "LONG %s", EPSG
+    // systems' included; axes that match no entry have none.
     ProjInfo_t sCustom = Make("TM");
     sCustom.nEarthModelKind = NOVA_EARTH_SPHEROID_PARMS;
     sCustom.nSpheroid = 5;
-    EXPECT_EQ(GetEarthModel(&sCustom, szModel), 0);
-    EXPECT_STREQ(szModel, "E005");
-    sCustom.adfProjParms[0] = 6400000.0;
-    sCustom.adfProjParms[1] = 6390000.0;
-    EXPECT_EQ(GetEarthModel(&sCustom, szModel), -1);
-    EXPECT_STREQ(szModel, "");
+    ProjInfo_t sNoEntry = sCustom;
+    sNoEntry.adfProjParms[0] = 6400000.0;
+    sNoEntry.adfProjParms[1] = 6390000.0;
+    const std::pair<ProjInfo_t, const char*> aModels[] = {
+        {Make("UTM 31 U D003"), "D003"}, {Make("METRE"), "D000"},     {sCustom, "E005"},
+        {Make("EPSG:27700"), "D005"},    {Make("EPSG:2154"), "E008"}, {sNoEntry, ""}};
+    char szModel[16];
+    for (const auto& [sInfo, pszModel] : aModels) {
+        EXPECT_EQ(GetEarthModel(&sInfo, szModel), *pszModel ? 0 : -1) << pszModel;
+        EXPECT_STREQ(szModel, pszModel);
+    }
     EXPECT_EQ(GetEarthModel(nullptr, szModel), -1);
 }
 
@@ -623,17 +625,6 @@ TEST(ProjectionForeign, FormsMatchTheirNativeEquivalents) {
             EXPECT_EQ(y1, y3);
         }
     }
-    // Earth models and ellipsoids of EPSG systems name our tables' entries.
-    char szModel[16];
-    EXPECT_EQ(GetEarthModel(Ptr(Make("EPSG:27700")), szModel), 0);
-    EXPECT_STREQ(szModel, "D005");
-    EXPECT_EQ(GetEarthModel(Ptr(Make("EPSG:2154")), szModel), 0);
-    EXPECT_STREQ(szModel, "E008");
-    int nSpheroid = -1;
-    double a = 0, b = 0;
-    EXPECT_TRUE(GetEllipsoidData("EPSG:2056", &nSpheroid, &a, &b));
-    EXPECT_EQ(nSpheroid, 2);  // Bessel
-    EXPECT_NEAR(a, 6377397.155, 1e-3);
 }
 
 // Projections without a keyword of ours work by their EPSG code; their
