@@ -3,6 +3,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <array>
 #include <cmath>
 #include <cstring>
 #include <functional>
@@ -62,14 +64,12 @@ PolyPtr MakePoly(const char* pszGeosys = "UTM 31 U D000") {
     poly->nCoeffs = 3;
     poly->nPixels = 6000;
     poly->nLines = 5000;
-    const double pixel[3] = {-44000.0, 0.1, 0.0};
-    const double line[3] = {572000.0, 0.0, -0.1};
-    const double x[3] = {440000.0, 10.0, 0.0};
-    const double y[3] = {5720000.0, 0.0, -10.0};
-    std::memcpy(poly->padfPixelCoeffs, pixel, sizeof pixel);
-    std::memcpy(poly->padfLineCoeffs, line, sizeof line);
-    std::memcpy(poly->padfXCoeffs, x, sizeof x);
-    std::memcpy(poly->padfYCoeffs, y, sizeof y);
+    const std::pair<double*, std::array<double, 3>> aCoeffs[] = {
+        {poly->padfPixelCoeffs, {-44000.0, 0.1, 0.0}},
+        {poly->padfLineCoeffs, {572000.0, 0.0, -0.1}},
+        {poly->padfXCoeffs, {440000.0, 10.0, 0.0}},
+        {poly->padfYCoeffs, {5720000.0, 0.0, -10.0}}};
+    for (const auto& [padf, adf] : aCoeffs) std::copy(adf.begin(), adf.end(), padf);
     std::strncpy(poly->pszGeosys, pszGeosys, POLY_GEOSYS_SIZE - 1);
     Geosys2ProjInfo(poly->psProjInfo, pszGeosys, 0.0, 0.0, 1.0, 1.0);
     return poly;
@@ -104,11 +104,8 @@ std::optional<E> Catch(F f, const std::string& message, int line) {
 // The same for a parameter exception, which also names the parameter.
 void CatchParameter(const std::function<void()>& f, const char* name, const std::string& message,
                     int line) {
-    const std::optional<nova::ParameterException> e =
-        Catch<nova::ParameterException>(f, message, line);
-    if (e) {
-        EXPECT_EQ(e->GetParameterName(), name);
-    }
+    const auto e = Catch<nova::ParameterException>(f, message, line);
+    EXPECT_TRUE(e && e->GetParameterName() == name) << name;
 }
 
 // A model object of any type that records its point calls and fails on

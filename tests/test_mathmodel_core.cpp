@@ -186,44 +186,72 @@ TEST(MathModelCore, ArrayFormEqualsPointCallsAndFlagsFailures) {
               nm::ImageToGround(&oModel, 1.0, 0.0, 0, nullptr, nullptr, nullptr, nullptr, false));
 }
 
-// The block form against exact evaluation: exact with zero tolerance or a
-// unit step, within the tolerance (and with far fewer point calls) otherwise.
-TEST(MathModelCore, BlockFormMatchesExactEvaluation) {
+// The block form against the point form, cell by cell: a cell is valid
+// exactly when its point call succeeds with a finite result on a height that
+// is given; valid cells are exact with zero tolerance or a unit step, within
+// the tolerance (with far fewer point calls) otherwise; failed cells hold the
+// null value.
+TEST(MathModelCore, BlockFormMatchesPointForm) {
     struct Case {
         const char* pszName;
         int nCols, nRows, nStep;
         double dfTol;
         bool bTerrain;
         double dfPixel0, dfLine0, dfPixelStep, dfLineStep;
+        double dfFailFrom = 1e30, dfNaNFrom = 1e30;  // the model's failing pixels
+        bool bHoles = false, bMask = true;
     };
     // 994 columns leave a one-point-wide last grid cell. Plain bilinear
     // interpolation over 32 points errs by ~0.012 on this model: the checks
-    // have to split cells to stay within 0.004.
+    // have to split cells to stay within 0.004. Failures: a half-plane across
+    // grid cells, height holes that fail their point only, and success
+    // reported with a NaN result (without a mask).
     const Case aCases[] = {
         {"step 8, zero tolerance", 37, 29, 8, 0.0, true, 10.0, 20.0, 1.5, 2.5},
         {"unit step", 37, 29, 1, 5.0, true, 10.0, 20.0, 1.5, 2.5},
         {"flat, tolerance", 994, 701, 32, 0.004, false, 0.0, 0.0, 1.0, 1.0},
         {"terrain, tolerance", 994, 701, 32, 0.004, true, 0.0, 0.0, 1.0, 1.0},
+        {"failures, zero tolerance", 600, 90, 64, 0.0, true, 0.0, 0.0, 1.0, 1.0, 403.5, 1e30, true},
+        {"failures, tolerance", 600, 90, 64, 0.05, true, 0.0, 0.0, 1.0, 1.0, 403.5, 1e30, true},
+        {"NaN results", 100, 10, 16, 0.05, false, 0.0, 0.0, 1.0, 1.0, 1e30, 50.0, false, false},
     };
     for (const Case& k : aCases) {
         SCOPED_TRACE(k.pszName);
         SmoothModel oModel;
-        const std::vector<float> afZ = Terrain(k.nCols, k.nRows);
+        oModel.mdfFailFromPixel = k.dfFailFrom;
+        oModel.mdfNaNFromPixel = k.dfNaNFrom;
+        std::vector<float> afZ = Terrain(k.nCols, k.nRows);
+        if (k.bHoles) {
+            afZ[5 * k.nCols + 17] = kNullF;
+            afZ[60 * k.nCols + 200] = std::nanf("");
+        }
         const float* pafZ = k.bTerrain ? afZ.data() : nullptr;
         Block oOut(k.nCols, k.nRows);
-        ASSERT_EQ(0, ImageToGroundBlock(&oModel, oOut, k.nStep, pafZ, k.dfPixel0, k.dfLine0,
-                                        k.dfPixelStep, k.dfLineStep, k.dfTol));
-        if (k.dfTol > 0.0 && k.nStep > 1) {
-            EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(oOut.Size() / 4));
-        }
+        const int nResult = nm::ImageToGround(
+            &oModel, k.nCols, k.nRows, k.nStep, nullptr, nullptr, pafZ, oOut.afOut1.data(),
+            oOut.afOut2.data(), k.bMask ? oOut.abyValid.data() : nullptr, k.dfPixel0, k.dfLine0,
+            k.dfPixelStep, k.dfLineStep, k.dfTol, false);
+        const long nBlockCalls = oModel.mnCalls;
         const bool bExact = k.dfTol == 0.0 || k.nStep == 1;
+        bool bAllValid = true;
         double dfWorst = 0.0;
         oOut.ForEachCell([&](int c, int r, std::size_t i) {
+            const bool bHole = pafZ && !(std::isfinite(pafZ[i]) && pafZ[i] != kNullF);
             double dfX = 0.0;
             double dfY = 0.0;
-            SmoothModel::Forward(k.dfPixel0 + k.dfPixelStep * c, k.dfLine0 + k.dfLineStep * r,
-                                 pafZ ? pafZ[i] : 0.0, dfX, dfY);
-            ASSERT_EQ(1, oOut.abyValid[i]) << c << "," << r;
+            const bool bValid =
+                oModel.ImageToGround(k.dfPixel0 + k.dfPixelStep * c, k.dfLine0 + k.dfLineStep * r,
+                                     pafZ ? pafZ[i] : 0.0, dfX, dfY, false) == 0 &&
+                std::isfinite(dfX) && !bHole;
+            bAllValid = bAllValid && bValid;
+            if (k.bMask) {
+                ASSERT_EQ(bValid ? 1 : 0, oOut.abyValid[i]) << c << "," << r;
+            }
+            if (!bValid) {
+                ASSERT_EQ(kNullF, oOut.afOut1[i]) << c << "," << r;
+                ASSERT_EQ(kNullF, oOut.afOut2[i]) << c << "," << r;
+                return;
+            }
             if (bExact) {
                 ASSERT_EQ(static_cast<float>(dfX), oOut.afOut1[i]) << c << "," << r;
                 ASSERT_EQ(static_cast<float>(dfY), oOut.afOut2[i]) << c << "," << r;
@@ -231,7 +259,11 @@ TEST(MathModelCore, BlockFormMatchesExactEvaluation) {
             dfWorst = std::max({dfWorst, std::fabs(oOut.afOut1[i] - dfX) - FloatUlp(dfX),
                                 std::fabs(oOut.afOut2[i] - dfY) - FloatUlp(dfY)});
         });
+        EXPECT_EQ(nResult, bAllValid ? 0 : -1);
         EXPECT_LE(dfWorst, k.dfTol);
+        if (bAllValid && !bExact) {
+            EXPECT_LT(nBlockCalls, static_cast<long>(oOut.Size() / 4));
+        }
     }
 }
 
@@ -255,38 +287,6 @@ TEST(MathModelCore, BlockRoundTripThroughExplicitInputArrays) {
         ASSERT_NEAR(100.0 + c, oImage.afOut1[i], 0.02) << c << "," << r;
         ASSERT_NEAR(50.0 + r, oImage.afOut2[i], 0.02) << c << "," << r;
     });
-}
-
-TEST(MathModelCore, BlockFormFlagsFailedPointsExactly) {
-    SmoothModel oModel;
-    oModel.mdfFailFromPixel = 403.5;  // half-plane of failure, across grid cells
-    Block oShape(600, 90);
-    std::vector<float> afZ(oShape.Size(), 100.0f);
-    afZ[5 * 600 + 17] = kNullF;  // height holes fail their point only
-    afZ[60 * 600 + 200] = std::nanf("");
-    for (const double dfTol : {0.0, 0.05}) {
-        Block oOut(600, 90);
-        EXPECT_EQ(-1, ImageToGroundBlock(&oModel, oOut, 64, afZ.data(), 0.0, 0.0, 1.0, 1.0, dfTol));
-        oOut.ForEachCell([&](int c, int r, std::size_t i) {
-            const bool bHole = (r == 5 && c == 17) || (r == 60 && c == 200);
-            const bool bValid = c < 403.5 && !bHole;
-            ASSERT_EQ(bValid ? 1 : 0, oOut.abyValid[i]) << c << "," << r << " tol " << dfTol;
-            if (!bValid) {
-                ASSERT_EQ(kNullF, oOut.afOut1[i]);
-                ASSERT_EQ(kNullF, oOut.afOut2[i]);
-            }
-        });
-    }
-
-    // Success reported with a NaN result counts as failure; no mask needed.
-    SmoothModel oNaN;
-    oNaN.mdfNaNFromPixel = 50.0;
-    Block oOut(100, 10);
-    EXPECT_EQ(-1,
-              nm::ImageToGround(&oNaN, 100, 10, 16, nullptr, nullptr, nullptr, oOut.afOut1.data(),
-                                oOut.afOut2.data(), nullptr, 0, 0, 1, 1, 0.05, false));
-    EXPECT_EQ(kNullF, oOut.afOut1[99]);
-    EXPECT_TRUE(std::isfinite(oOut.afOut1[49]) && oOut.afOut1[49] != kNullF);
 }
 
 TEST(MathModelCore, BadArgumentsAreRejectedWithoutWriting) {
