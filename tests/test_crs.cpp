@@ -202,7 +202,7 @@ TEST(CRS, KindsOfSystemsClonesAndRelease) {
     EXPECT_NEAR(Apply(poTransform, {500000.0, 5760000.0, 0.0}).dfZ, 44.0675, 0.5);
 }
 
-TEST(CRS, NullResults) {
+TEST(CRS, FactoriesGiveNoSystemForPlanes) {
     const auto* poFactory = nova::ogc::ProjectionEngine::GetProjInfoFactory(3);
     ASSERT_NE(poFactory, nullptr);
     EXPECT_EQ(nova::ogc::ProjectionEngine::GetProjInfoFactory(1), nullptr);
@@ -217,15 +217,6 @@ TEST(CRS, NullResults) {
     EXPECT_EQ(utils::ProjInfoToCRS(sInfo), nullptr);
     ASSERT_EQ(ProjStringToProjInfo("METRE", &sInfo), 0);
     EXPECT_EQ(utils::ProjInfoToCRS(sInfo), nullptr);
-
-    // A local engineering grid has no relation to the earth.
-    CRSPtr poLocal(utils::CreateCRSFromDefinition(kLocalEngineering));
-    CRSPtr poWgs84 = WGS84Ellipsoidal();
-    EXPECT_FALSE(poLocal->IsGeographic() || poLocal->IsProjected() || poLocal->IsCompound());
-    EXPECT_EQ(utils::CreateCRSTransform(poLocal.get(), poWgs84.get(), 0.0), nullptr);
-    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), poLocal.get(), 0.0), nullptr);
-    EXPECT_EQ(utils::CreateCRSTransform(nullptr, poWgs84.get(), 0.0), nullptr);
-    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), nullptr, 0.0), nullptr);
 }
 
 // Expects a nova::ParameterException naming the parameter and quoting the
@@ -251,8 +242,15 @@ TEST(CRS, BadInputIsReported) {
                              pszText);
     }
 
+    // A local engineering grid has no relation to the earth.
     CRSPtr poUtm = CRSFromGeosys("UTM 31 D000");
     CRSPtr poLocal(utils::CreateCRSFromDefinition(kLocalEngineering));
+    CRSPtr poWgs84 = WGS84Ellipsoidal();
+    EXPECT_FALSE(poLocal->IsGeographic() || poLocal->IsProjected() || poLocal->IsCompound());
+    EXPECT_EQ(utils::CreateCRSTransform(poLocal.get(), poWgs84.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), poLocal.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(nullptr, poWgs84.get(), 0.0), nullptr);
+    EXPECT_EQ(utils::CreateCRSTransform(poWgs84.get(), nullptr, 0.0), nullptr);
     ExpectParameterError([&] { utils::CreateCompoundCS(nullptr, CS_VD_Orthometric); },
                          "poHorizontal", "");
     ExpectParameterError([&] { utils::CreateCompoundCS(poLocal.get(), CS_VD_Orthometric); },
@@ -267,7 +265,6 @@ TEST(CRS, BadInputIsReported) {
                          "dfAccuracy", "-1");
 
     // Points a transformation cannot take: failure, outputs untouched.
-    CRSPtr poWgs84 = WGS84Ellipsoidal();
     MathTransformPtr poGeoid =
         Transform(Compound(CRSFromGeosys("LONG/LAT D000"), CS_VD_Orthometric), poWgs84);
     MathTransformPtr poFromUtm = Transform(Compound(poUtm, CS_VD_Ellipsoidal), poWgs84);
