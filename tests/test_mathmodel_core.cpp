@@ -269,11 +269,16 @@ TEST(MathModelCore, BlockFormMatchesPointForm) {
 
 TEST(MathModelCore, BlockRoundTripThroughExplicitInputArrays) {
     // Image grid -> ground, then the ground positions (irregular, from the
-    // first pass) back to image: the pixel grid comes back.
+    // first pass, and moved off the cells' bilinear surfaces by up to 2 m so
+    // that the first-order correction for the inputs matters) back to image:
+    // the point form's pixels, the pixel grid itself where nothing moved.
     SmoothModel oModel;
     const std::vector<float> afZ = Terrain(300, 260);
     Block oGround(300, 260);
     ASSERT_EQ(0, ImageToGroundBlock(&oModel, oGround, 16, afZ.data(), 100.0, 50.0, 1.0, 1.0, 0.01));
+    oGround.ForEachCell([&](int c, int r, std::size_t i) {
+        oGround.afOut1[i] += static_cast<float>(r < 130 ? 2.0 * std::sin(0.9 * c + 0.4 * r) : 0.0);
+    });
     Block oImage(300, 260);
     oModel.mnCalls = 0;
     ASSERT_EQ(0,
@@ -282,10 +287,15 @@ TEST(MathModelCore, BlockRoundTripThroughExplicitInputArrays) {
                                 oImage.abyValid.data(), 0, 0, 0, 0, 0.01, false));
     EXPECT_LT(oModel.mnCalls.load(), static_cast<long>(oImage.Size() / 4));
     oImage.ForEachCell([&](int c, int r, std::size_t i) {
+        double dfPixel = 100.0 + c, dfLine = 50.0 + r;
+        if (r < 130) {
+            ASSERT_EQ(0, oModel.GroundToImage(oGround.afOut1[i], oGround.afOut2[i], afZ[i], dfPixel,
+                                              dfLine, false));
+        }
         ASSERT_EQ(1, oImage.abyValid[i]);
         // Ground X/Y as floats carry up to ~1e-3 m, i.e. ~5e-4 pixel.
-        ASSERT_NEAR(100.0 + c, oImage.afOut1[i], 0.02) << c << "," << r;
-        ASSERT_NEAR(50.0 + r, oImage.afOut2[i], 0.02) << c << "," << r;
+        ASSERT_NEAR(dfPixel, oImage.afOut1[i], 0.02) << c << "," << r;
+        ASSERT_NEAR(dfLine, oImage.afOut2[i], 0.02) << c << "," << r;
     });
 }
 
