@@ -152,12 +152,12 @@ TEST(Runtime, ExceptionsCarryTheirFieldsAndTheMutexExcludes) {
     EXPECT_EQ(nCounter, 4000);
 }
 
+// The products' plain values are the orbit model's to get right (its tests
+// fail when one is wrong); what only this test sees is an output that is
+// also an input, and the zero vector.
 TEST(Runtime, VectorAndMatrixHelpersAllowAliasing) {
     double a[3] = {1, 2, 3}, b[3] = {-2, 0.5, 4}, c[3], d[3] = {1, 2, 3};
     CrossProduct(a, b, c);
-    EXPECT_DOUBLE_EQ(DotProduct(c, a), 0.0);
-    EXPECT_DOUBLE_EQ(DotProduct(c, b), 0.0);
-    EXPECT_DOUBLE_EQ(c[0], 2 * 4 - 3 * 0.5);
     CrossProduct(d, b, d);  // output aliasing an input
     for (int i = 0; i < 3; ++i) EXPECT_DOUBLE_EQ(d[i], c[i]);
     VecDiff(a, b, c);
@@ -180,10 +180,6 @@ TEST(Runtime, VectorAndMatrixHelpersAllowAliasing) {
     MM3_Mult(self, self, self);
     for (int i = 0; i < 9; ++i)
         EXPECT_DOUBLE_EQ(self[i], i == 0 || i == 4 ? -1.0 : i == 8 ? 1.0 : 0.0);
-
-    const double adfCoeff[3] = {2.0, -3.0, 1.0};  // 2x^2 - 3x + 1
-    EXPECT_DOUBLE_EQ(polyval(adfCoeff, 2, 3.0), 10.0);
-    EXPECT_DOUBLE_EQ(polyval(adfCoeff, 0, 3.0), 2.0);
 }
 
 }  // namespace
