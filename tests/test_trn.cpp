@@ -96,16 +96,15 @@ TEST(TrnPoly, FitsMoreThan1024PointsAndMeasuresResiduals) {
         EXPECT_NEAR(Y, p.Y[i], 1e-6);
         EXPECT_EQ(Z, 0.0);
     }
-    double rx = -1, ry = -1;
-    TRNRMSError(trn.get(), p.Size(), p.x.data(), p.y.data(), p.X.data(), p.Y.data(), &rx, &ry);
-    EXPECT_LT(rx, 1e-6);
-    EXPECT_LT(ry, 1e-6);
-    // Shifted outputs: the residuals are that shift exactly.
+    // Shifted outputs: the residuals are that shift exactly (the 3-D form
+    // goes through the plane one).
     std::vector<double> shifted = p.X;
     for (double& v : shifted) v += 2.0;
+    double rx = -1, ry = -1;
     TRNRMSError3D(trn.get(), p.Size(), p.x.data(), p.y.data(), nullptr, shifted.data(), p.Y.data(),
                   &rx, &ry);
     EXPECT_NEAR(rx, 2.0, 1e-6);
+    EXPECT_NEAR(ry, 0.0, 1e-6);
 
     // A point that is not finite has no image.
     double X = 7, Y = 7;
