@@ -2,9 +2,7 @@
 // counts and null arguments, copy and release.
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <cstring>
-#include <memory>
 #include <random>
 #include <vector>
 

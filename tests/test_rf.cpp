@@ -3,9 +3,7 @@
 // step and unusable records.
 #include <gtest/gtest.h>
 
-#include <array>
 #include <cmath>
-#include <memory>
 
 #include "lumo.h"
 #include "nova/projection.h"

@@ -1,5 +1,6 @@
 // RPC text forms: reading the bundled sample, round trips through both
-// forms, and every error path of the reader and the writer.
+// forms, producers' variants, every error path of the reader and the
+// writer, and the tool's conversion and fit commands.
 #include <gtest/gtest.h>
 
 #include <algorithm>

@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <Eigen/Dense>
-#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
