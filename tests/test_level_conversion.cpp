@@ -37,7 +37,6 @@ class LevelConversion : public ::testing::Test {
         std::strcpy(msSeg.szSensorName, "SPOT4_HRV");
     }
 
-    void SetForm(int nForm) { msSeg.nLevelConvForm = nForm; }
     double& K(int i) { return msSeg.adfLevelConvCoefs[i]; }
     void SetQ(int q0, int q1, int q2, int q3) {
         msSeg.anLevelConvParams[0] = q0;
@@ -69,7 +68,7 @@ class LevelConversion : public ::testing::Test {
     // and whose pixel mapping has non-linear numerator and denominator terms
     // in the normalised line.
     void SetRatioForm() {
-        SetForm(39);
+        msSeg.nLevelConvForm = 39;
         SetQ(3, 5, 7, 11);
         K(0) = 100.0, K(1) = 2.0, K(2) = 50.0, K(3) = 4.0;
         K(4) = 10.0, K(5) = 3.0, K(6) = 20.0, K(7) = 5.0;
@@ -107,7 +106,7 @@ TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
     SetQ(4, 5, 6, 7);
     const EphemerisSeg_t* apsSegs[] = {&msSeg};
     for (int nForm : {0, 1, 19, 21, 38, 40, -20}) {
-        SetForm(nForm);
+        msSeg.nLevelConvForm = nForm;
         for (const Point& s : kPoints) {
             Point sC = s;
             SPOT1BTo1AControlPoint_imp(apsSegs, 0, &sC.p, &sC.l);
@@ -118,7 +117,7 @@ TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
         }
     }
     // A record without a segment, null records and null outputs are left alone.
-    SetForm(20);
+    msSeg.nLevelConvForm = 20;
     SRITInfo_t sEmpty{};
     double dfPixel = 4.0, dfLine = 5.0;
     SPOT1ATo1B_imp(&sEmpty, &dfPixel, &dfLine);
@@ -134,7 +133,7 @@ TEST_F(LevelConversion, OtherFormsLeaveCoordinatesUnchanged) {
 }
 
 TEST_F(LevelConversion, CubicFormExactValuesAndInverse) {
-    SetForm(20);
+    msSeg.nLevelConvForm = 20;
     // Full cubics against a term-by-term evaluation with std::pow.
     for (int i = 0; i < 20; ++i) K(i) = 0.5 + 0.25 * i;
     K(2) = 1e-4, K(3) = -2e-8, K(6) = 3e-5, K(7) = 1e-9, K(18) = -1e-5, K(19) = 4e-9;
@@ -294,7 +293,7 @@ TEST_F(LevelConversion, DegenerateCoefficientsAreFatalErrors) {
     const double dfLineAtM1 = 3.0 + 10.0 - 5 + 1;            // (L - K4) / K5 = 1
     ExpectConversionError(fnTo1B, {10.0, dfLineAtM1}, "line 9 gives");
     // Cubic form overflow.
-    SetForm(20);
+    msSeg.nLevelConvForm = 20;
     for (int i = 0; i < EPH_LEVEL_COEF_COUNT; ++i) K(i) = 1.0;
     ExpectConversionError(fnTo1B, {1e200, 1e200}, "no finite result");
 }

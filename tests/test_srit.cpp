@@ -128,9 +128,6 @@ TEST(SRITCalculate, FailuresLeaveTheRecordAndSegmentToTheCaller) {
     const auto fnFit = [&](const ProjInfo_t& sProj) {
         Calculate(psModel.get(), psSeg.get(), sProj, g);
     };
-    EXPECT_EQ(SRITCalculate(psModel.get(), true, psSeg.get(), 2, &sScene.Projection(), g.p.data(),
-                            g.l.data(), g.z.data(), g.x.data(), g.y.data()),
-              0);
     // A geographic projection is not a conformal ground unit: error 32.
     ProjInfo_t sGeo{};
     ASSERT_EQ(Geosys2ProjInfo(&sGeo, "LONG/LAT D000", 0, 0, 1, 1), 0);
