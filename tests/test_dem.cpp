@@ -117,15 +117,17 @@ TEST(GridDEM, ReproducesPlanesAcrossTilesAndSkipsVoids) {
     }
     // The outer half cell takes the edge nodes' heights.
     EXPECT_NEAR(HeightAtNode(poDem, -0.47, -0.47), PlaneGrid::Height(0, 0), 1e-3);
-    // Beside the void the other three nodes carry the plane.
+    // Beside the void the other three nodes carry the plane, each with its
+    // bilinear weight (a point off the cell's centre tells the weights apart).
     const double dfExpected =
-        (PlaneGrid::Height(301, 200) + PlaneGrid::Height(300, 201) + PlaneGrid::Height(301, 201)) /
-        3.0;
-    EXPECT_NEAR(HeightAtNode(poDem, 300.5, 200.5), dfExpected, 1e-3);
+        (0.0625 * PlaneGrid::Height(301, 200) + 0.5625 * PlaneGrid::Height(300, 201) +
+         0.1875 * PlaneGrid::Height(301, 201)) /
+        0.8125;
+    EXPECT_NEAR(HeightAtNode(poDem, 300.25, 200.75), dfExpected, 1e-3);
     EXPECT_TRUE(std::isnan(HeightAtNode(poDem, 300.0, 200.0)));
     // The array form: the void node, a point outside and the point beside it.
-    std::vector<double> adfX = {509015.0, 400000.0, 509030.0};
-    std::vector<double> adfY = {4994985.0, 5000000.0, 4994970.0}, adfH(3);
+    std::vector<double> adfX = {509015.0, 400000.0, 509022.5};
+    std::vector<double> adfY = {4994985.0, 5000000.0, 4994962.5}, adfH(3);
     EXPECT_EQ(poDem->GetHeights(3, adfX.data(), adfY.data(), adfH.data()), 1);
     EXPECT_EQ(adfH[0], nova::dem::kNoHeight);
     EXPECT_EQ(adfH[1], nova::dem::kNoHeight);
