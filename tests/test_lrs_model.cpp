@@ -204,9 +204,7 @@ TEST(OrbitModel, StateTableFollowsTheDirectComputation) {
             double p1[3], R1[9], p2[3], R2[9];
             GetEcrOrbitState(&pass.oModel, t, p1, R1);
             CalcEcrOrbitState(&pass.oModel, t, p2, R2);
-            dfPos =
-                std::max(dfPos, std::sqrt(std::pow(p1[0] - p2[0], 2) + std::pow(p1[1] - p2[1], 2) +
-                                          std::pow(p1[2] - p2[2], 2)));
+            dfPos = std::max(dfPos, std::hypot(p1[0] - p2[0], p1[1] - p2[1], p1[2] - p2[2]));
             dfRot = std::max(dfRot, RotationAngle(R1, R2));
         }
         EXPECT_LT(dfPos, 2e-3) << dfInc;  // km: linear interpolation over a second

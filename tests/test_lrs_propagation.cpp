@@ -3,6 +3,7 @@
 // input.
 #include <gtest/gtest.h>
 
+#include <Eigen/Dense>
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -16,27 +17,27 @@
 namespace {
 
 constexpr double kDeg = 3.141592653589793 / 180.0;
-using State = std::array<double, 6>;  // km, km/s
+using State = Eigen::Matrix<double, 6, 1>;  // km, km/s
 
 // Acceleration of the zonal field mu/r (1 + sum Cn0 (Re/r)^n Pn(z/r)), n = 2..5,
 // from the gradient of each term.
 State FieldDerivative(const State& y) {
     const double C[6] = {0, 0, LRS_C20, LRS_C30, LRS_C40, LRS_C50};
-    const double r = std::sqrt(y[0] * y[0] + y[1] * y[1] + y[2] * y[2]);
-    const double u[3] = {y[0] / r, y[1] / r, y[2] / r};
+    const double r = y.head<3>().norm();
+    const Eigen::Vector3d u = y.head<3>() / r;
     const double s = u[2];
-    double acc[3] = {-LRS_MU / (r * r) * u[0], -LRS_MU / (r * r) * u[1], -LRS_MU / (r * r) * u[2]};
+    Eigen::Vector3d acc = -LRS_MU / (r * r) * u;
     double p0 = 1.0, p1 = s, d0 = 0.0, d1 = 1.0;  // Legendre P and P' by recurrence
     for (int n = 2; n <= 5; ++n) {
         const double p2 = ((2 * n - 1) * s * p1 - (n - 1) * p0) / n;
         const double d2 = d0 + (2 * n - 1) * p1;
         p0 = p1, p1 = p2, d0 = d1, d1 = d2;
         const double c = LRS_MU * C[n] * std::pow(LRS_EARTH_RADIUS / r, n) / (r * r);
-        for (int k = 0; k < 3; ++k) {
-            acc[k] += c * (-(n + 1) * p1 * u[k] + d1 * ((k == 2 ? 1.0 : 0.0) - s * u[k]));
-        }
+        acc += c * (-(n + 1) * p1 * u + d1 * (Eigen::Vector3d::UnitZ() - s * u));
     }
-    return {y[3], y[4], y[5], acc[0], acc[1], acc[2]};
+    State d;
+    d << y.tail<3>(), acc;
+    return d;
 }
 
 // The classical fourth-order Runge-Kutta rule in steps of at most 10 s: over
@@ -44,44 +45,29 @@ State FieldDerivative(const State& y) {
 State Integrate(State y, double dfSeconds) {
     const int nSteps = static_cast<int>(std::ceil(dfSeconds / 10.0));
     const double h = dfSeconds / nSteps;
-    const auto Step = [](const State& a, const State& d, double f) {
-        State r;
-        for (int k = 0; k < 6; ++k) r[k] = a[k] + f * d[k];
-        return r;
-    };
     for (int i = 0; i < nSteps; ++i) {
-        const State k1 = FieldDerivative(y), k2 = FieldDerivative(Step(y, k1, h / 2)),
-                    k3 = FieldDerivative(Step(y, k2, h / 2)), k4 = FieldDerivative(Step(y, k3, h));
-        for (int k = 0; k < 6; ++k) y[k] += h / 6.0 * (k1[k] + 2.0 * k2[k] + 2.0 * k3[k] + k4[k]);
+        const State k1 = FieldDerivative(y), k2 = FieldDerivative(y + h / 2 * k1),
+                    k3 = FieldDerivative(y + h / 2 * k2), k4 = FieldDerivative(y + h * k3);
+        y += h / 6.0 * (k1 + 2.0 * k2 + 2.0 * k3 + k4);
     }
     return y;
 }
 
 State TheoryState(const double* padfMean, double t) {
-    double mean[6], osc[6], aux[5], pos[3], vel[3];
+    double mean[6], osc[6], aux[5];
     std::copy(padfMean, padfMean + 6, mean);
     Brolyd(t, osc, mean, 2, 1, 1, aux);
-    Celem(osc, pos, vel);
-    return {pos[0], pos[1], pos[2], vel[0], vel[1], vel[2]};
-}
-
-double Distance(const State& a, const State& b) {
-    return std::sqrt(std::pow(a[0] - b[0], 2) + std::pow(a[1] - b[1], 2) +
-                     std::pow(a[2] - b[2], 2));
+    State y;
+    Celem(osc, y.data(), y.data() + 3);
+    return y;
 }
 
 // Eccentricity vector of a state, in the orbit plane from the node.
-std::array<double, 2> EccentricityVector(const State& y) {
-    const double r[3] = {y[0], y[1], y[2]}, v[3] = {y[3], y[4], y[5]};
-    double h[3], vxh[3], e[3], w[3];
-    CrossProduct(r, v, h);
-    CrossProduct(v, h, vxh);
-    for (int k = 0; k < 3; ++k) e[k] = vxh[k] / LRS_MU - r[k] / VecLength(r);
-    double node[3] = {-h[1], h[0], 0.0};
-    VecNormalize(node);
-    VecNormalize(h);
-    CrossProduct(h, node, w);
-    return {DotProduct(e, node), DotProduct(e, w)};
+Eigen::Vector2d EccentricityVector(const State& y) {
+    const Eigen::Vector3d r = y.head<3>(), v = y.tail<3>(), h = r.cross(v);
+    const Eigen::Vector3d e = v.cross(h) / LRS_MU - r.normalized();
+    const Eigen::Vector3d node = Eigen::Vector3d(-h[1], h[0], 0.0).normalized();
+    return {e.dot(node), e.dot(h.normalized().cross(node))};
 }
 
 // Position of the theory against the integration started from the theory's
@@ -102,7 +88,7 @@ TEST(OrbitPropagation, MatchesNumericalIntegrationOfTheZonalField) {
             for (int k = 0; k < 3; ++k) {
                 y = Integrate(y, adfHours[k] * 3600.0 - t);
                 t = adfHours[k] * 3600.0;
-                aadfDiff[k].push_back(Distance(y, TheoryState(mean, t)) * 1000.0);
+                aadfDiff[k].push_back((y - TheoryState(mean, t)).head<3>().norm() * 1000.0);
             }
         }
     }
@@ -135,16 +121,15 @@ TEST(OrbitPropagation, LongPeriodTermsFollowTheIntegration) {
         for (int nDay = 0; nDay <= 40; nDay += 20) {
             if (nDay > 0) y = Integrate(y, 20 * 86400.0);
             State z = y;
-            double ei[2] = {0, 0}, et[2] = {0, 0};
+            Eigen::Vector2d diff = Eigen::Vector2d::Zero();  // integrated - theory, averaged
             constexpr int kSamples = 36;
             for (int k = 0; k < kSamples; ++k) {
-                const auto a = EccentricityVector(z);
-                const auto b =
-                    EccentricityVector(TheoryState(mean, nDay * 86400.0 + k * dfPeriod / kSamples));
-                for (int i = 0; i < 2; ++i) ei[i] += a[i] / kSamples, et[i] += b[i] / kSamples;
+                const double t = nDay * 86400.0 + k * dfPeriod / kSamples;
+                diff +=
+                    (EccentricityVector(z) - EccentricityVector(TheoryState(mean, t))) / kSamples;
                 z = Integrate(z, dfPeriod / kSamples);
             }
-            dfWorst = std::max(dfWorst, std::hypot(ei[0] - et[0], ei[1] - et[1]));
+            dfWorst = std::max(dfWorst, diff.norm());
         }
         const bool bCritical =
             std::fabs(std::cos(dfInc * kDeg) * std::cos(dfInc * kDeg) - 0.2) < 1e-6;

@@ -31,6 +31,8 @@ struct RasterSpec {
     int nBands = 1;
     bool bHasNoData = false;
     double dfNoData = 0.0;
+    double dfScale = 1.0;  // stored scale and offset of every band
+    double dfOffset = 0.0;
     std::string osDriver = "GTiff";
 };
 
@@ -80,6 +82,8 @@ inline void WriteRaster(const std::string& osPath, const RasterSpec& sSpec,
     for (int b = 1; b <= sSpec.nBands; ++b) {
         GDALRasterBandH hBand = GDALGetRasterBand(hDs, b);
         if (sSpec.bHasNoData) GDALSetRasterNoDataValue(hBand, sSpec.dfNoData);
+        if (sSpec.dfScale != 1.0) GDALSetRasterScale(hBand, sSpec.dfScale);
+        if (sSpec.dfOffset != 0.0) GDALSetRasterOffset(hBand, sSpec.dfOffset);
         for (int r = 0; r < sSpec.nRows; ++r) {
             for (int c = 0; c < sSpec.nCols; ++c) adfRow[c] = fnValue(b, c, r);
             ASSERT_EQ(GDALRasterIO(hBand, GF_Write, 0, r, sSpec.nCols, 1, adfRow.data(),
