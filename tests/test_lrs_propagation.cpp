@@ -185,7 +185,9 @@ TEST(OrbitPropagation, RefusesElementsOutsideTheTheory) {
     }
     double mean[6];
     std::copy(good, good + 6, mean);
-    EXPECT_THROW(Brolyd(0.0, osc, mean, 2, 2, 1, aux), nova::NumberedError);
+    EXPECT_THROW(Brolyd(0.0, osc, mean, 3, 1, 1, aux), nova::NumberedError);  // mode
+    EXPECT_THROW(Brolyd(0.0, osc, mean, 2, 2, 1, aux), nova::NumberedError);  // initialisation
+    EXPECT_THROW(Brolyd(0.0, osc, mean, 2, 1, 2, aux), nova::NumberedError);  // advance
     EXPECT_THROW(Brolyd(INFINITY, osc, mean, 2, 1, 1, aux), nova::NumberedError);
     double parabola[6] = {-7000.0, 0.5, 0.0, 0.0, 0.0, 0.0}, pos[3], vel[3];
     EXPECT_THROW(Celem(parabola, pos, vel), nova::NumberedError);
