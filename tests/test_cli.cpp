@@ -5,7 +5,6 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
-#include <functional>
 #include <limits>
 #include <sstream>
 #include <string>
@@ -18,6 +17,7 @@
 #include "nova/runtime.h"
 #include "points_io.h"
 #include "support/cli_runner.h"
+#include "support/numbered_error.h"
 
 using lumo::cli::PointKind;
 using nlohmann::json;
@@ -28,23 +28,13 @@ const std::string kExamples = std::string(LUMO_SOURCE_DIR) + "/examples";
 const std::string kModel = kExamples + "/poly_utm31.json";
 const std::string kGcps = kExamples + "/poly_utm31_gcps.csv";
 
+using lumo::support::DataErrorOf;
 using lumo::support::ReadText;
 using lumo::support::RunOk;
 using lumo::support::RunResult;
 using lumo::support::RunTool;
 
 using CliTest = lumo::support::ScratchDirTest;
-
-// The message of the nova::DataException that `action` throws.
-std::string FailureOf(const std::function<void()>& action) {
-    try {
-        action();
-    } catch (const nova::DataException& e) {
-        return e.what();
-    }
-    ADD_FAILURE() << "no exception thrown";
-    return "";
-}
 
 lumo::cli::PointSet ParsePoints(const std::string& text, PointKind kind) {
     std::istringstream in(text);
@@ -88,7 +78,8 @@ TEST_F(CliTest, PolyModelFileRoundTripIsBitExact) {
 
     // A coefficient that JSON cannot hold is refused rather than written as null.
     poly->padfXCoeffs[4] = std::numeric_limits<double>::quiet_NaN();
-    EXPECT_NE(FailureOf([&] { lumo::cli::PolyToJson(*poly); }).find("xCoeffs"), std::string::npos);
+    EXPECT_NE(DataErrorOf([&] { lumo::cli::PolyToJson(*poly); }).find("xCoeffs"),
+              std::string::npos);
 }
 
 TEST_F(CliTest, PointFilesParse) {
@@ -154,7 +145,7 @@ TEST_F(CliTest, PointFileErrorsNamePlace) {
         {"id,x,y\nA,1\n", PointKind::Ground, "expected 3 fields as in the header, found 2"},
     };
     for (const auto& c : cases) {
-        const std::string message = FailureOf([&] { ParsePoints(c.text, c.kind); });
+        const std::string message = DataErrorOf([&] { ParsePoints(c.text, c.kind); });
         EXPECT_NE(message.find(c.expected), std::string::npos) << c.text << " -> " << message;
     }
 }

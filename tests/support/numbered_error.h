@@ -1,4 +1,5 @@
-// The numbered error a call raises, for the tests of failure paths.
+// The numbered error or the data exception a call raises, for the tests of
+// failure paths.
 #pragma once
 
 #include <string>
@@ -19,6 +20,18 @@ std::pair<int, std::string> FatalOf(F fn) {
         return {e.GetCode(), e.what()};
     }
     return {0, std::string()};
+}
+
+// Runs fn and returns the message of the nova::DataException it throws; ""
+// when it throws none.
+template <typename F>
+std::string DataErrorOf(F fn) {
+    try {
+        fn();
+    } catch (const nova::DataException& e) {
+        return e.what();
+    }
+    return std::string();
 }
 
 }  // namespace support
