@@ -92,6 +92,10 @@ TEST_F(CliChecks, EveryRefusalHasItsStatusAndKeepsOutput) {
     const std::string sdZ = Project("p4.json", [](json& p) { p["gcps"][0]["sdZ"] = 0; });
     const std::string badJson = Write("b.json", "{\"format\": \"lumo-model\",");
     const std::string adj = Path("adj_RPC.TXT");
+    const std::string srit = kExamples + "srit_spot5_roll20.json";
+    const std::string tie = Project("p5.json", [](json& p) { p["ties"][3]["image"] = "middle"; });
+    const std::string seg =
+        Write("seg.json", R"({"format":"lumo-segment","version":1,"dfIFOV":[1]})");
 
     const struct {
         int nCode;
@@ -141,6 +145,21 @@ TEST_F(CliChecks, EveryRefusalHasItsStatusAndKeepsOutput) {
         {1, "but gcps[0] gives", {"block", noZ1, "-o", out}},
         {1, "gcps[0].x 1e+308 is not a physical", {"block", far, "-o", out}},
         {1, "gcps[0].sdZ must be positive", {"block", sdZ, "-o", out}},
+        {1, "ties[3] names image \"middle\"", {"block", tie, "-o", out}},
+        {1, "--model srit needs --segment", {"fit", "--model", "srit", "--gcps", kGcps, "-o", out}},
+        {2,
+         "--closed-form applies to --to-image only",
+         {"transform", srit, "--to-ground", kGcps, "--closed-form"}},
+        {1,
+         "--closed-form needs a rigorous (srit)",
+         {"transform", poly, "--to-image", kGcps, "--closed-form"}},
+        {1, "\"dfIFOV\"", {"segment", seg}},
+        {1, "rf_scene_RPC.TXT", {"rpc", "--fit", rpc, out}},
+        {1, "invalid height range", {"rpc", "--fit", srit, out, "--heights", "900", "100"}},
+        {1, "image size 0 x 12000", {"rpc", "--fit", srit, out, "--pixels", "0"}},
+        {2, "--heights applies to --fit only", {"rpc", srit, out, "--heights", "0", "1"}},
+        {1, "give --to", {"rpc", rpc, Path("x.unknown")}},
+        {1, "not a rational function model", {"rpc", poly, Path("x_RPC.TXT")}},
         {1, "geographic", {"gcps", "convert", "--geosys", "EPSG:5773", "--height-ref", "E", kGcps}},
         {1, "-10000000:", {"simulate", "--segment", out, "--gcps", out, "--min-height", "-1e7"}},
     };

@@ -16,11 +16,13 @@
 #include "runtime.h"
 #include "segment_io.h"
 #include "support/cli_runner.h"
+#include "support/numbered_error.h"
 #include "support/segments.h"
 
 namespace {
 
 using lumo::cli::SegmentPtr;
+using lumo::support::DataErrorOf;
 using lumo::support::ExpectSameSegment;
 using lumo::support::RandomSegment;
 using lumo::support::Zeroed;
@@ -60,18 +62,13 @@ TEST(SegmentFile, SpecialValuesAndTexts) {
     EXPECT_TRUE(std::isnan(poBack->dfPixelRes));
     EXPECT_STREQ(poBack->szHeaderText1, "Caf\xE9 \xFF");
 
-    // A minimal document gives a zero-filled segment.
-    const SegmentPtr poEmpty = lumo::cli::SegmentFromJson(
-        Json::parse(R"({"format": "lumo-segment", "version": 1})"), "memory");
-    EXPECT_EQ(poEmpty->nOrbitType, 0);
-    EXPECT_EQ(poEmpty->ppOrbitData, nullptr);
-    EXPECT_EQ(poEmpty->szSensorName[0], '\0');
-
-    // A kind without sub-record, and a sub-record without lines.
+    // A document with nothing but a kind gives a zero-filled segment of that
+    // kind without sub-record; a sub-record may come without lines.
     const SegmentPtr poKindOnly = lumo::cli::SegmentFromJson(
         Json::parse(R"({"format": "lumo-segment", "version": 1, "nOrbitType": 5})"), "memory");
     EXPECT_EQ(poKindOnly->nOrbitType, 5);
     EXPECT_EQ(poKindOnly->ppOrbitData, nullptr);
+    EXPECT_EQ(poKindOnly->szSensorName[0], '\0');
     const SegmentPtr poNoLines = lumo::cli::SegmentFromJson(
         Json::parse(R"({"format": "lumo-segment", "version": 1, "nOrbitType": 3,
                         "orbitData": {"szSemiMajorAxis": "72290000"}})"),
@@ -98,27 +95,18 @@ TEST(SegmentFile, WriterFaults) {
     EXPECT_EQ(document["orbitData"]["nNumLinePositions"], 0);
 
     std::memset(poSeg->szSensorName, 'A', sizeof(poSeg->szSensorName));
-    try {
-        lumo::cli::SegmentToJson(*poSeg);
-        FAIL() << "an unterminated text was written";
-    } catch (const nova::DataException& e) {
-        EXPECT_NE(std::string(e.what()).find("\"szSensorName\""), std::string::npos) << e.what();
-    }
+    EXPECT_NE(DataErrorOf([&] { lumo::cli::SegmentToJson(*poSeg); }).find("\"szSensorName\""),
+              std::string::npos);
 }
 
 // Every reader error names the field (with its position in arrays): the
 // header's, then those of fields after a valid header.
 TEST(SegmentFile, ReaderErrorsNameTheField) {
     const auto fnExpectRefused = [](const std::string& osJson, const std::string& osField) {
-        try {
-            lumo::cli::SegmentFromJson(Json::parse("{" + osJson + "}"), "case.json");
-            ADD_FAILURE() << "accepted: " << osJson;
-        } catch (const nova::DataException& e) {
-            const std::string osMessage = e.what();
-            EXPECT_EQ(osMessage.rfind("case.json: ", 0), 0u) << osMessage;
-            EXPECT_NE(osMessage.find(osField), std::string::npos)
-                << "expected field " << osField << " in: " << osMessage;
-        }
+        const std::string osMessage = DataErrorOf(
+            [&] { lumo::cli::SegmentFromJson(Json::parse("{" + osJson + "}"), "case.json"); });
+        EXPECT_EQ(osMessage.rfind("case.json: ", 0), 0u) << osJson << ": " << osMessage;
+        EXPECT_NE(osMessage.find(osField), std::string::npos) << osField << " in: " << osMessage;
     };
     fnExpectRefused(R"("version": 1)", "format");
     fnExpectRefused(R"("format": "lumo-segment")", "version");
@@ -153,32 +141,22 @@ TEST(SegmentFile, ReaderErrorsNameTheField) {
     EXPECT_THROW(lumo::cli::SegmentFromJson(Json::array(), "case.json"), nova::DataException);
 }
 
-TEST(SegmentCommand, ExamplesAndErrors) {
-    using lumo::support::RunTool;
+TEST(SegmentCommand, DescribesCopiesAndPrintsTheExamples) {
+    using lumo::support::RunOk;
     const std::string osExamples = std::string(LUMO_SOURCE_DIR) + "/examples/";
-    auto r = RunTool({"segment", osExamples + "segment_optical_attitude.json"});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    auto r = RunOk({"segment", osExamples + "segment_optical_attitude.json"});
     EXPECT_NE(r.osOut.find("sensor code 55, model class 1"), std::string::npos) << r.osOut;
     EXPECT_NE(r.osOut.find("kind 1 (attitude), 24 lines"), std::string::npos) << r.osOut;
 
     const std::string osCopy = TempPath("radar_copy.json");
-    r = RunTool({"segment", osExamples + "segment_radar_lines.json", "-o", osCopy});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"segment", osExamples + "segment_radar_lines.json", "-o", osCopy});
     EXPECT_NE(r.osOut.find("sensor code 26, model class 3"), std::string::npos) << r.osOut;
     ExpectSameSegment(*lumo::cli::ReadSegmentFile(osExamples + "segment_radar_lines.json"),
                       *lumo::cli::ReadSegmentFile(osCopy));
     std::remove(osCopy.c_str());
 
-    r = RunTool({"segment", osExamples + "segment_radar_lines.json", "--json"});
-    ASSERT_EQ(r.nCode, 0);
+    r = RunOk({"segment", osExamples + "segment_radar_lines.json", "--json"});
     EXPECT_EQ(Json::parse(r.osOut)["orbitData"]["nNumLinePositions"], 12);
-
-    const std::string osBad = TempPath("bad.json");
-    std::ofstream(osBad) << R"({"format": "lumo-segment", "version": 1, "dfIFOV": [1]})";
-    r = RunTool({"segment", osBad});
-    EXPECT_EQ(r.nCode, 1);
-    EXPECT_NE(r.osErr.find("\"dfIFOV\""), std::string::npos) << r.osErr;
-    std::remove(osBad.c_str());
 }
 
 }  // namespace

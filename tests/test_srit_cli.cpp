@@ -17,8 +17,8 @@
 
 namespace {
 
+using lumo::support::RunOk;
 using lumo::support::RunResult;
-using lumo::support::RunTool;
 
 class SritCliTest : public lumo::support::ScratchDirTest {
   protected:
@@ -28,15 +28,12 @@ class SritCliTest : public lumo::support::ScratchDirTest {
 TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     const std::string seg = Path("seg.json"), gcps = Path("gcps.csv"), checks = Path("chk.csv");
     const std::string model = Path("model.json");
-    RunResult r = RunTool({"simulate", "--segment", seg, "--gcps", gcps, "--checks", checks,
-                           "--roll", "20", "--seed", "3", "--check-count", "50"});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    RunResult r = RunOk({"simulate", "--segment", seg, "--gcps", gcps, "--checks", checks, "--roll",
+                         "20", "--seed", "3", "--check-count", "50"});
     EXPECT_NE(r.osOut.find("10 control points"), std::string::npos) << r.osOut;
-    r = RunTool({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model});
     EXPECT_NE(r.osOut.find("sensor SPOT5_PAN_5 (code 55, class 1)"), std::string::npos) << r.osOut;
-    r = RunTool({"residuals", model, "--gcps", checks});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"residuals", model, "--gcps", checks});
     double dfPixel = 9, dfLine = 9;
     const std::size_t nAt = r.osOut.find("# rms dpixel ");
     ASSERT_NE(nAt, std::string::npos) << r.osOut;
@@ -44,8 +41,7 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     EXPECT_LT(dfPixel, 0.5);
     EXPECT_LT(dfLine, 0.5);
     // The exact inverse (the default) writes image points that read back.
-    r = RunTool({"transform", model, "--to-image", checks, "-o", Path("exact.csv")});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"transform", model, "--to-image", checks, "-o", Path("exact.csv")});
     using lumo::cli::PointKind;
     EXPECT_EQ(lumo::cli::ReadPointsFile(Path("exact.csv"), PointKind::ControlPoint).asPoints.size(),
               lumo::cli::ReadPointsFile(checks, PointKind::ControlPoint).asPoints.size());
@@ -66,45 +62,23 @@ TEST_F(SritCliTest, SimulateFitResidualsAndExactTransform) {
     };
     EXPECT_EQ(written["srit"]["elevationScale"], "curved");
     EXPECT_EQ(psModel->anAux[SRIT_AUX_FORM], SRIT_FORM_CURVED_INCIDENCE);
-    r = RunTool({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model,
-                 "--elevation-scale", "classic"});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"fit", "--model", "srit", "--segment", seg, "--gcps", gcps, "-o", model,
+               "--elevation-scale", "classic"});
     EXPECT_EQ(fnForm(model), SRIT_FORM_CLASSIC);
     nlohmann::json old = written;
     old["srit"].erase("elevationScale");
     EXPECT_EQ(fnForm(Write("old.json", old.dump())), SRIT_FORM_CLASSIC);
-
-    // Errors: each names what is wrong.
-    r = RunTool({"fit", "--model", "srit", "--gcps", gcps, "-o", Path("x.json")});
-    EXPECT_NE(r.nCode, 0);
-    EXPECT_NE(r.osErr.find("--segment"), std::string::npos) << r.osErr;
-    r = RunTool({"transform", model, "--to-ground", gcps, "--closed-form"});
-    EXPECT_EQ(r.nCode, 2);
-    r = RunTool({"transform", std::string(LUMO_SOURCE_DIR) + "/examples/poly_utm31.json",
-                 "--to-image", checks, "--closed-form"});
-    EXPECT_NE(r.nCode, 0);
-    EXPECT_NE(r.osErr.find("srit"), std::string::npos) << r.osErr;
-    r = RunTool({"simulate", "--segment", seg, "--gcps", gcps, "--lat", "89"});
-    EXPECT_NE(r.nCode, 0);
-    EXPECT_NE(r.osErr.find("nadir latitude"), std::string::npos) << r.osErr;
-    // A model whose coefficient 0 (2N) is zero would divide by it.
-    nlohmann::json broken = written;
-    broken["srit"]["coefficients"][0] = 0.0;
-    r = RunTool({"residuals", Write("broken.json", broken.dump()), "--gcps", checks});
-    EXPECT_NE(r.nCode, 0);
-    EXPECT_NE(r.osErr.find("adfCoef[0] = 0"), std::string::npos) << r.osErr;
 }
 
 // `lumo block` on the bundled stereo project: without options only images
 // whose control points cannot separate the elevation terms are constrained,
 // and the report says why; --constrain sets every segment's constraint flag
 // (the report and the written models say so) and the pair still checks
-// well; a project error names the bad value.
+// well.
 TEST_F(SritCliTest, BlockOnTheBundledStereoProject) {
     const std::string examples = std::string(LUMO_SOURCE_DIR) + "/examples/";
     const std::string project = examples + "block_stereo.json";
-    RunResult r = RunTool({"block", project, "-o", mDir.string()});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    RunResult r = RunOk({"block", project, "-o", mDir.string()});
     nlohmann::json report = nlohmann::json::parse(lumo::support::ReadText(Path("report.json")));
     ASSERT_EQ(report["images"].size(), 2u);
     EXPECT_EQ(report["tiePoints"].size(), 12u);
@@ -118,8 +92,7 @@ TEST_F(SritCliTest, BlockOnTheBundledStereoProject) {
             EXPECT_EQ(image["constrainedBy"], "weak control points");
         }
     }
-    r = RunTool({"block", project, "-o", mDir.string(), "--constrain"});
-    ASSERT_EQ(r.nCode, 0) << r.osErr;
+    r = RunOk({"block", project, "-o", mDir.string(), "--constrain"});
     report = nlohmann::json::parse(lumo::support::ReadText(Path("report.json")));
     for (const auto& image : report["images"]) {
         EXPECT_TRUE(image["constrained"].get<bool>());
@@ -131,15 +104,6 @@ TEST_F(SritCliTest, BlockOnTheBundledStereoProject) {
         const auto* psModel = static_cast<const SRITInfo_t*>(model.poRecord.get());
         EXPECT_EQ(psModel->psEphemeris->nSupplementFlag, 1);
     }
-    // A tie naming an image the project does not list.
-    nlohmann::json doc = nlohmann::json::parse(lumo::support::ReadText(project));
-    doc["ties"][3]["image"] = "middle";
-    for (auto& image : doc["images"]) {
-        image["segment"] = examples + image["segment"].get<std::string>();
-    }
-    r = RunTool({"block", Write("bad.json", doc.dump()), "-o", mDir.string()});
-    EXPECT_NE(r.nCode, 0);
-    EXPECT_NE(r.osErr.find("ties[3] names image \"middle\""), std::string::npos) << r.osErr;
 }
 
 TEST(SritDemo, SampleModelMeetsItsCheckPoints) {
