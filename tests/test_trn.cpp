@@ -10,6 +10,7 @@
 #include "lumo.h"
 #include "regression.h"
 #include "runtime.h"
+#include "support/grid_points.h"
 #include "support/model_records.h"
 #include "support/numbered_error.h"
 #include "support/warnings.h"
@@ -19,10 +20,7 @@ namespace {
 using lumo::support::TrnPtr;
 using WarningRecorder = lumo::support::WarningCapture;
 
-struct Points {
-    std::vector<double> x, y, X, Y;
-    int Size() const { return static_cast<int>(x.size()); }
-};
+using Points = lumo::support::PointPairs;
 
 // A quadratic map over n random points of a 10 km square.
 Points Quadratic(int n, unsigned seed) {
@@ -32,10 +30,8 @@ Points Quadratic(int n, unsigned seed) {
     for (int i = 0; i < n; ++i) {
         const double x = 400000.0 + d(rng), y = 5000000.0 + d(rng);
         const double u = (x - 400000.0) / 1000.0, v = (y - 5000000.0) / 1000.0;
-        p.x.push_back(x);
-        p.y.push_back(y);
-        p.X.push_back(100.0 + 250.0 * u - 10.0 * v + 0.8 * u * v + 0.3 * u * u);
-        p.Y.push_back(-50.0 + 5.0 * u + 240.0 * v - 0.5 * v * v);
+        p.Add(x, y, 100.0 + 250.0 * u - 10.0 * v + 0.8 * u * v + 0.3 * u * u,
+              -50.0 + 5.0 * u + 240.0 * v - 0.5 * v * v);
     }
     return p;
 }
