@@ -12,7 +12,6 @@
 #include "crs.h"
 #include "projection.h"
 #include "runtime.h"
-#include "support/proj_without_geoid.h"
 
 namespace {
 
@@ -283,18 +282,6 @@ TEST(CRS, BadInputIsReported) {
             << s.dfX << " " << s.dfY << " " << s.dfZ;
         EXPECT_TRUE(sOut.dfX == -7.0 && sOut.dfY == -8.0 && sOut.dfZ == -9.0);
     }
-}
-
-// With the geoid model absent, a transformation between geoid and
-// ellipsoidal heights is refused instead of copying heights unchanged.
-TEST(CRS, MissingGeoidModelGivesNoTransform) {
-    const bool bRan = lumo::support::RunWithoutGeoid("crs", [] {
-        CRSPtr poLonLat(utils::CreateCRSFromDefinition("EPSG:4326"));
-        CRSPtr poWgs84 = WGS84Ellipsoidal();
-        EXPECT_FALSE(Transform(Compound(poLonLat, CS_VD_Orthometric), poWgs84));
-        EXPECT_TRUE(Transform(Compound(poLonLat, CS_VD_Ellipsoidal), poWgs84));
-    });
-    if (!bRan) GTEST_SKIP() << "no PROJ database";
 }
 
 TEST(CRS, ConcurrentTransforms) {

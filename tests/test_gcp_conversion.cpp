@@ -129,7 +129,8 @@ TEST(GcpConversion, PointThatCannotBeTransformedChangesNothing) {
 }
 
 // Without the geoid model no transformation from mean sea level heights
-// exists: the documented exception, even for an empty vector.
+// exists (rather than one that copies heights unchanged): the documented
+// exception, even for an empty vector.
 TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
     const std::vector<ControlPoint_t> asIn = {{1.0, 2.0, 5.0, 52.0, 0.0}};
     const bool bRan = lumo::support::RunWithoutGeoid("gcp", [&] {
@@ -147,6 +148,8 @@ TEST(GcpConversion, MissingGeoidModelThrowsTheHostException) {
         std::vector<ControlPoint_t> asEmpty;
         EXPECT_THROW(ConvertGcpsToWgs84Ell(sLonLat, "M", asEmpty), nova::Exception);
         EXPECT_TRUE(asEmpty.empty());
+        // Ellipsoidal heights need no geoid model.
+        EXPECT_NO_THROW(ConvertGcpsToWgs84Ell(sLonLat, "E", asGcps));
     });
     if (!bRan) GTEST_SKIP() << "no PROJ database";
 }
