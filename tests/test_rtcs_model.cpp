@@ -9,7 +9,6 @@
 
 #include <algorithm>
 #include <cmath>
-#include <cstdio>
 #include <memory>
 #include <string>
 #include <vector>
@@ -32,11 +31,10 @@ using lumo::support::RadarFixture;
 using lumo::support::RadarModelPtr;
 using lumo::support::RadarSegmentPtr;
 
-lumo::sim::RadarSceneParams SmallScene(bool bIncreasing = true) {
+lumo::sim::RadarSceneParams SmallScene() {
     lumo::sim::RadarSceneParams p;
     p.nPixels = 800;
     p.nLines = 600;
-    p.bRangeIncreasing = bIncreasing;
     return p;
 }
 
@@ -105,12 +103,9 @@ TEST(RtcsModel, GenerationEdgeCases) {
     double p = 0, l = 0;
     ASSERT_EQ(RTCSGeo2Img(m.get(), c.dfX, c.dfY, c.dfZ, &p, &l), 1);
     EXPECT_LT(std::hypot(p - c.dfPixel, l - c.dfLine), 1.0);
-
-    lumo::sim::RadarScene reversed(SmallScene(false));
-    RadarSegmentPtr r(reversed.MakeSegment());
-    RadarModelPtr mr(RTCSGenModel(r.get(), GeographicProjection(), "", {}));
-    EXPECT_EQ(mr->nRangeDirection, -1);
-    EXPECT_EQ(mr->osHeightRef, "M");
+    // No height reference is mean sea level.
+    RadarModelPtr msl(RTCSGenModel(&Fixture().Segment(), GeographicProjection(), "", {}));
+    EXPECT_EQ(msl->osHeightRef, "M");
 }
 
 TEST(RtcsModel, MeanSeaLevelModelsTakeMeanSeaLevelHeights) {
@@ -159,46 +154,12 @@ TEST(RtcsModel, CopiesAreDeepAndTransformsReportFailure) {
     double z = LUMO_NULL_VALUE;
     EXPECT_EQ(RTCSImg2GeoDem(again.get(), 100.0, 100.0, &z, &x, &y), 1);
     EXPECT_EQ(z, 0.0);
-    EXPECT_EQ(RTCSGeo2Img(again.get(), std::nan(""), 45.0, 0.0, &p, &l), 0);
     // The quarter-line intersection: line coordinate nLines and a failed
     // quarter line give no point.
     EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 600.0, 0.0, &x, &y), 0);
     EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 5.0, 750.0, &x, &y), 1);
     again->padfQStepCoefs[3 * 20] = RTCS_FAILED_QUARTER;
     EXPECT_EQ(RTCSCalGeodetic(again.get(), 10.0, 5.0, 750.0, &x, &y), 0);
-}
-
-TEST(RtcsModel, ParallaxReductionMovesHighPointsAwayFromNearRange) {
-    const RTCSInfo_t& m = Fixture().Model();
-    double shift = 1.0;
-    RTCSCalShiftParallax(0, 1, m.padfPixelSpacing[0], m.padfIncidenceCoefs, m.padfRangeCoefs, 0.0,
-                         300.0, shift);
-    EXPECT_NEAR(shift, 0.0, 1e-9);
-    int nLow = 0, nHigh = 0;
-    const double adfSat[3] = {7.1e6, 0.0, 0.0};
-    const double dfRadius = 6.37e6;
-    RTCSParallaxCal(8.5e5, 9.0e5, adfSat, &dfRadius, 12.5, 0.0, 0.0, &nLow, &nHigh);
-    EXPECT_EQ(nLow, 1);
-    EXPECT_EQ(nHigh, 1);
-    // The same point imaged at its pixel from three heights: reduced to the
-    // reference height it is one ground position, further from near range
-    // when higher.
-    const RTCSCOpt_t& o = *m.psCOpt;
-    std::vector<double> lat, lon, h, pix, line;
-    for (double dfHeight : {0.0, o.dfAvgHt, 1500.0}) {
-        double lo = 0, la = 0, p = 0, l = 0;
-        Fixture().Scene().ImageToGround(400.0, 300.0, o.dfAvgHt, &lo, &la);
-        Fixture().Scene().GroundToImage(lo, la, dfHeight, &p, &l);
-        lat.push_back(la), lon.push_back(lo), h.push_back(dfHeight), pix.push_back(p);
-        line.push_back(l);
-    }
-    EXPECT_LT(pix[2], pix[1]);  // layover towards near range
-    GEOInfo_t fwd{}, inv{};
-    RTCSGeoToImg(&o.sLines, 3, lat.data(), lon.data(), h.data(), pix.data(), line.data(),
-                 o.sLines.nPixels, o.sLines.nLines, 0.0, 1500.0, o.dfAvgHt, &fwd, &inv);
-    double p0 = 0, l0 = 0;
-    GCPTransform(&fwd, lon[1], lat[1], &p0, &l0);
-    EXPECT_NEAR(p0, 400.0, 0.5);  // all three reduce to the reference position
 }
 
 TEST(RtcsModel, StereoPairGivesTheHeight) {
@@ -331,7 +292,7 @@ double RoundTrip(const RTCSInfo_t& sModel, const lumo::sim::SimPoint& s) {
 // A scene's model against the truth at 100 check points, its round trips
 // with and without its rational polynomials, and those polynomials against
 // the model's own geometry.
-void ExpectWithinBounds(const RadarFixture& f, const char* pszName) {
+void ExpectWithinBounds(const RadarFixture& f) {
     const RTCSInfo_t& m = f.Model();
     // The same model answering from its own geometry only.
     lumo::support::RadarModelPtr own(RTCSAllocate());
@@ -359,10 +320,7 @@ void ExpectWithinBounds(const RadarFixture& f, const char* pszName) {
         RTCSGeo2Img(own.get(), lon, lat, s.dfZ, &p2, &l2);
         dfRpc = std::max(dfRpc, bRpc ? std::hypot(p1 - p2, l1 - l2) : 1e9);
     }
-    const double dfRms = std::sqrt(dfSum / asChecks.size());
-    std::printf("%-26s check rms %.3f px | round trip max %.2g (own %.2g) px | rpc max %.4f px\n",
-                pszName, dfRms, dfTrip, dfOwnTrip, dfRpc);
-    EXPECT_LE(dfRms, 1.0);
+    EXPECT_LE(std::sqrt(dfSum / asChecks.size()), 1.0);
     EXPECT_LE(dfTrip, 0.1);
     EXPECT_LE(dfOwnTrip, 0.1);
     EXPECT_LE(dfRpc, 0.05);
@@ -395,7 +353,7 @@ TEST(RtcsModel, ScenesMeetCheckPointRoundTripAndRpcBounds) {
         sParams.bRangeIncreasing = c.bIncreasing;
         sParams.dfNearIncidenceDeg = c.dfIncidence;
         sParams.nPixels = sParams.nLines = 3000;
-        ExpectWithinBounds(RadarFixture(sParams, 12, 0.0, 1500.0), c.pszName);
+        ExpectWithinBounds(RadarFixture(sParams, 12, 0.0, 1500.0));
     }
 }
 
