@@ -173,12 +173,7 @@ TEST(OrbitModel, RefusesSegmentsItCannotModel) {
     };
     for (const auto& [pszField, fnEdit] : aCases) {
         SegmentPtr pSeg(lumo::sim::MakeAvhrrSegment(AvhrrPassSpec()));
-        // The release frees the sub-record by its kind: give the kind back first.
-        struct KindBack {
-            EphemerisSeg_t& s;
-            int32_t n;
-            ~KindBack() { s.nOrbitType = n; }
-        } back{*pSeg, pSeg->nOrbitType};
+        const int32_t nKind = pSeg->nOrbitType;
         fnEdit(*pSeg);
         Pass kept;  // a model that must survive the refusal unchanged
         const double dfOrigin = kept.oModel.dfTimeOrigin;
@@ -186,6 +181,7 @@ TEST(OrbitModel, RefusesSegmentsItCannotModel) {
         const std::string osText =
             lumo::support::FatalOf([&] { LRSInitOrbitModel(pSeg.get(), &kept.oModel); }).second;
         testing::internal::GetCapturedStdout();
+        pSeg->nOrbitType = nKind;  // the release frees the sub-record by its kind
         EXPECT_NE(osText.find(pszField), std::string::npos) << pszField << ": " << osText;
         EXPECT_EQ(kept.oModel.dfTimeOrigin, dfOrigin);
         EXPECT_NE(kept.oModel.padfStates, nullptr);
@@ -286,7 +282,6 @@ TEST(OrbitModel, RefinementRecoversAttitudeAndOrbitBiases) {
     LRSRefineOrbitModel(&nominal.oModel, asGcps.data(), 20);
     LRSSetupCoordinateMapping(&nominal.oModel);
     const double dfAfter = ImageDisagreement(truth.oModel, nominal.oModel, 10);
-    std::printf("check points before refinement %.2f px, after %.3f px\n", dfBefore, dfAfter);
     EXPECT_GT(dfBefore, 2.0);
     EXPECT_LT(dfAfter, 0.5);
     EXPECT_EQ(nominal.oModel.asControlPoints.size(), 20U);
