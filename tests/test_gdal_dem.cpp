@@ -99,13 +99,11 @@ TEST_F(GdalDemTest, DecodesScaledIntegersAndDeclaredDatums) {
     ASSERT_TRUE(poDem->GetHeight(dfX, dfY, dfH));
     EXPECT_DOUBLE_EQ(dfH, std::round(Plane(dfX, dfY)) * 0.5 + 100.0);
 
-    // Outside the file: the geoid's undulation above the ellipsoid, once warned.
-    nova::ResetWarningCount();
+    // Outside the file the geoid fallback answers (its values and warning are
+    // the elevation grid's, tested with it): the undulation above the ellipsoid.
     double dfFar = 0.0;
     ASSERT_TRUE(poDem->GetHeight(600000.0, 5100000.0, dfFar));
     EXPECT_GT(dfFar, 40.0);
-    EXPECT_LT(dfFar, 60.0);
-    EXPECT_EQ(nova::GetWarningCount(), 1u);
 
     // The factory opens the file as kind "gdal", with or without the prefix.
     lumo::gdal::Initialize();
