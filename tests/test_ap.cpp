@@ -73,14 +73,11 @@ double ReferenceK(double H, double h) {
 }  // namespace
 
 TEST(Ap, VerticalPhotoEdgeCases) {
-    ApPtr ap = VerticalPhoto();
-    double p = 0, l = 0;
-    APGeo2Img(ap.get(), 10, 20, 0, &p, &l);
-    EXPECT_NEAR(p, 0.15 * 10 / 1000, 1e-15);
-    EXPECT_NEAR(l, 0.15 * 20 / 1000, 1e-15);
     // A null height is height 0; at the camera's height, and above the
     // camera (behind it): no image.
-    double pn = 0, ln = 0;
+    ApPtr ap = VerticalPhoto();
+    double p = 0, l = 0, pn = 0, ln = 0;
+    APGeo2Img(ap.get(), 10, 20, 0, &p, &l);
     APGeo2Img(ap.get(), 10, 20, kNull, &pn, &ln);
     EXPECT_EQ(pn, p);
     EXPECT_EQ(ln, l);
@@ -225,13 +222,11 @@ TEST(Ap, RoundTripsForEveryCorrectionCombination) {
 }
 
 TEST(Ap, UnmappablePointsAndDamagedRecords) {
+    // Input that is not a number is the family property's; here geometry
+    // and records that leave no image. A ray above the horizon never meets
+    // the ground.
     ApPtr ap = FramePhoto(31);
     double p = 1, l = 1, x = 1, y = 1, z = 0;
-    const double nan = std::nan("");
-    APGeo2Img(ap.get(), nan, 4000000, 0, &p, &l);  // the null value, not NaN
-    EXPECT_EQ(p, kNull);
-    EXPECT_EQ(l, kNull);
-    // A ray above the horizon never meets the ground.
     ApPtr vertical = VerticalPhoto();
     const Eigen::Matrix3d R = Rotation(1.4, 0, 0);  // 80 degrees oblique
     for (int i = 0; i < 9; ++i) vertical->adfRotation[i] = R(i / 3, i % 3);
