@@ -50,9 +50,7 @@ MathTransformPtr Transform(const CRSPtr& poFrom, const CRSPtr& poTo) {
 }
 
 struct Point {
-    double dfX;
-    double dfY;
-    double dfZ;
+    double dfX, dfY, dfZ;
 };
 
 Point Apply(const MathTransformPtr& poTransform, Point sIn) {

@@ -21,20 +21,11 @@
 namespace {
 
 using lumo::support::FatalOf;
+using lumo::support::JitteredGrid;
 
 using lumo::support::kTermPowers;
 
-int Terms(int order) {
-    return (order + 1) * (order + 2) / 2;
-}
-
 using Gcps = lumo::support::PointPairs;
-
-// side x side points over [x0, x0 + w] x [y0, y0 + w], mapped by f.
-Gcps MakeGcps(int side, double x0, double y0, double w,
-              const std::function<void(double, double, double&, double&)>& f) {
-    return lumo::support::JitteredGrid(side * side, x0, y0, w, 7, f);
-}
 
 GEOInfo_t Fit(Gcps& g, int order) {
     GEOInfo_t info;
@@ -69,7 +60,7 @@ TEST(GCPRegression, ExactForEveryOrderWithPixelAndUtmSizedInputs) {
     } aScenes[] = {{0.0, 0.0, 1000.0, 8}, {487000.0, 5120000.0, 30000.0, 9}};
     for (const auto& sc : aScenes) {
         for (int order = 1; order <= GCP_MAX_ORDER; ++order) {
-            const int nTerms = Terms(order);
+            const int nTerms = (order + 1) * (order + 2) / 2;
             double cx[GCP_MAX_TERMS] = {}, cy[GCP_MAX_TERMS] = {};
             for (int k = 0; k < nTerms; ++k) {
                 cx[k] = (k == 1 ? 2000.0 : 37.0 / (k + 1));
@@ -80,7 +71,7 @@ TEST(GCPRegression, ExactForEveryOrderWithPixelAndUtmSizedInputs) {
                 X = lumo::support::TermSum(cx, nTerms, u, v);
                 Y = lumo::support::TermSum(cy, nTerms, u, v);
             };
-            Gcps g = MakeGcps(sc.nSide, sc.dfX0, sc.dfY0, sc.dfExtent, truth);
+            Gcps g = JitteredGrid(sc.nSide * sc.nSide, sc.dfX0, sc.dfY0, sc.dfExtent, 7, truth);
             const GEOInfo_t info = Fit(g, order);
             ASSERT_EQ(info.nOrder, order);
             ASSERT_EQ(info.nTerms, nTerms);
@@ -155,11 +146,10 @@ TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
     // Fewer points than the order needs: 8 points determine order 2, not 3;
     // 4 points determine only the affine map.
     for (const auto& [n, order, expected] : {std::tuple{8, 3, 2}, std::tuple{4, 2, 1}}) {
-        Gcps g = lumo::support::JitteredGrid(n, 0.0, 0.0, 100.0, 7,
-                                             [](double x, double y, double& X, double& Y) {
-                                                 X = 1.0 + 2.0 * x - y;
-                                                 Y = 3.0 - x + 0.5 * y;
-                                             });
+        Gcps g = JitteredGrid(n, 0.0, 0.0, 100.0, 7, [](double x, double y, double& X, double& Y) {
+            X = 1.0 + 2.0 * x - y;
+            Y = 3.0 - x + 0.5 * y;
+        });
         int fitted = order;
         GCPRegression2(&info, "PIXEL", g.x.data(), g.y.data(), "METRE", g.X.data(), g.Y.data(),
                        g.Size(), &fitted, 0, nullptr, nullptr);
@@ -181,7 +171,7 @@ TEST(GCPRegression, DegradesGracefullyAndNeverYieldsNaN) {
 }
 
 TEST(GCPRegression, ManyPointsLeaveTheWorkArraysAlone) {
-    Gcps g = MakeGcps(60, 0.0, 0.0, 5000.0, [](double x, double y, double& X, double& Y) {
+    Gcps g = JitteredGrid(3600, 0.0, 0.0, 5000.0, 7, [](double x, double y, double& X, double& Y) {
         X = 0.5 * x + 1e-5 * x * y;
         Y = -0.25 * y + 2e-5 * x * x;
     });
@@ -206,7 +196,7 @@ TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
     // coordinates and residuals summed here.
     std::mt19937 rng(11);
     std::normal_distribution<double> noise(0.0, 0.5);
-    Gcps g = MakeGcps(7, 0.0, 0.0, 200.0, [&](double x, double y, double& X, double& Y) {
+    Gcps g = JitteredGrid(49, 0.0, 0.0, 200.0, 7, [&](double x, double y, double& X, double& Y) {
         X = 4.0 + 0.9 * x + 0.1 * y + 1e-3 * x * y + noise(rng);
         Y = -2.0 + 1.1 * y - 2e-3 * y * y + noise(rng);
     });
@@ -252,7 +242,7 @@ TEST(GCPRegression, RootMeanSquareMatchesAnIndependentFit) {
 }
 
 TEST(GCPRegression, BadInputIsRejectedAndTheRecordKept) {
-    Gcps g = MakeGcps(4, 0.0, 0.0, 10.0, [](double x, double y, double& X, double& Y) {
+    Gcps g = JitteredGrid(16, 0.0, 0.0, 10.0, 7, [](double x, double y, double& X, double& Y) {
         X = x + 1.0;
         Y = y - 1.0;
     });
