@@ -87,7 +87,8 @@ TEST(RecordValidation, ModelFilesOfEveryFamily) {
           "field \"tps.imageToGeo.cpY\" item 3 must be a finite number, found \"x\""}},
         ReadModelDocument);
     ExpectRefused("srit_spot5_roll20.json",
-                  {{[](json& d) { d["srit"]["coefficients"][12] = 0; }, "adfCoef[12] = 0"},
+                  {{[](json& d) { d["srit"]["coefficients"][0] = 0; }, "adfCoef[0] = 0"},
+                   {[](json& d) { d["srit"]["coefficients"][12] = 0; }, "adfCoef[12] = 0"},
                    {[](json& d) { d["srit"]["segment"]["nNumLines"] = -1; }, "nNumLines = -1"},
                    {[](json& d) { d["srit"]["elevationScale"] = "flat"; }, "found \"flat\""}},
                   ReadModelDocument);
