@@ -29,26 +29,9 @@ using lumo::support::RasterSpec;
 using nova::dem::DEMPtr;
 namespace fs = std::filesystem;
 
-// Smooth hills around a centre, heights 200 to 1000 m.
-double Hills(double dfX, double dfY, double dfX0, double dfY0) {
-    return 600.0 + 400.0 * std::sin((dfX - dfX0) / 700.0) * std::cos((dfY - dfY0) / 900.0);
-}
-
 class OrthoTest : public lumo::support::ScratchDirTest {
   protected:
     OrthoTest() : ScratchDirTest("lumo_gdal_ortho_") {}
-
-    // A UTM 31N elevation file of hills, 20 m cells, 6 km around (dfX0, dfY0).
-    std::string WriteHills(double dfX0, double dfY0) {
-        const RasterSpec sSpec =
-            lumo::support::NorthUpGrid(300, 300, "EPSG:32631", dfX0 - 3000.0, dfY0 + 3000.0, 20.0);
-        const std::string osPath = Path("hills.tif");
-        lumo::support::WriteRaster(osPath, sSpec, [&](int, int c, int r) {
-            return Hills(dfX0 - 3000.0 + (c + 0.5) * 20.0, dfY0 + 3000.0 - (r + 0.5) * 20.0, dfX0,
-                         dfY0);
-        });
-        return osPath;
-    }
 
     // A 600 x 500 image whose two bands hold each pixel centre's own column and
     // line, with rational polynomials in an _RPC.TXT sidecar, and an elevation
@@ -117,7 +100,15 @@ TEST_F(OrthoTest, MarksLandOnTheirMapPositionsThroughTheModelAndItsExportedPolyn
     const lumo::sim::Scene oScene(sParams);
     double dfX0 = 0.0, dfY0 = 0.0;
     ASSERT_TRUE(oScene.ImageToGround(160.0, 160.0, 600.0, &dfX0, &dfY0));
-    DEMPtr poDem(lumo::gdal::OpenFileDEM(WriteHills(dfX0, dfY0), lumo::gdal::FileDEMOptions{}));
+    // Smooth hills of 200 to 1000 m on 20 m cells, 6 km around the scene's centre.
+    lumo::support::WriteRaster(
+        Path("hills.tif"),
+        lumo::support::NorthUpGrid(300, 300, "EPSG:32631", dfX0 - 3000.0, dfY0 + 3000.0, 20.0),
+        [](int, int c, int r) {
+            return 600.0 + 400.0 * std::sin((c - 149.5) * 20.0 / 700.0) *
+                               std::cos((r - 149.5) * 20.0 / 900.0);
+        });
+    DEMPtr poDem(lumo::gdal::OpenFileDEM(Path("hills.tif"), lumo::gdal::FileDEMOptions{}));
     const lumo::cli::MarkedScene sScene =
         lumo::cli::MakeMarkedScene(sParams, *poDem, 4, 20, Path("scene.tif"));
     const nova::mathmodel::LumoMathModel oModel(LUMO_CODE_SRIT, sScene.psModel.get());
