@@ -13,6 +13,7 @@
 #include "runtime.h"
 #include "support/cli_runner.h"
 #include "support/gdal_rasters.h"
+#include "support/numbered_error.h"
 
 namespace {
 
@@ -130,7 +131,7 @@ TEST_F(GdalDemTest, RefusesUnusableFilesNamingThem) {
         {WritePlane("local.tif", sLocal), "neither geographic nor projected"},
     };
     for (const auto& [osPath, osWhat] : aCases) {
-        const std::string osText = lumo::support::ThrownText(
+        const std::string osText = lumo::support::DataErrorOf(
             [&] { DEMPtr(lumo::gdal::OpenFileDEM(osPath, FileDEMOptions{})); });
         EXPECT_TRUE(lumo::support::Names(osText, {osPath, osWhat})) << osPath << ": " << osText;
     }

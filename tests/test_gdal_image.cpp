@@ -17,6 +17,7 @@
 #include "runtime.h"
 #include "support/cli_runner.h"
 #include "support/gdal_rasters.h"
+#include "support/numbered_error.h"
 
 namespace {
 
@@ -108,8 +109,8 @@ TEST_F(ImageFileTest, AttachedPolynomialsFoldTheAdjustmentAndFollowLinks) {
     lumo::gdal::AttachRPC(osPath, *psTruth);
     EXPECT_LT(GdalRpcDisagreement(osPath, CubePoints(*psTruth)), 1e-6);
     psTruth->adfPixelAdjust[3] = 1e-9;
-    const std::string osSecond = lumo::support::ThrownText<nova::DataException>(
-        [&] { lumo::gdal::AttachRPC(osPath, *psTruth); });
+    const std::string osSecond =
+        lumo::support::DataErrorOf([&] { lumo::gdal::AttachRPC(osPath, *psTruth); });
     EXPECT_TRUE(lumo::support::Names(osSecond, {"tags.tif: ", "second-order"})) << osSecond;
     psTruth->adfPixelAdjust[3] = 0.0;
     EXPECT_LT(GdalRpcDisagreement(osPath, CubePoints(*psTruth)), 1e-6);
@@ -131,8 +132,8 @@ TEST_F(ImageFileTest, AttachedPolynomialsFoldTheAdjustmentAndFollowLinks) {
     RasterSpec sBmp = lumo::support::PlainImage(8, 8, 1, GDT_Byte);
     sBmp.osDriver = "BMP";
     lumo::support::WriteRaster(Path("image.bmp"), sBmp, [](int, int, int) { return 1; });
-    const std::string osBmp = lumo::support::ThrownText<nova::DataException>(
-        [&] { lumo::gdal::AttachRPC(Path("image.bmp"), *psTruth); });
+    const std::string osBmp =
+        lumo::support::DataErrorOf([&] { lumo::gdal::AttachRPC(Path("image.bmp"), *psTruth); });
     EXPECT_NE(osBmp.find("image.bmp"), std::string::npos) << osBmp;
 }
 

@@ -22,6 +22,7 @@
 #include "srit_io.h"
 #include "support/cli_runner.h"
 #include "support/gdal_rasters.h"
+#include "support/numbered_error.h"
 
 namespace {
 
@@ -218,7 +219,7 @@ TEST_F(OrthoTest, BadInputFailsNamingItAndLeavesNoFile) {
     auto Fails = [&](const std::string& osImagePath, const std::string& osOut,
                      const lumo::gdal::OrthoOptions& sOptions, const std::string& osNamed,
                      const nova::mathmodel::IMathModel& oModel, const nova::dem::IRasterDEM& oDem) {
-        const std::string osText = lumo::support::ThrownText(
+        const std::string osText = lumo::support::DataErrorOf(
             [&] { lumo::gdal::Orthorectify(osImagePath, oModel, oDem, osOut, sOptions); });
         EXPECT_NE(osText.find(osNamed), std::string::npos) << osNamed << ": " << osText;
         for (const auto& oEntry : fs::directory_iterator(mDir)) {
@@ -243,7 +244,7 @@ TEST_F(OrthoTest, BadInputFailsNamingItAndLeavesNoFile) {
 
     lumo::support::WriteRaster(Path("plain.tif"), lumo::support::PlainImage(10, 10),
                                [](int, int, int) { return 1.0; });
-    const std::string osPlain = lumo::support::ThrownText<nova::DataException>(
+    const std::string osPlain = lumo::support::DataErrorOf(
         [&] { lumo::cli::RFPtr(lumo::gdal::ReadImageRPC(Path("plain.tif"))); });
     EXPECT_NE(osPlain.find("plain.tif"), std::string::npos) << osPlain;
 }

@@ -16,8 +16,6 @@
 #include <gdal_alg.h>
 #include <ogr_srs_api.h>
 
-#include "runtime.h"
-
 namespace lumo {
 namespace support {
 
@@ -134,18 +132,6 @@ inline double GdalRpcDisagreement(const std::string& osRaster,
     }
     GDALDestroyRPCTransformer(pTransformer);
     return dfWorst;
-}
-
-// The text of the exception of type E that fn throws; "" when it throws none,
-// so that a test looking for a name in it fails when nothing was refused.
-template <typename E = nova::Exception, typename F>
-std::string ThrownText(F fn) {
-    try {
-        fn();
-    } catch (const E& e) {
-        return e.what();
-    }
-    return std::string();
 }
 
 // Whether `text` contains every one of `parts`.
