@@ -74,8 +74,7 @@ TEST(GcpConversion, HeightReferencesAndProjectedInput) {
     const std::vector<ControlPoint_t> asUtm = {{1.0, 2.0, 500000.0, 5761000.0, 100.0},
                                                {3.0, 4.0, 650000.0, 5600000.0, -20.0}};
     // Projected input: the horizontal part as the host's planar reprojection
-    // puts it (the compound system's geoid heights for projected input are
-    // the CRS test's).
+    // puts it.
     std::vector<ControlPoint_t> asOut = asUtm;
     ConvertGcpsToWgs84Ell(sUtm, "E", asOut);
     ExpectSameImage(asOut, asUtm);
@@ -88,6 +87,11 @@ TEST(GcpConversion, HeightReferencesAndProjectedInput) {
         EXPECT_NEAR(asOut[i].dfGroundY, dfLat, 1e-9);
         EXPECT_NEAR(asOut[i].dfGroundZ, asUtm[i].dfGroundZ, 1e-6);
     }
+    // Mean sea level on a projected system gains the undulation too: 44.07 m
+    // near 3 E 52 N.
+    asOut = asUtm;
+    ConvertGcpsToWgs84Ell(sUtm, "M", asOut);
+    EXPECT_NEAR(asOut[0].dfGroundZ, 100.0 + 44.07, 0.5);
 }
 
 TEST(GcpConversion, ProjectionWithoutCoordinateSystemIsAParameterError) {
