@@ -11,7 +11,7 @@
 #include <string>
 
 #include "json_fields.h"
-#include "nova/runtime.h"
+#include "support/numbered_error.h"
 
 using nlohmann::json;
 using nlohmann::ordered_json;
@@ -22,22 +22,14 @@ namespace {
 constexpr double kNan = std::numeric_limits<double>::quiet_NaN();
 constexpr double kInf = std::numeric_limits<double>::infinity();
 
-// The message of the data exception `f` throws; fails the test when none.
-template <typename F>
-std::string MessageOf(F f) {
-    try {
-        f();
-    } catch (const nova::DataException& e) {
-        return e.what();
-    }
-    ADD_FAILURE() << "no exception";
-    return "";
-}
+// A call that throws no data exception gives "", which no expected message
+// or part matches.
+using lumo::support::DataErrorOf;
 
 // `f` fails with a message that holds every one of `parts`.
 template <typename F>
 void ExpectFailureNaming(F f, std::initializer_list<const char*> parts) {
-    const std::string osMessage = MessageOf(f);
+    const std::string osMessage = DataErrorOf(f);
     for (const char* pszPart : parts) {
         EXPECT_NE(osMessage.find(pszPart), std::string::npos) << osMessage << " / " << pszPart;
     }
@@ -47,10 +39,10 @@ const cli::FieldContext kTop{"m.json", ""};
 const cli::FieldContext kAp{"m.json", "ap"};
 
 TEST(JsonFields, ContextsMembersTextsAndFlags) {
-    EXPECT_EQ(MessageOf([] { kAp.Child("corrections").Fail("refraction", "is bad"); }),
+    EXPECT_EQ(DataErrorOf([] { kAp.Child("corrections").Fail("refraction", "is bad"); }),
               "m.json: field \"ap.corrections.refraction\" is bad");
     const cli::FieldContext bare{"b.json", "", true};
-    EXPECT_EQ(MessageOf([&] { bare.Child("gcps[3]").Fail("pixel", "must be a number"); }),
+    EXPECT_EQ(DataErrorOf([&] { bare.Child("gcps[3]").Fail("pixel", "must be a number"); }),
               "b.json: gcps[3].pixel must be a number");
 
     const json object = {{"name", "UTM 31"}, {"n", 2}};
@@ -74,7 +66,7 @@ TEST(JsonFields, NumbersAndIntegersInRange) {
     ExpectFailureNaming([&] { cli::GetFiniteNumber(object, "s", kAp); }, {"\"ap.s\"", "\"1\""});
     // A non-finite number has no JSON form and is shown as null.
     for (const char* pszName : {"nan", "inf"}) {
-        EXPECT_EQ(MessageOf([&] { cli::GetFiniteNumber(object, pszName, kAp); }),
+        EXPECT_EQ(DataErrorOf([&] { cli::GetFiniteNumber(object, pszName, kAp); }),
                   "m.json: field \"ap." + std::string(pszName) +
                       "\" must be a finite number, found null");
     }
@@ -110,7 +102,7 @@ TEST(JsonFields, ArraysOfFiniteNumbersInEachWording) {
                                 {"m.json", pszName});
         }
     }
-    EXPECT_EQ(MessageOf([&] { cli::GetFiniteArray(object, "bad", 3, out, kAp, aFormats[2]); }),
+    EXPECT_EQ(DataErrorOf([&] { cli::GetFiniteArray(object, "bad", 3, out, kAp, aFormats[2]); }),
               "m.json: field \"ap.bad[1]\" must be a finite number, found \"x\"");
 }
 
@@ -119,7 +111,7 @@ TEST(JsonFields, TextsInFixedBuffersAndWritingNumbers) {
     cli::CopyText("abcd", buffer, sizeof(buffer), "sensor", kAp);
     EXPECT_STREQ(buffer, "abcd");
     cli::CopyText("", buffer, sizeof(buffer), "sensor", kAp);
-    EXPECT_EQ(MessageOf([&] { cli::CopyText("abcde", buffer, sizeof(buffer), "sensor", kAp); }),
+    EXPECT_EQ(DataErrorOf([&] { cli::CopyText("abcde", buffer, sizeof(buffer), "sensor", kAp); }),
               "m.json: field \"ap.sensor\": \"abcde\" is longer than 4 characters");
     EXPECT_STREQ(buffer, "");  // a refused text leaves the buffer as it was
     // An unterminated buffer is read up to the limit and never past it.
@@ -134,7 +126,7 @@ TEST(JsonFields, TextsInFixedBuffersAndWritingNumbers) {
         json::parse(cli::FiniteNumberArray(values, 4, cli::ItemOf("item", "x")).dump());
     for (std::size_t k = 0; k < 4; ++k) EXPECT_EQ(array[k].get<double>(), values[k]);
     const double bad[3] = {1.0, 2.0, kNan};
-    EXPECT_EQ(MessageOf([&] { cli::FiniteNumberArray(bad, 3, cli::ItemOf("item", "tps.cpX")); }),
+    EXPECT_EQ(DataErrorOf([&] { cli::FiniteNumberArray(bad, 3, cli::ItemOf("item", "tps.cpX")); }),
               "cannot write model: item 2 of \"tps.cpX\" is not finite");
     EXPECT_EQ(cli::FiniteForWrite(-4.25, "xScale"), -4.25);
     ExpectFailureNaming([] { cli::FiniteForWrite(kInf, "xScale"); }, {"\"xScale\""});
