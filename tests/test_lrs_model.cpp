@@ -153,7 +153,6 @@ TEST(OrbitModel, RefusesSegmentsItCannotModel) {
          [](EphemerisSeg_t& s) { std::strcpy(Header(s).szSemiMajorAxis, "6000000"); }},
         {"szEccentricity", [](EphemerisSeg_t& s) { std::strcpy(Header(s).szEccentricity, ""); }},
         {"szClockOffset", [](EphemerisSeg_t& s) { std::strcpy(Header(s).szClockOffset, "1.5.3"); }},
-        {"szInclination", [](EphemerisSeg_t& s) { std::strcpy(Header(s).szInclination, "nan"); }},
         {"szEpochYearDay",
          [](EphemerisSeg_t& s) { std::strcpy(Header(s).szEpochYearDay, "2003366"); }},
         {"szEpochHour", [](EphemerisSeg_t& s) { std::strcpy(Header(s).szEpochHour, "24"); }},
