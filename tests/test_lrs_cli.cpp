@@ -1,6 +1,6 @@
 // The orbit model in the tool: simulate a pass, fit, residuals on check
-// points, transforms, the model file round trip, angle layers, the demo's
-// sample and the refusals.
+// points, transforms, the model file round trip, angle layers and the
+// refusals.
 #include <gtest/gtest.h>
 
 #include <array>
@@ -9,7 +9,6 @@
 #include <fstream>
 #include <string>
 
-#include "demo.h"
 #include "lrs_io.h"
 #include "model_io.h"
 #include "runtime.h"
@@ -92,18 +91,6 @@ TEST_F(LrsCliTest, SimulateFitCheckWriteAnglesAndRefuseWhatItCannotUse) {
         EXPECT_NE(r.osErr.find(says), std::string::npos) << r.osErr;
         EXPECT_FALSE(std::filesystem::exists(Path("s.json")));
     }
-}
-
-TEST(LrsDemo, SampleModelMeetsItsCheckPoints) {
-    for (const lumo::cli::FamilyDemo& demo : lumo::cli::FamilyDemos()) {
-        if (std::string(demo.pszFamily) != "lrs") continue;
-        const lumo::cli::DemoResult r = lumo::cli::RunFamilyDemo(demo, LUMO_SOURCE_DIR "/examples");
-        EXPECT_EQ(r.nGcps, 100U);
-        EXPECT_LT(r.sImageResidual.dfMax, 0.05);
-        EXPECT_LT(r.sImageRoundTrip.dfMax, 0.01);
-        return;
-    }
-    ADD_FAILURE() << "no lrs row in the demo";
 }
 
 }  // namespace
