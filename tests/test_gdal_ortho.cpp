@@ -7,9 +7,9 @@
 
 #include <cmath>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <regex>
 #include <string>
 #include <vector>
 
@@ -45,8 +45,10 @@ class OrthoTest : public lumo::support::ScratchDirTest {
             {"LINE_OFF", "250"},   {"SAMP_OFF", "300"},     {"LINE_SCALE", "250"},
             {"SAMP_SCALE", "300"}, {"LAT_SCALE", "0.0055"}, {"LONG_SCALE", "0.008"}};
         for (const auto& [pszKey, pszValue] : aScaled) {
-            osRpc = std::regex_replace(osRpc, std::regex(std::string("\n") + pszKey + ": [^\n]*"),
-                                       std::string("\n") + pszKey + ": " + pszValue);
+            const std::size_t nKey = osRpc.find(std::string("\n") + pszKey + ": ");
+            ASSERT_NE(nKey, std::string::npos) << pszKey;
+            const std::size_t nValue = nKey + std::strlen(pszKey) + 3;
+            osRpc.replace(nValue, osRpc.find('\n', nValue) - nValue, pszValue);
         }
         Write("image_RPC.TXT", osRpc.substr(1));
         lumo::support::WriteRaster(Path("image.tif"), lumo::support::PlainImage(600, 500, 2),
