@@ -14,12 +14,12 @@
 #include <nlohmann/json.hpp>
 
 #include "ap_io.h"
+#include "fuzz_support.h"
 #include "lrs_io.h"
 #include "lumo.h"
 #include "model_io.h"
 #include "rf_io.h"
 #include "rtcs_io.h"
-#include "fuzz_support.h"
 #include "runtime.h"
 #include "srit_io.h"
 #include "tps_io.h"

@@ -48,7 +48,6 @@ struct BlockSettings {
     std::vector<char> abHeld;  // per image: constraint flag set, its control being weak
 };
 
-
 // A block needs 3 control observations.
 constexpr int kBlockLeastControl = 3;
 

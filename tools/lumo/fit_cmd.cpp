@@ -24,8 +24,8 @@
 #include "nova/regression.h"
 #include "points_io.h"
 #include "progress.h"
-#include "tool_warnings.h"
 #include "srit_io.h"
+#include "tool_warnings.h"
 #include "tps_io.h"
 
 namespace lumo::cli {
